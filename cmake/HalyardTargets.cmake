@@ -1,0 +1,45 @@
+# Warnings and sanitizers for every target of ours, and the two shapes of target
+# that the source folders are made of.
+
+add_library(halyard_options INTERFACE)
+target_compile_options(halyard_options INTERFACE
+  -Wall -Wextra -Wpedantic -Wconversion -Wshadow -Wnon-virtual-dtor -Wold-style-cast
+  -Wimplicit-fallthrough -Werror)
+target_include_directories(halyard_options INTERFACE ${PROJECT_SOURCE_DIR}/src)
+target_compile_definitions(halyard_options INTERFACE
+  HALYARD_VERSION="${PROJECT_VERSION}")
+if(HALYARD_SANITIZE)
+  target_compile_options(halyard_options INTERFACE
+    -fsanitize=${HALYARD_SANITIZE} -fno-omit-frame-pointer -fno-sanitize-recover=all)
+  target_link_options(halyard_options INTERFACE -fsanitize=${HALYARD_SANITIZE})
+endif()
+
+# halyard_folder(NAME [DEPENDS target...] [EXCLUDE file...])
+#
+# The static library halyard_NAME out of this folder's sources and, with tests
+# on, the program test_NAME out of its *_test.cpp.
+function(halyard_folder name)
+  cmake_parse_arguments(arg "" "" "DEPENDS;EXCLUDE;TEST_DEPENDS" ${ARGN})
+  file(GLOB sources CONFIGURE_DEPENDS ${CMAKE_CURRENT_SOURCE_DIR}/*.cpp)
+  set(tests ${sources})
+  list(FILTER sources EXCLUDE REGEX "_test\\.cpp$")
+  list(FILTER tests INCLUDE REGEX "_test\\.cpp$")
+  foreach(file ${arg_EXCLUDE})
+    list(REMOVE_ITEM sources ${CMAKE_CURRENT_SOURCE_DIR}/${file})
+  endforeach()
+  add_library(halyard_${name} STATIC ${sources})
+  target_link_libraries(halyard_${name} PUBLIC halyard_options ${arg_DEPENDS})
+  if(HALYARD_TESTS AND tests)
+    halyard_test(test_${name} ${tests})
+    target_link_libraries(test_${name} PRIVATE halyard_${name} ${arg_TEST_DEPENDS})
+  endif()
+endfunction()
+
+# halyard_test(NAME source...): a GoogleTest program whose cases ctest lists.
+function(halyard_test name)
+  find_package(GTest REQUIRED)
+  include(GoogleTest)
+  add_executable(${name} ${ARGN})
+  target_link_libraries(${name} PRIVATE halyard_options GTest::gmock GTest::gtest_main)
+  gtest_discover_tests(${name} DISCOVERY_TIMEOUT 60 PROPERTIES TIMEOUT 120)
+endfunction()

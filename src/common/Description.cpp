@@ -1,0 +1,190 @@
+#include "common/Description.h"
+
+#include <algorithm>
+#include <chrono>
+#include <fmt/format.h>
+
+namespace halyard {
+namespace {
+
+constexpr int kIndent = 4;
+
+bool isPlain(char c) noexcept {
+    return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '_' ||
+           c == '$' || c == '.' || c == ':' || c == '-' || c == '/';
+}
+
+bool needsQuotes(std::string_view text) noexcept {
+    return text.empty() || !std::all_of(text.begin(), text.end(), isPlain) ||
+           text.find("//") != std::string_view::npos;
+}
+
+void appendQuoted(std::string& out, std::string_view text) {
+    out += '"';
+    for (const char c : text) {
+        switch (c) {
+        case '"':
+            out += "\\\"";
+            break;
+        case '\\':
+            out += "\\\\";
+            break;
+        case '\n':
+            out += "\\n";
+            break;
+        case '\r':
+            out += "\\r";
+            break;
+        case '\t':
+            out += "\\t";
+            break;
+        default:
+            if (static_cast<unsigned char>(c) < 0x20 || c == 0x7F) {
+                fmt::format_to(std::back_inserter(out), "\\{:03o}", static_cast<unsigned>(c));
+            } else {
+                out += c;
+            }
+        }
+    }
+    out += '"';
+}
+
+void appendNested(std::string& out, const Value& value, int depth);
+
+void appendElement(std::string& out, const Value& value, int depth) {
+    if (value.isList() || value.isDictionary()) {
+        appendNested(out, value, depth);
+        return;
+    }
+    const std::string text = describe(value);
+    if (needsQuotes(text)) {
+        appendQuoted(out, text);
+    } else {
+        out += text;
+    }
+}
+
+void appendNested(std::string& out, const Value& value, int depth) {
+    const auto outer = static_cast<std::size_t>(depth * kIndent);
+    const std::size_t inner = outer + kIndent;
+    if (value.isList()) {
+        out += "(\n";
+        const List list = value.list();
+        for (std::size_t i = 0; i < list.size(); ++i) {
+            out.append(inner, ' ');
+            appendElement(out, list[i], depth + 1);
+            out += i + 1 < list.size() ? ",\n" : "\n";
+        }
+        out.append(outer, ' ').append(")");
+        return;
+    }
+    out += "{\n";
+    const Dictionary dictionary = value.dictionary();
+    for (const auto* entry : sortedEntries(dictionary)) {
+        out.append(inner, ' ');
+        appendElement(out, entry->key, depth + 1);
+        out += " = ";
+        appendElement(out, entry->value, depth + 1);
+        out += ";\n";
+    }
+    out.append(outer, ' ').append("}");
+}
+
+// fmt's own shortest form, but with the exponent spelled as a reader of any
+// language takes it, and without a trailing ".0".
+template <class Real> std::string shortest(Real value) {
+    return fmt::format("{}", value);
+}
+
+struct CivilTime {
+    std::int64_t year;
+    unsigned month;
+    unsigned day;
+    int hour;
+    int minute;
+    int second;
+};
+
+CivilTime civilTime(std::int64_t seconds) {
+    constexpr std::int64_t kDay = 86400;
+    // Keeps the calendar below inside the range of std::chrono::year.
+    constexpr std::int64_t kLimit = 1'000'000'000'000;
+    seconds = std::clamp(seconds, -kLimit, kLimit);
+    std::int64_t days = seconds / kDay;
+    std::int64_t rest = seconds % kDay;
+    if (rest < 0) {
+        rest += kDay;
+        --days;
+    }
+    const std::chrono::year_month_day date{
+        std::chrono::sys_days{std::chrono::days{static_cast<std::int32_t>(days)}}};
+    return {static_cast<int>(date.year()),     static_cast<unsigned>(date.month()),
+            static_cast<unsigned>(date.day()), static_cast<int>(rest / 3600),
+            static_cast<int>(rest / 60 % 60),  static_cast<int>(rest % 60)};
+}
+
+} // namespace
+
+std::string shortestDecimal(double value) {
+    return shortest(value);
+}
+
+std::string shortestDecimal(float value) {
+    return shortest(value);
+}
+
+std::string describe(Date date) {
+    const CivilTime t = civilTime(date.seconds);
+    return fmt::format("{:04}-{:02}-{:02} {:02}:{:02}:{:02} +0000", t.year, t.month, t.day, t.hour,
+                       t.minute, t.second);
+}
+
+std::string rfc3339(Date date) {
+    const CivilTime t = civilTime(date.seconds);
+    std::string text = fmt::format("{:04}-{:02}-{:02}T{:02}:{:02}:{:02}", t.year, t.month, t.day,
+                                   t.hour, t.minute, t.second);
+    if (date.nanoseconds != 0) {
+        text += fmt::format(".{:09}", date.nanoseconds);
+        text.erase(text.find_last_not_of('0') + 1);
+    }
+    return text + 'Z';
+}
+
+void appendDescription(std::string& out, const Value& value) {
+    switch (value.kind()) {
+    case Value::Kind::None:
+        out += "(null)";
+        break;
+    case Value::Kind::Bool:
+    case Value::Kind::Int:
+        out += fmt::format_int(value.integerValue()).c_str();
+        break;
+    case Value::Kind::UInt:
+        out += fmt::format_int(value.unsignedValue()).c_str();
+        break;
+    case Value::Kind::Float:
+        out += shortestDecimal(value.floatValue());
+        break;
+    case Value::Kind::Double:
+        out += shortestDecimal(value.doubleValue());
+        break;
+    case Value::Kind::String:
+        out += value.text();
+        break;
+    case Value::Kind::Date:
+        out += describe(value.date());
+        break;
+    case Value::Kind::List:
+    case Value::Kind::Dictionary:
+        appendNested(out, value, 0);
+        break;
+    }
+}
+
+std::string describe(const Value& value) {
+    std::string out;
+    appendDescription(out, value);
+    return out;
+}
+
+} // namespace halyard

@@ -1,0 +1,36 @@
+// Values as JSON text, for the store and the summary files.
+//
+// Numbers take their shortest round-trip form, 64-bit integers stay exact, dates
+// are RFC 3339 UTC strings, not-a-number and infinities the strings "NaN",
+// "Infinity" and "-Infinity"; ill-formed UTF-8 becomes U+FFFD.
+#pragma once
+
+#include <memory>
+#include <string>
+#include <string_view>
+
+#include "common/Value.h"
+
+namespace halyard {
+
+std::string toJson(const Value& value);
+std::string toPrettyJson(const Value& value);
+
+// Writes one value after the other into a buffer it keeps, for callers that
+// write many. Not thread-safe.
+class JsonWriter {
+public:
+    JsonWriter();
+    ~JsonWriter();
+    JsonWriter(const JsonWriter&) = delete;
+    JsonWriter& operator=(const JsonWriter&) = delete;
+
+    // Valid until the next call.
+    std::string_view write(const Value& value);
+
+private:
+    struct Buffer;
+    std::unique_ptr<Buffer> buffer_;
+};
+
+} // namespace halyard

@@ -1,0 +1,46 @@
+// Writes log lines through the installed platform. Text is formatted only when
+// the line's level is on, so a silent line costs one branch:
+//
+//     HY_LOG_DEBUG(HYReportingClientCategory, "creating session for reporter {}", id);
+#pragma once
+
+#include <fmt/core.h>
+#include <source_location>
+#include <string>
+
+#include "common/Description.h"
+#include "platform/LogSink.h"
+
+// A Value prints as its description.
+template <> struct fmt::formatter<halyard::Value> : fmt::formatter<std::string_view> {
+    template <class Context> auto format(const halyard::Value& value, Context& context) const {
+        return fmt::formatter<std::string_view>::format(halyard::describe(value), context);
+    }
+};
+
+namespace halyard::platform {
+
+[[nodiscard]] bool logEnabled(LogLevel level);
+void logFormatted(LogLevel level, LogCategory category, const std::source_location& where,
+                  fmt::string_view format, fmt::format_args arguments);
+
+template <class... Arguments>
+void log(LogLevel level, LogCategory category, const std::source_location& where,
+         fmt::format_string<Arguments...> format, Arguments&&... arguments) {
+    logFormatted(level, category, where, format, fmt::make_format_args(arguments...));
+}
+
+} // namespace halyard::platform
+
+#define HY_LOG(level, category, ...)                                                               \
+    do {                                                                                           \
+        if (::halyard::platform::logEnabled(level)) {                                              \
+            ::halyard::platform::log(level, category, std::source_location::current(),             \
+                                     __VA_ARGS__);                                                 \
+        }                                                                                          \
+    } while (false)
+
+#define HY_LOG_DEBUG(category, ...) HY_LOG(::halyard::LogLevel::Debug, category, __VA_ARGS__)
+#define HY_LOG_INFO(category, ...) HY_LOG(::halyard::LogLevel::Info, category, __VA_ARGS__)
+#define HY_LOG_DEFAULT(category, ...) HY_LOG(::halyard::LogLevel::Default, category, __VA_ARGS__)
+#define HY_LOG_ERROR(category, ...) HY_LOG(::halyard::LogLevel::Error, category, __VA_ARGS__)

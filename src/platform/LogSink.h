@@ -1,0 +1,28 @@
+#pragma once
+
+#include <string_view>
+
+#include "common/LogCategory.h"
+
+namespace halyard::platform {
+
+struct LogLine {
+    LogLevel level;
+    LogCategory category;
+    std::string_view file; // base name
+    int line;
+    std::string_view function;
+    std::string_view text;
+};
+
+// Where log lines go. Any thread. Must not block on whoever reads the log: an
+// implementation bounds what it holds and counts what it had to drop.
+class LogSink {
+public:
+    virtual ~LogSink() = default;
+    // Cheap: asked before a line's arguments are formatted.
+    virtual bool isEnabled(LogLevel level) const = 0;
+    virtual void write(const LogLine& line) = 0;
+};
+
+} // namespace halyard::platform

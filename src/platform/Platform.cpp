@@ -1,0 +1,38 @@
+#include "platform/Platform.h"
+
+#include <cassert>
+
+#include "platform/Log.h"
+
+namespace halyard::platform {
+namespace {
+
+const Platform* installed = nullptr;
+
+std::string_view baseName(std::string_view path) {
+    return path.substr(path.rfind('/') + 1);
+}
+
+} // namespace
+
+void install(const Platform* platform) {
+    installed = platform;
+}
+
+const Platform& current() {
+    assert(installed != nullptr);
+    return *installed;
+}
+
+bool logEnabled(LogLevel level) {
+    return installed != nullptr && installed->log->isEnabled(level);
+}
+
+void logFormatted(LogLevel level, LogCategory category, const std::source_location& where,
+                  fmt::string_view format, fmt::format_args arguments) {
+    const std::string text = fmt::vformat(format, arguments);
+    installed->log->write({level, category, baseName(where.file_name()),
+                           static_cast<int>(where.line()), where.function_name(), text});
+}
+
+} // namespace halyard::platform

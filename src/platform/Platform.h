@@ -1,0 +1,53 @@
+// Everything the core needs from the system it runs on, as one object.
+//
+// Made by main out of the real adapters, or by a test's fixture out of fakes,
+// and installed once for the process: the only global there is. The pieces are
+// borrowed and must outlive the installation.
+#pragma once
+
+namespace halyard::platform {
+
+class AnalyticsService;
+class Clock;
+class ConditionFactory;
+class DeviceProperties;
+class EnergyLedger;
+class FeatureFlags;
+class LogSink;
+class MetricService;
+class Notifications;
+class OwnProcess;
+class Preferences;
+class ProcessTable;
+class QueueFactory;
+class Random;
+class RelayReportingFramework;
+class TraceMarks;
+
+struct Platform {
+    Clock* clock = nullptr;
+    Random* random = nullptr;
+    QueueFactory* queues = nullptr;
+    ConditionFactory* conditions = nullptr;
+    LogSink* log = nullptr;
+    TraceMarks* traceMarks = nullptr;
+    Preferences* preferences = nullptr;
+    FeatureFlags* featureFlags = nullptr;
+    DeviceProperties* deviceProperties = nullptr;
+    Notifications* notifications = nullptr;
+    ProcessTable* processTable = nullptr;
+    OwnProcess* ownProcess = nullptr;
+    RelayReportingFramework* relayReporting = nullptr;
+    AnalyticsService* analytics = nullptr;
+    EnergyLedger* energyLedger = nullptr;
+    MetricService* metrics = nullptr;
+};
+
+// Replaces what was installed before; null uninstalls. Requires that no other
+// thread uses the platform meanwhile.
+void install(const Platform* platform);
+
+// Requires an installed platform.
+const Platform& current();
+
+} // namespace halyard::platform

@@ -1,0 +1,49 @@
+#pragma once
+
+#include <chrono>
+#include <functional>
+#include <memory>
+#include <string_view>
+
+namespace halyard::platform {
+
+using Task = std::function<void()>;
+
+enum class QueuePriority { UserInteractive, Utility, Background };
+
+// Runs tasks asynchronously. Both operations may be called from any thread and
+// never run the task on the calling stack. Tasks must not throw.
+class WorkQueue {
+public:
+    virtual ~WorkQueue() = default;
+    virtual void async(Task task) = 0;
+    // Submits the task after `delay`, as async() would then.
+    virtual void asyncAfter(std::chrono::nanoseconds delay, Task task) = 0;
+};
+
+// Runs one task at a time, in the order of submission.
+//
+// A task that has to wait for something does not block its thread: it suspends
+// the queue, returns, and whoever ends the wait resumes it. So any number of
+// queues can wait at once on the few threads that serve them all.
+class SerialQueue : public WorkQueue {
+public:
+    // Holds back everything behind the running task. Requires that it is called
+    // from a task of this queue, which is not suspended yet.
+    virtual void suspend() = 0;
+    // Runs `first` before anything that is held back, then goes on. Any thread;
+    // at most once for each suspend().
+    virtual void resume(Task first) = 0;
+};
+
+class QueueFactory {
+public:
+    virtual ~QueueFactory() = default;
+    // A queue that is dropped still runs what was submitted to it.
+    virtual std::shared_ptr<SerialQueue> makeSerialQueue(std::string_view name,
+                                                         QueuePriority priority) = 0;
+    // The shared concurrent queue of lowest priority. Borrowed.
+    virtual WorkQueue& backgroundQueue() = 0;
+};
+
+} // namespace halyard::platform
