@@ -1,0 +1,28 @@
+// A clock that only moves when a test says so.
+#pragma once
+
+#include <chrono>
+
+#include "platform/Clock.h"
+
+namespace halyard::testing {
+
+class ManualClock final : public platform::Clock {
+public:
+    platform::WallTime wallTime() const override { return wall_; }
+    platform::SteadyTime steadyTime() const override { return steady_; }
+    std::chrono::nanoseconds systemUptime() const override { return steady_.time_since_epoch(); }
+
+    void advance(std::chrono::nanoseconds by) {
+        wall_ += by;
+        steady_ += by;
+    }
+    // The wall clock alone, as an operator or NTP moves it.
+    void setWallTime(platform::WallTime time) { wall_ = time; }
+
+private:
+    platform::WallTime wall_{std::chrono::seconds{1'700'000'000}};
+    platform::SteadyTime steady_{std::chrono::seconds{1000}};
+};
+
+} // namespace halyard::testing

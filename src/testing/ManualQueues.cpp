@@ -1,0 +1,104 @@
+#include "testing/ManualQueues.h"
+
+#include <algorithm>
+#include <cassert>
+
+namespace halyard::testing {
+
+class ManualQueues::Queue final : public platform::SerialQueue,
+                                  public std::enable_shared_from_this<Queue> {
+public:
+    Queue(ManualQueues& owner, std::string name) : owner_(owner), name_(std::move(name)) {}
+
+    void async(platform::Task task) override {
+        owner_.ready_.push_back({shared_from_this(), std::move(task)});
+    }
+    void asyncAfter(std::chrono::nanoseconds delay, platform::Task task) override {
+        owner_.delayed_.push_back(
+            {owner_.clock_.steadyTime() + delay, shared_from_this(), std::move(task)});
+    }
+    void suspend() override {
+        assert(!suspended_);
+        suspended_ = true;
+    }
+    void resume(platform::Task first) override {
+        assert(suspended_);
+        suspended_ = false;
+        owner_.ready_.push_front({shared_from_this(), std::move(first)});
+    }
+
+    bool suspended() const { return suspended_; }
+    const std::string& name() const { return name_; }
+
+private:
+    ManualQueues& owner_;
+    std::string name_;
+    bool suspended_ = false;
+};
+
+ManualQueues::ManualQueues(ManualClock& clock)
+    : clock_(clock), background_(std::make_shared<Queue>(*this, "background")) {}
+
+ManualQueues::~ManualQueues() = default;
+
+std::shared_ptr<platform::SerialQueue> ManualQueues::makeSerialQueue(std::string_view name,
+                                                                     platform::QueuePriority) {
+    made_.emplace_back(name);
+    return std::make_shared<Queue>(*this, std::string(name));
+}
+
+platform::WorkQueue& ManualQueues::backgroundQueue() {
+    return *background_;
+}
+
+bool ManualQueues::runOne() {
+    const auto next = std::find_if(ready_.begin(), ready_.end(),
+                                   [](const Ready& ready) { return !ready.queue->suspended(); });
+    if (next == ready_.end()) {
+        return false;
+    }
+    const Ready running = std::move(*next);
+    ready_.erase(next);
+    running.task();
+    return true;
+}
+
+void ManualQueues::runUntilIdle() {
+    while (runOne()) {
+    }
+}
+
+void ManualQueues::clear() {
+    ready_.clear();
+    delayed_.clear();
+}
+
+void ManualQueues::advance(std::chrono::nanoseconds by) {
+    const platform::SteadyTime until = clock_.steadyTime() + by;
+    runUntilIdle();
+    for (;;) {
+        const auto next = std::min_element(
+            delayed_.begin(), delayed_.end(),
+            [](const Delayed& left, const Delayed& right) { return left.due < right.due; });
+        if (next == delayed_.end() || next->due > until) {
+            break;
+        }
+        clock_.advance(std::max(next->due - clock_.steadyTime(), std::chrono::nanoseconds(0)));
+        ready_.push_back({next->queue, std::move(next->task)});
+        delayed_.erase(next);
+        runUntilIdle();
+    }
+    clock_.advance(until - clock_.steadyTime());
+}
+
+std::size_t ManualQueues::queuesMade(std::string_view name) const {
+    return static_cast<std::size_t>(std::count(made_.begin(), made_.end(), name));
+}
+
+std::size_t ManualQueues::pending(std::string_view name) const {
+    return static_cast<std::size_t>(
+        std::count_if(ready_.begin(), ready_.end(),
+                      [&](const Ready& ready) { return ready.queue->name() == name; }));
+}
+
+} // namespace halyard::testing
