@@ -8,6 +8,7 @@ namespace halyard::platform {
 namespace {
 
 const Platform* installed = nullptr;
+std::uint64_t installedTimes = 0;
 
 std::string_view baseName(std::string_view path) {
     return path.substr(path.rfind('/') + 1);
@@ -17,6 +18,11 @@ std::string_view baseName(std::string_view path) {
 
 void install(const Platform* platform) {
     installed = platform;
+    ++installedTimes;
+}
+
+std::uint64_t installations() {
+    return installedTimes;
 }
 
 const Platform& current() {

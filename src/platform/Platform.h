@@ -5,6 +5,8 @@
 // borrowed and must outlive the installation.
 #pragma once
 
+#include <cstdint>
+
 namespace halyard::platform {
 
 class AnalyticsService;
@@ -46,6 +48,10 @@ struct Platform {
 // Replaces what was installed before; null uninstalls. Requires that no other
 // thread uses the platform meanwhile.
 void install(const Platform* platform);
+
+// How often a platform was installed. What is to be worked out once in a
+// process's life is kept under this number, so that tests do not share it.
+std::uint64_t installations();
 
 // Requires an installed platform.
 const Platform& current();

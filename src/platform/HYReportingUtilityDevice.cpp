@@ -1,0 +1,85 @@
+#include "platform/HYReportingUtilityDevice.h"
+
+#include <atomic>
+#include <mutex>
+
+#include "common/Utf8.h"
+#include "platform/Log.h"
+#include "platform/Platform.h"
+
+namespace halyard {
+namespace {
+
+std::chrono::nanoseconds nanosecondsOf(double seconds) {
+    // Far beyond any wait, far inside the range of the clock's arithmetic.
+    constexpr double kLongest = 1e9;
+    if (!(seconds > 0)) {
+        return std::chrono::nanoseconds(0);
+    }
+    return std::chrono::duration_cast<std::chrono::nanoseconds>(
+        std::chrono::duration<double>(seconds < kLongest ? seconds : kLongest));
+}
+
+} // namespace
+
+std::optional<std::string> HYReportingUtilityProcessNameForPID(std::int32_t pid) {
+    const auto& own = *platform::current().ownProcess;
+    if (pid == own.pid()) {
+        return own.name();
+    }
+    platform::ProcessInfo info;
+    if (pid < 1 || !HYReportingUtilityProcessInfoForPID(pid, info)) {
+        return std::nullopt;
+    }
+    // The kernel cuts names by bytes, and so perhaps inside a character.
+    return replaceInvalidUtf8(info.shortCommandName);
+}
+
+bool HYReportingUtilityProcessInfoForPID(std::int32_t pid, platform::ProcessInfo& info) {
+    auto found = platform::current().processTable->infoForPID(pid);
+    if (found) {
+        info = std::move(*found);
+    }
+    return found.has_value();
+}
+
+bool HYReportingUtilityIsInternalBuild() {
+    // Twice the installation's number plus the answer; zero before the first.
+    static std::atomic<std::uint64_t> known{0};
+    static std::mutex asking;
+    const std::uint64_t installation = platform::installations();
+    if (std::uint64_t answer = known.load(std::memory_order_acquire); answer / 2 == installation) {
+        return answer % 2 != 0;
+    }
+    const std::lock_guard lock(asking);
+    if (std::uint64_t answer = known.load(std::memory_order_relaxed); answer / 2 == installation) {
+        return answer % 2 != 0;
+    }
+    const bool internal =
+        platform::current().deviceProperties->boolean("InternalBuild").value_or(false);
+    known.store(installation * 2 + (internal ? 1 : 0), std::memory_order_release);
+    return internal;
+}
+
+bool HYReportingUtilityWait(platform::Condition& condition, double timeout, const bool* done,
+                            std::string_view waitMessage, std::string_view timeoutMessage,
+                            LogCategory category) {
+    const std::lock_guard lock(condition);
+    while (!*done) {
+        HY_LOG_INFO(category, "{}", waitMessage);
+        if (!condition.waitFor(nanosecondsOf(timeout))) {
+            HY_LOG_ERROR(category, "{}", timeoutMessage);
+            return false;
+        }
+        HY_LOG_INFO(category, "continuing");
+    }
+    return true;
+}
+
+void HYReportingUtilitySignal(platform::Condition& condition, bool* done) {
+    const std::lock_guard lock(condition);
+    *done = true;
+    condition.signal();
+}
+
+} // namespace halyard
