@@ -8,6 +8,9 @@ target_compile_options(halyard_options INTERFACE
 target_include_directories(halyard_options INTERFACE ${PROJECT_SOURCE_DIR}/src)
 target_compile_definitions(halyard_options INTERFACE
   HALYARD_VERSION="${PROJECT_VERSION}")
+if(CMAKE_CXX_COMPILER_ID MATCHES Clang)
+  target_compile_options(halyard_options INTERFACE -Wthread-safety)
+endif()
 if(HALYARD_SANITIZE)
   target_compile_options(halyard_options INTERFACE
     -fsanitize=${HALYARD_SANITIZE} -fno-omit-frame-pointer -fno-sanitize-recover=all)

@@ -18,6 +18,7 @@ class FeatureFlags;
 class LogSink;
 class MetricService;
 class Notifications;
+class Operations;
 class OwnProcess;
 class Preferences;
 class ProcessTable;
@@ -43,6 +44,7 @@ struct Platform {
     AnalyticsService* analytics = nullptr;
     EnergyLedger* energyLedger = nullptr;
     MetricService* metrics = nullptr;
+    Operations* operations = nullptr;
 };
 
 // Replaces what was installed before; null uninstalls. Requires that no other

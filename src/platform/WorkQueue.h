@@ -28,12 +28,13 @@ public:
 // queues can wait at once on the few threads that serve them all.
 class SerialQueue : public WorkQueue {
 public:
-    // Holds back everything behind the running task. Requires that it is called
-    // from a task of this queue, which is not suspended yet.
-    virtual void suspend() = 0;
-    // Runs `first` before anything that is held back, then goes on. Any thread;
-    // at most once for each suspend().
-    virtual void resume(Task first) = 0;
+    // Holds back everything behind the running task until resume(), or until
+    // `limit` has passed, when `onTimeout` runs first and the rest follows.
+    // Requires that it is called from a task of this queue, once.
+    virtual void suspend(std::chrono::nanoseconds limit, Task onTimeout) = 0;
+    // Runs `first` before anything that is held back, then goes on. False, and
+    // `first` is dropped, when the limit ran out before. Any thread.
+    [[nodiscard]] virtual bool resume(Task first) = 0;
 };
 
 class QueueFactory {

@@ -17,14 +17,24 @@ public:
         owner_.delayed_.push_back(
             {owner_.clock_.steadyTime() + delay, shared_from_this(), std::move(task)});
     }
-    void suspend() override {
+    void suspend(std::chrono::nanoseconds limit, platform::Task onTimeout) override {
         assert(!suspended_);
         suspended_ = true;
+        const int wait = ++waits_;
+        owner_.delayed_.push_back({owner_.clock_.steadyTime() + limit, owner_.background_,
+                                   [self = shared_from_this(), wait, onTimeout] {
+                                       if (self->suspended_ && self->waits_ == wait) {
+                                           (void)self->resume(onTimeout);
+                                       }
+                                   }});
     }
-    void resume(platform::Task first) override {
-        assert(suspended_);
+    bool resume(platform::Task first) override {
+        if (!suspended_) {
+            return false;
+        }
         suspended_ = false;
         owner_.ready_.push_front({shared_from_this(), std::move(first)});
+        return true;
     }
 
     bool suspended() const { return suspended_; }
@@ -34,6 +44,7 @@ private:
     ManualQueues& owner_;
     std::string name_;
     bool suspended_ = false;
+    int waits_ = 0;
 };
 
 ManualQueues::ManualQueues(ManualClock& clock)

@@ -1,0 +1,336 @@
+#include "service/HYReportingClientServerInstance.h"
+
+#include <algorithm>
+#include <utility>
+
+#include "platform/Device.h"
+#include "platform/Log.h"
+#include "platform/Platform.h"
+#include "platform/TraceMarks.h"
+#include "service/MessageFanOut.h"
+
+namespace halyard {
+namespace {
+
+constexpr std::uint32_t kCreateMark = 0x21044814;
+constexpr std::uint32_t kStartMark = 0x21044818;
+constexpr std::uint32_t kStopMark = 0x2104481C;
+constexpr std::uint32_t kDestroyMark = 0x21044820;
+
+// The sixth and later concurrent sessions are not uploaded.
+constexpr std::int64_t kMaxUploadedSessions = 5;
+
+bool mayUpload(std::int64_t activeSessions) {
+    return activeSessions <= kMaxUploadedSessions;
+}
+
+void mark(std::uint32_t code) {
+    platform::current().traceMarks->mark(code, 0, 0, 0, 0);
+}
+
+void logActiveSessions(const HYReportingServiceDelegateProtocol& delegate) {
+    // Asking for the sessions writes log lines of its own, so it is done even
+    // where nobody reads this one.
+    const auto sessions = delegate.getAllActiveReportingSessions();
+    HY_LOG_DEFAULT(HYReportingClientCategory, "{} active reporting session(s) {}",
+                   delegate.activeSessionCount(), describeSessions(sessions));
+}
+
+} // namespace
+
+std::shared_ptr<HYReportingClientServerInstance>
+HYReportingClientServerInstance::initWithPID(std::int32_t pid, std::weak_ptr<Delegate> delegate,
+                                             std::shared_ptr<platform::SerialQueue> serviceQueue) {
+    return std::shared_ptr<HYReportingClientServerInstance>(
+        new HYReportingClientServerInstance(pid, std::move(delegate), std::move(serviceQueue)));
+}
+
+HYReportingClientServerInstance::HYReportingClientServerInstance(
+    std::int32_t pid, std::weak_ptr<Delegate> delegate,
+    std::shared_ptr<platform::SerialQueue> serviceQueue)
+    : pid_(pid), delegate_(std::move(delegate)), serviceQueue_(std::move(serviceQueue)) {
+    HY_LOG_DEFAULT(HYReportingClientCategory, "new client with pid {}", pid_);
+}
+
+HYReportingClientServerInstance::~HYReportingClientServerInstance() {
+    HY_LOG_DEBUG(HYReportingClientCategory, "dealloc {} from the server client list", pid_);
+}
+
+template <class Body> void HYReportingClientServerInstance::onServiceQueue(Body body) {
+    serviceQueue_->async([weak = weak_from_this(), body = std::move(body)] {
+        const auto self = weak.lock();
+        const auto delegate = self != nullptr ? self->delegate_.lock() : nullptr;
+        if (delegate != nullptr) {
+            body(*self, *delegate);
+        }
+    });
+}
+
+void HYReportingClientServerInstance::createReportingSession(std::int64_t reporterID,
+                                                             BoolReply reply) {
+    onServiceQueue([reporterID, reply = std::move(reply)](auto& self, Delegate& delegate) {
+        self.create(delegate, reporterID);
+        reply(std::nullopt, true);
+    });
+}
+
+void HYReportingClientServerInstance::create(Delegate& delegate, std::int64_t reporterID) {
+    HY_LOG_DEBUG(HYReportingClientCategory, "creating session for reporter {}", reporterID);
+    mark(kCreateMark);
+    auto session = HYReportingSession::initWithID(reporterID, {pid_});
+    session->setRelayReportingEnabled(mayUpload(delegate.activeSessionCount()));
+    {
+        const MutexLock lock(mapMutex_);
+        std::swap(sessions_[reporterID], session); // A replaced one goes after the lock.
+    }
+    HY_LOG_DEFAULT(HYReportingClientCategory, "session created for reporter {}", reporterID);
+}
+
+void HYReportingClientServerInstance::setServiceType(AudioServiceType type, std::int64_t reporterID,
+                                                     BoolReply reply) {
+    onServiceQueue([type, reporterID, reply = std::move(reply)](auto& self, Delegate& delegate) {
+        HY_LOG_DEBUG(HYReportingClientCategory, "setting service type {} for reporter {}", type,
+                     reporterID);
+        if (const auto session = self.findReportingSessionForID(delegate, reporterID, false)) {
+            session->setServiceType(type);
+            HY_LOG_DEFAULT(HYReportingClientCategory, "service type {} set for reporter  {}", type,
+                           reporterID);
+        }
+        reply(std::nullopt, true);
+    });
+}
+
+void HYReportingClientServerInstance::getServiceNameForReporterID(std::int64_t reporterID,
+                                                                  ServiceTypeReply reply) {
+    onServiceQueue([reporterID, reply = std::move(reply)](auto& self, Delegate& delegate) {
+        HY_LOG_DEBUG(HYReportingClientCategory, "fetching seviceType");
+        if (reporterID == 0) {
+            reply(std::nullopt, kAudioServiceTypeUnknown);
+            return;
+        }
+        const auto session = self.findReportingSessionForID(delegate, reporterID, true);
+        const AudioServiceType type =
+            session != nullptr ? session->serviceType() : kAudioServiceTypeUnknown;
+        reply(std::nullopt, type);
+        HY_LOG_DEFAULT(HYReportingClientCategory, "returning service type {} for reporter  {}",
+                       type, reporterID);
+    });
+}
+
+void HYReportingClientServerInstance::setConfiguration(Dictionary configuration,
+                                                       std::int64_t reporterID, BoolReply reply) {
+    onServiceQueue([configuration = std::move(configuration), reporterID,
+                    reply = std::move(reply)](auto& self, Delegate& delegate) {
+        HY_LOG_DEBUG(HYReportingClientCategory, "setting configuration");
+        if (const auto session = self.findReportingSessionForID(delegate, reporterID, false)) {
+            session->updateConfigurationWithContentsOfConfiguration(configuration);
+        }
+        reply(std::nullopt, true);
+    });
+}
+
+void HYReportingClientServerInstance::startReportingSessionForID(std::int64_t reporterID,
+                                                                 BoolReply reply) {
+    onServiceQueue([reporterID, reply = std::move(reply)](auto& self, Delegate& delegate) {
+        self.start(delegate, reporterID, reply);
+    });
+}
+
+void HYReportingClientServerInstance::start(Delegate& delegate, std::int64_t reporterID,
+                                            const BoolReply& reply) {
+    HY_LOG_DEBUG(HYReportingClientCategory, "starting session for reporter {}", reporterID);
+    mark(kStartMark);
+    const auto session = findReportingSessionForID(delegate, reporterID, false);
+    if (session == nullptr || session->started()) {
+        reply(std::nullopt, true);
+        return;
+    }
+    delegate.setActiveSessionCount(delegate.activeSessionCount() + 1);
+    session->setRelayReportingEnabled(mayUpload(delegate.activeSessionCount()));
+    session->start();
+    if (const auto earlier = session->exchangeTransactionCompleteBlock(reply)) {
+        earlier(std::nullopt, true);
+    }
+    if (const auto features = delegate.getFeaturesState()) {
+        session->sendMessage(*features, kAudioEventCategorySetup, kAudioEventTypeSetup, nullptr);
+    }
+    if (platform::current().featureFlags->isEnabled("AudioAnalytics", "Tracing") &&
+        session->serviceType() == kAudioServiceTypeTest) {
+        reply(std::nullopt, true);
+    }
+    logActiveSessions(delegate);
+}
+
+void HYReportingClientServerInstance::sendMessage(
+    Dictionary message, AudioEventCategory category, std::uint16_t type,
+    std::optional<std::vector<std::int64_t>> reporterIDs, ErrorReply reply) {
+    onServiceQueue([message = std::move(message), category, type,
+                    reporterIDs = std::move(reporterIDs),
+                    reply = std::move(reply)](auto& self, Delegate& delegate) {
+        reply(self.send(delegate, message, category, type, reporterIDs));
+    });
+}
+
+MaybeError
+HYReportingClientServerInstance::send(Delegate& delegate, const Dictionary& message,
+                                      AudioEventCategory category, std::uint16_t type,
+                                      const std::optional<std::vector<std::int64_t>>& reporterIDs) {
+    const MessageFanOut fanOut(delegate, {message, category, type});
+    return fanOut.route(reporterIDs, [&](std::int64_t reporterID) {
+        return findReportingSessionForID(delegate, reporterID, true);
+    });
+}
+
+void HYReportingClientServerInstance::stopReportingSessionForID(std::int64_t reporterID,
+                                                                BoolReply reply) {
+    onServiceQueue([reporterID, reply = std::move(reply)](auto& self, Delegate& delegate) {
+        self.stop(delegate, reporterID);
+        reply(std::nullopt, true);
+    });
+}
+
+void HYReportingClientServerInstance::stop(Delegate& delegate, std::int64_t reporterID) {
+    HY_LOG_DEBUG(HYReportingClientCategory, "stopping session for reporter {}", reporterID);
+    mark(kStopMark);
+    if (reporterID == 0) {
+        return;
+    }
+    const auto session = findReportingSessionForID(delegate, reporterID, false);
+    if (session != nullptr && session->started()) {
+        session->stop();
+        delegate.setActiveSessionCount(delegate.activeSessionCount() - 1);
+        if (const auto held = session->exchangeTransactionCompleteBlock(nullptr)) {
+            held(std::nullopt, true);
+        }
+        logActiveSessions(delegate);
+    }
+    HY_LOG_DEFAULT(HYReportingClientCategory, "stopping {}", reporterID);
+}
+
+void HYReportingClientServerInstance::destroyReportingSession(std::int64_t reporterID,
+                                                              BoolReply reply) {
+    onServiceQueue([reporterID, reply = std::move(reply)](auto& self, Delegate&) {
+        self.destroy(reporterID);
+        reply(std::nullopt, true);
+    });
+}
+
+void HYReportingClientServerInstance::destroy(std::int64_t reporterID) {
+    HY_LOG_DEBUG(HYReportingClientCategory, "destroying session for reporter {}", reporterID);
+    mark(kDestroyMark);
+    if (reporterID == 0) {
+        return;
+    }
+    if (const auto session = ownSession(reporterID)) {
+        if (session->started()) {
+            session->stop(); // Stays counted as active: only a stop request uncounts.
+        }
+        const MutexLock lock(mapMutex_);
+        sessions_.erase(reporterID);
+    }
+    HY_LOG_DEFAULT(HYReportingClientCategory, "destroying {}", reporterID);
+}
+
+void HYReportingClientServerInstance::reporterID(std::int64_t reporterID, DictionaryReply valid) {
+    onServiceQueue([reporterID, reply = std::move(valid)](auto& self, Delegate& delegate) {
+        HY_LOG_DEBUG(HYReportingClientCategory, "validating reporter {}", reporterID);
+        Dictionary result{{"reporterID", 0}, {"serviceType", kAudioServiceTypeUnknown}};
+        if (const auto session = self.findReportingSessionForID(delegate, reporterID, true)) {
+            result.set("reporterID", reporterID);
+            result.set("serviceType", session->serviceType());
+        }
+        HY_LOG_DEFAULT(HYReportingClientCategory, "validating reporter {}", reporterID);
+        reply(std::nullopt, result);
+    });
+}
+
+void HYReportingClientServerInstance::getAllReporters(ListReply reply) {
+    onServiceQueue([reply = std::move(reply)](auto&, Delegate& delegate) {
+        List reporters;
+        for (const auto& client : delegate.getAllClients()) {
+            for (const auto& [reporterID, session] : client->clientReportingSessionMap()) {
+                reporters.append(reporterID);
+            }
+        }
+        reply(std::nullopt, reporters);
+    });
+}
+
+void HYReportingClientServerInstance::killService(BoolReply reply) {
+    onServiceQueue([reply = std::move(reply)](auto&, Delegate&) {
+        HY_LOG_DEFAULT(HYReportingClientCategory, "DESTROYING SERVICE");
+        platform::current().ownProcess->terminate(2);
+    });
+}
+
+void HYReportingClientServerInstance::handleConnectionError() {
+    onServiceQueue([](auto& self, Delegate& delegate) { self.leave(delegate); });
+}
+
+void HYReportingClientServerInstance::leave(Delegate& delegate) {
+    const auto clients = delegate.getAllClients();
+    if (std::none_of(clients.begin(), clients.end(),
+                     [this](const auto& client) { return client.get() == this; })) {
+        return;
+    }
+    SessionMap sessions;
+    {
+        const MutexLock lock(mapMutex_);
+        sessions = sessions_;
+    }
+    for (const auto& [reporterID, session] : sessions) {
+        if (session->started()) {
+            session->stop();
+        }
+    }
+    {
+        const MutexLock lock(mapMutex_);
+        sessions_.clear();
+    }
+    delegate.removeClient(*this);
+    HY_LOG_DEFAULT(HYReportingClientCategory, "removing {} from the server client list", pid_);
+}
+
+std::optional<platform::WallTime> HYReportingClientServerInstance::clientStartDate() const {
+    const MutexLock lock(identityMutex_);
+    return startDate_;
+}
+
+std::optional<std::string> HYReportingClientServerInstance::clientProcessName() const {
+    const MutexLock lock(identityMutex_);
+    return processName_;
+}
+
+void HYReportingClientServerInstance::setIdentity(platform::WallTime startDate,
+                                                  std::optional<std::string> processName) {
+    const MutexLock lock(identityMutex_);
+    startDate_ = startDate;
+    processName_ = std::move(processName);
+}
+
+std::shared_ptr<HYReportingSession>
+HYReportingClientServerInstance::ownSession(std::int64_t reporterID) const {
+    const MutexLock lock(mapMutex_);
+    const auto at = sessions_.find(reporterID);
+    return at != sessions_.end() ? at->second : nullptr;
+}
+
+HYReportingClientServerInstance::SessionMap
+HYReportingClientServerInstance::clientReportingSessionMap() const {
+    const MutexLock lock(mapMutex_);
+    return sessions_;
+}
+
+std::shared_ptr<HYReportingSession> HYReportingClientServerInstance::findReportingSessionForID(
+    const Delegate& delegate, std::int64_t reporterID, bool acrossAllClients) const {
+    if (reporterID == 0) {
+        return nullptr; // ID 0 means no session, even where a client created it.
+    }
+    auto session = ownSession(reporterID);
+    if (session == nullptr && acrossAllClients) {
+        session = delegate.findReportingSessionForID(reporterID);
+    }
+    return session;
+}
+
+} // namespace halyard

@@ -1,0 +1,224 @@
+#include "service/HYReportingServiceDelegate.h"
+
+#include <algorithm>
+#include <chrono>
+#include <utility>
+
+#include "platform/Clock.h"
+#include "platform/Device.h"
+#include "platform/EventServices.h"
+#include "platform/HYReportingUtilityDevice.h"
+#include "platform/Log.h"
+#include "platform/Platform.h"
+#include "service/HYReportingClientServerInstance.h"
+#include "service/MessageFanOut.h"
+#include "service/RequestDispatch.h"
+
+namespace halyard {
+namespace {
+
+constexpr std::string_view kUptimeEvent = "com.kestrel.halyard.hyreportingclientuptime";
+
+std::vector<std::shared_ptr<HYReportingSession>>
+sessionsOf(const HYReportingClientServerInstance& client) {
+    std::vector<std::shared_ptr<HYReportingSession>> sessions;
+    for (const auto& [reporterID, session] : client.clientReportingSessionMap()) {
+        sessions.push_back(session);
+    }
+    return sessions;
+}
+
+// The time that a client was connected; -1 when its start was never recorded.
+double uptimeSeconds(std::int32_t pid, const std::optional<platform::WallTime>& startDate,
+                     const std::string& nameForLog) {
+    if (!startDate) {
+        HY_LOG_DEFAULT(HYReportingServiceDelegateCategory,
+                       "clientStartDate is nil. clientpid={} clientprocessname={}", pid,
+                       nameForLog);
+        return -1;
+    }
+    const std::chrono::duration<double> elapsed =
+        platform::current().clock->wallTime() - *startDate;
+    if (elapsed.count() < 0) {
+        HY_LOG_DEFAULT(HYReportingServiceDelegateCategory,
+                       "clientStartDate is in the past. clientpid={} clientprocessname={}", pid,
+                       nameForLog);
+    }
+    return std::abs(elapsed.count());
+}
+
+} // namespace
+
+std::shared_ptr<HYReportingServiceDelegate> HYReportingServiceDelegate::make() {
+    std::shared_ptr<HYReportingServiceDelegate> delegate(new HYReportingServiceDelegate);
+    delegate->listenForFeatureStateChanges();
+    return delegate;
+}
+
+HYReportingServiceDelegate::HYReportingServiceDelegate()
+    : serviceQueue_(platform::current().queues->makeSerialQueue(
+          "com.kestrel.halyard.reporting.server", platform::QueuePriority::UserInteractive)),
+      defaults_(HYReportingDefaults()), features_(makeFeatureRecords()) {}
+
+void HYReportingServiceDelegate::listenForFeatureStateChanges() {
+    HY_LOG_INFO(HYReportingServiceDelegateCategory, "listening for features {}",
+                describeFeatures(features_));
+    for (FeatureRecord& feature : features_) {
+        const auto registration = platform::current().notifications->registerFor(
+            feature.notification, serviceQueue_, [weak = weak_from_this()](int token) {
+                if (const auto self = weak.lock()) {
+                    self->featureChanged(token);
+                }
+            });
+        feature.notifyToken = registration.token;
+        HY_LOG_DEFAULT(HYReportingServiceDelegateCategory, "notify setup result {} token {}",
+                       registration.status, registration.token);
+    }
+}
+
+void HYReportingServiceDelegate::featureChanged(int token) {
+    HY_LOG_INFO(HYReportingServiceDelegateCategory, "feature {} changes", token);
+    const auto state = getFeaturesState();
+    HY_LOG_INFO(HYReportingServiceDelegateCategory, "defaults {}", state ? Value(*state) : Value());
+    if (!state) {
+        return; // Nothing is set any more: there is no state to tell.
+    }
+    for (const Client& client : getAllClients()) {
+        for (const Session& session : sessionsOf(*client)) {
+            session->sendMessage(*state, kAudioEventCategorySetup, kAudioEventTypeSetup, nullptr);
+        }
+    }
+}
+
+std::optional<Dictionary> HYReportingServiceDelegate::getFeaturesState() const {
+    return readFeaturesState(features_);
+}
+
+bool HYReportingServiceDelegate::shouldAcceptNewConnection(
+    const std::shared_ptr<platform::Connection>& connection) {
+    const std::int32_t pid = connection->processIdentifier();
+    HY_LOG_DEFAULT(HYReportingServiceDelegateCategory, "newConnection: {}",
+                   connection->description());
+    Client client;
+    {
+        const MutexLock lock(monitor_);
+        client = HYReportingClientServerInstance::initWithPID(pid, weak_from_this(), serviceQueue_);
+    }
+    // The dispatcher is the client object's owner until the connection goes.
+    connection->setExportedObject(
+        std::make_shared<RequestDispatch>(client, weak_from_this(), serviceQueue_));
+    serviceQueue_->async([self = shared_from_this(), client] {
+        {
+            const MutexLock lock(self->monitor_);
+            self->clients_.push_back(client);
+        }
+        client->setIdentity(platform::current().clock->wallTime(),
+                            HYReportingUtilityProcessNameForPID(client->processIdentifier()));
+    });
+    const std::weak_ptr<HYReportingClientServerInstance> weak = client;
+    connection->setInterruptionHandler([weak] {
+        HY_LOG_DEFAULT(HYReportingServiceDelegateCategory,
+                       "interruptionHandler: connection exited");
+        if (const auto interrupted = weak.lock()) {
+            interrupted->handleConnectionError();
+        }
+    });
+    connection->setInvalidationHandler([weak] {
+        if (const auto invalidated = weak.lock()) {
+            invalidated->handleConnectionError();
+            reportUptime(invalidated.get());
+        } else {
+            reportUptime(nullptr);
+        }
+    });
+    connection->resume();
+    return true;
+}
+
+void HYReportingServiceDelegate::reportUptime(const HYReportingClientServerInstance* client) {
+    const std::int32_t pid = client != nullptr ? client->processIdentifier() : 0;
+    const auto name = client != nullptr ? client->clientProcessName() : std::nullopt;
+    const std::string nameForLog = name.value_or("unknown");
+    const double seconds = uptimeSeconds(
+        pid, client != nullptr ? client->clientStartDate() : std::nullopt, nameForLog);
+    HY_LOG_DEFAULT(HYReportingServiceDelegateCategory,
+                   "invalidationHandler: connection exited process={} uptime_sec={}", nameForLog,
+                   static_cast<std::int64_t>(seconds));
+    if (!name) {
+        HY_LOG_DEFAULT(HYReportingServiceDelegateCategory, "clientProcessName is nil. clientpid={}",
+                       pid);
+        return;
+    }
+    platform::AnalyticsService& analytics = *platform::current().analytics;
+    if (analytics.isEventUsed(kUptimeEvent)) {
+        analytics.sendEventLazily(kUptimeEvent, [processName = *name, seconds] {
+            return Dictionary{{"processName", processName}, {"seconds", seconds}};
+        });
+    }
+}
+
+std::vector<HYReportingServiceDelegate::Client> HYReportingServiceDelegate::getAllClients() const {
+    const MutexLock lock(monitor_);
+    return clients_;
+}
+
+void HYReportingServiceDelegate::removeClient(const HYReportingClientServerInstance& client) {
+    const MutexLock lock(monitor_);
+    std::erase_if(clients_, [&](const Client& each) { return each.get() == &client; });
+}
+
+HYReportingServiceDelegate::Session
+HYReportingServiceDelegate::findReportingSessionForID(std::int64_t reporterID) const {
+    if (reporterID == 0 || !reportingEnabled_) {
+        return nullptr;
+    }
+    const MutexLock lock(monitor_);
+    for (const Client& client : clients_) {
+        if (auto session = client->ownSession(reporterID)) {
+            HY_LOG_INFO(HYReportingServiceDelegateCategory,
+                        "found reporting session {} for client {}", reporterID,
+                        client->processIdentifier());
+            return session;
+        }
+    }
+    HY_LOG_ERROR(HYReportingServiceDelegateCategory, "failed to find reporting session {}",
+                 reporterID);
+    return nullptr;
+}
+
+std::vector<HYReportingServiceDelegate::Session>
+HYReportingServiceDelegate::getAllActiveReportingSessions() const {
+    std::vector<Session> active;
+    for (const Client& client : getAllClients()) {
+        const auto sessions = sessionsOf(*client);
+        HY_LOG_DEFAULT(HYReportingServiceDelegateCategory, "sessions for client {} : {}",
+                       client->processIdentifier(), describeSessions(sessions));
+        std::copy_if(sessions.begin(), sessions.end(), std::back_inserter(active),
+                     [](const Session& session) { return session->started(); });
+    }
+    return active;
+}
+
+void HYReportingServiceDelegate::stopAllSessions() {
+    for (const Client& client : getAllClients()) {
+        client->handleConnectionError();
+    }
+}
+
+Dictionary HYReportingServiceDelegate::status() const {
+    std::int64_t sessions = 0;
+    std::int64_t started = 0;
+    const auto clients = getAllClients();
+    for (const Client& client : clients) {
+        for (const Session& session : sessionsOf(*client)) {
+            ++sessions;
+            started += session->started() ? 1 : 0;
+        }
+    }
+    return Dictionary{{"connections", clients.size()},
+                      {"sessions", sessions},
+                      {"sessions_started", started},
+                      {"active_session_count", activeSessionCount_}};
+}
+
+} // namespace halyard

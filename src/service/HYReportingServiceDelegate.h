@@ -1,0 +1,72 @@
+// The one service object: it accepts connections, keeps the clients in the order
+// of their acceptance, answers what spans all of them, and reports how long each
+// stayed.
+//
+// The client list changes on the service work queue only. The monitor lock
+// guards the creation of client objects and findReportingSessionForID, which
+// delivery threads may use.
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "common/Mutex.h"
+#include "common/Value.h"
+#include "platform/Listener.h"
+#include "platform/WorkQueue.h"
+#include "service/FeatureState.h"
+#include "service/HYReportingServiceDelegateProtocol.h"
+
+namespace halyard {
+
+class HYReportingServiceDelegate final
+    : public platform::ListenerDelegate,
+      public HYReportingServiceDelegateProtocol,
+      public std::enable_shared_from_this<HYReportingServiceDelegate> {
+public:
+    // Reads the defaults and registers for the feature notifications.
+    static std::shared_ptr<HYReportingServiceDelegate> make();
+
+    bool
+    shouldAcceptNewConnection(const std::shared_ptr<platform::Connection>& connection) override;
+
+    Dictionary getDefaults() const override { return defaults_; }
+    std::optional<Dictionary> getFeaturesState() const override;
+    std::vector<Client> getAllClients() const override;
+    bool isReportingEnabled() const override { return reportingEnabled_; }
+    std::vector<Session> getAllActiveReportingSessions() const override;
+    Session findReportingSessionForID(std::int64_t reporterID) const override;
+    void removeClient(const HYReportingClientServerInstance& client) override;
+    std::int64_t activeSessionCount() const override { return activeSessionCount_; }
+    void setActiveSessionCount(std::int64_t count) override { activeSessionCount_ = count; }
+
+    // The master switch, which nothing in the daemon ever turns off.
+    void setReportingEnabled(bool enabled) { reportingEnabled_ = enabled; }
+    const std::shared_ptr<platform::SerialQueue>& serviceQueue() const { return serviceQueue_; }
+
+    // What operators see; on the service work queue.
+    Dictionary status() const;
+    // Ends every session as a lost connection does. On the service work queue.
+    void stopAllSessions();
+
+private:
+    HYReportingServiceDelegate();
+
+    void listenForFeatureStateChanges();
+    void featureChanged(int token);
+    static void reportUptime(const HYReportingClientServerInstance* client);
+
+    std::shared_ptr<platform::SerialQueue> serviceQueue_;
+    bool reportingEnabled_ = true;
+    const Dictionary defaults_;
+    std::int64_t activeSessionCount_ = 0;
+    std::vector<FeatureRecord> features_;
+
+    mutable Mutex monitor_;
+    std::vector<Client> clients_ HY_GUARDED_BY(monitor_);
+};
+
+} // namespace halyard

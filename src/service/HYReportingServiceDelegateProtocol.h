@@ -1,0 +1,38 @@
+// What the service object offers to its client objects, which know it by
+// nothing else.
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "common/HYReportingUtility.h"
+#include "common/Value.h"
+
+namespace halyard {
+
+class HYReportingClientServerInstance;
+class HYReportingSession;
+
+// All on the service work queue, but for findReportingSessionForID (any thread).
+class HYReportingServiceDelegateProtocol {
+public:
+    using Client = std::shared_ptr<HYReportingClientServerInstance>;
+    using Session = std::shared_ptr<HYReportingSession>;
+
+    virtual ~HYReportingServiceDelegateProtocol() = default;
+
+    virtual Dictionary getDefaults() const = 0;
+    virtual std::optional<Dictionary> getFeaturesState() const = 0;
+    virtual std::vector<Client> getAllClients() const = 0;
+    virtual bool isReportingEnabled() const = 0;
+    virtual std::vector<Session> getAllActiveReportingSessions() const = 0;
+    virtual Session findReportingSessionForID(std::int64_t reporterID) const = 0;
+    virtual void removeClient(const HYReportingClientServerInstance& client) = 0;
+    virtual std::int64_t activeSessionCount() const = 0;
+    virtual void setActiveSessionCount(std::int64_t count) = 0;
+};
+
+} // namespace halyard

@@ -1,0 +1,85 @@
+#include "service/MessageFanOut.h"
+
+#include "platform/Device.h"
+#include "platform/Log.h"
+#include "platform/Platform.h"
+#include "platform/TraceMarks.h"
+
+namespace halyard {
+namespace {
+
+constexpr std::uint32_t kSendMark = 0x21044824;
+constexpr std::int64_t kReportingDisabled = 1;
+constexpr std::int64_t kStandaloneReporterID = 1;
+
+Value describeIDs(const std::optional<std::vector<std::int64_t>>& reporterIDs) {
+    if (!reporterIDs) {
+        return {};
+    }
+    return List(std::vector<Value>(reporterIDs->begin(), reporterIDs->end()));
+}
+
+} // namespace
+
+Value describeSessions(const std::vector<std::shared_ptr<HYReportingSession>>& sessions) {
+    std::vector<Value> descriptions;
+    descriptions.reserve(sessions.size());
+    for (const auto& session : sessions) {
+        descriptions.emplace_back(session->description());
+    }
+    return List(std::move(descriptions));
+}
+
+MaybeError MessageFanOut::route(const std::optional<std::vector<std::int64_t>>& reporterIDs,
+                                const Lookup& findAcrossAllClients) const {
+    HY_LOG_DEBUG(HYReportingClientCategory, "sending message for reporter {}",
+                 describeIDs(reporterIDs));
+    platform::current().traceMarks->mark(kSendMark, 0, 0, 0, 0);
+    if (!delegate_.isReportingEnabled()) {
+        return Error{std::string(kReportingErrorDomain), kReportingDisabled, {}};
+    }
+    if (reporterIDs) {
+        sendToAddressed(*reporterIDs, findAcrossAllClients);
+    } else {
+        broadcast();
+    }
+    return std::nullopt;
+}
+
+void MessageFanOut::sendToAddressed(const std::vector<std::int64_t>& reporterIDs,
+                                    const Lookup& findAcrossAllClients) const {
+    for (const std::int64_t reporterID : reporterIDs) {
+        if (reporterID == 0) {
+            continue;
+        }
+        if (const Session session = findAcrossAllClients(reporterID)) {
+            sendToSession(*session);
+        }
+    }
+}
+
+void MessageFanOut::broadcast() const {
+    const auto sessions = delegate_.getAllActiveReportingSessions();
+    HY_LOG_DEFAULT(HYReportingClientCategory, "active reporting sessions {} : {}", sessions.size(),
+                   describeSessions(sessions));
+    for (const Session& session : sessions) {
+        sendToSession(*session);
+    }
+    if (sessions.empty()) {
+        sendStandalone();
+    }
+}
+
+void MessageFanOut::sendStandalone() const {
+    HY_LOG_DEFAULT(HYReportingClientCategory,
+                   "no active reporting sessions found, sending as standalone");
+    HYReportingSession::sendSingleMessage(message_.payload, message_.category, message_.type,
+                                          kAudioServiceTypeStandalone, delegate_.getDefaults(),
+                                          nullptr);
+}
+
+void MessageFanOut::sendToSession(HYReportingSession& session) const {
+    session.sendMessage(message_.payload, message_.category, message_.type, nullptr);
+}
+
+} // namespace halyard

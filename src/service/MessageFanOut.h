@@ -1,0 +1,56 @@
+// Routes one client message to the sessions concerned.
+//
+// Runs on the service work queue, so sessions see one message at a time, in the
+// order of arrival. Borrows everything it is given; lives for one message.
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <vector>
+
+#include "common/Error.h"
+#include "common/HYReportingUtility.h"
+#include "common/Value.h"
+#include "service/HYReportingServiceDelegateProtocol.h"
+#include "session/HYReportingSession.h"
+
+namespace halyard {
+
+// What a client sent.
+struct ClientMessage {
+    const Dictionary& payload;
+    AudioEventCategory category;
+    std::uint16_t type;
+};
+
+class MessageFanOut {
+public:
+    using Session = std::shared_ptr<HYReportingSession>;
+    using Lookup = std::function<Session(std::int64_t reporterID)>;
+
+    MessageFanOut(HYReportingServiceDelegateProtocol& delegate, ClientMessage message)
+        : delegate_(delegate), message_(message) {}
+
+    // Without a list the message goes to every started session or, where there
+    // is none, out on its own. The error is that of a disabled service; unknown
+    // reporter IDs are skipped silently.
+    MaybeError route(const std::optional<std::vector<std::int64_t>>& reporterIDs,
+                     const Lookup& findAcrossAllClients) const;
+
+private:
+    void sendToAddressed(const std::vector<std::int64_t>& reporterIDs,
+                         const Lookup& findAcrossAllClients) const;
+    void broadcast() const;
+    void sendStandalone() const;
+    void sendToSession(HYReportingSession& session) const;
+
+    HYReportingServiceDelegateProtocol& delegate_;
+    const ClientMessage message_;
+};
+
+// A list of session descriptions, for log lines.
+Value describeSessions(const std::vector<std::shared_ptr<HYReportingSession>>& sessions);
+
+} // namespace halyard

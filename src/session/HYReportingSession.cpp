@@ -1,0 +1,188 @@
+#include "session/HYReportingSession.h"
+
+#include <cstdlib>
+#include <fmt/format.h>
+#include <utility>
+
+#include "platform/Log.h"
+#include "platform/Platform.h"
+#include "platform/TraceMarks.h"
+
+namespace halyard {
+namespace {
+
+constexpr std::uint32_t kCreatedMark = 0x21044828;
+constexpr std::uint32_t kStartMark = 0x2104482C;
+constexpr std::uint32_t kStopMark = 0x21044830;
+constexpr std::uint32_t kDestroyedMark = 0x21044834;
+constexpr std::uint32_t kMessageMark = 0x21044838;
+
+constexpr const char* kHostApplicationKey = "HostApplicationDisplayID";
+constexpr const char* kClientApplicationKey = "VQHostApplicationDisplayID";
+
+void mark(std::uint32_t code) {
+    platform::current().traceMarks->mark(code, 0, 0, 0, 0);
+}
+
+} // namespace
+
+std::shared_ptr<HYReportingSession>
+HYReportingSession::initWithID(std::int64_t reporterID,
+                               std::vector<std::int32_t> processIdentifiers) {
+    return std::shared_ptr<HYReportingSession>(
+        new HYReportingSession(reporterID, std::move(processIdentifiers)));
+}
+
+HYReportingSession::HYReportingSession(std::int64_t reporterID,
+                                       std::vector<std::int32_t> processIdentifiers)
+    : reporterID_(reporterID), processIdentifiers_(std::move(processIdentifiers)) {
+    HY_LOG_INFO(HYReportingSessionCategory, "created reporting session for ID: {}", reporterID_);
+    mark(kCreatedMark);
+}
+
+HYReportingSession::~HYReportingSession() {
+    mark(kDestroyedMark);
+    HY_LOG_INFO(HYReportingSessionCategory, "deallocing this session {}", reporterID_);
+}
+
+std::string HYReportingSession::description() const {
+    const MutexLock lock(stateMutex_);
+    return fmt::format(
+        "reporterID={},serviceName={},ownerPid={},HostApplicationDisplayID={},started={}",
+        reporterID_, serviceName_, processIdentifiers_.empty() ? 0 : processIdentifiers_.front(),
+        describe(HYReportingUtilityRetrieveAppName(configuration_)), started() ? 1 : 0);
+}
+
+AudioServiceType HYReportingSession::serviceType() const {
+    const MutexLock lock(stateMutex_);
+    return serviceType_;
+}
+
+std::string HYReportingSession::serviceName() const {
+    const MutexLock lock(stateMutex_);
+    return serviceName_;
+}
+
+void HYReportingSession::setServiceType(AudioServiceType type) {
+    const std::string_view name = HYReportingUtilityGenerateServiceNameFromServiceType(type);
+    {
+        const MutexLock lock(stateMutex_);
+        serviceType_ = type;
+        serviceName_ = name;
+    }
+    HY_LOG_INFO(HYReportingSessionCategory, "setting service type {}", name);
+}
+
+Dictionary HYReportingSession::configuration() const {
+    const MutexLock lock(stateMutex_);
+    return configuration_;
+}
+
+void HYReportingSession::setConfiguration(const Dictionary* configuration) {
+    if (configuration != nullptr) {
+        const MutexLock lock(stateMutex_);
+        configuration_.merge(*configuration);
+    }
+}
+
+void HYReportingSession::updateConfigurationWithContentsOfConfiguration(const Dictionary& update) {
+    const MutexLock lock(stateMutex_);
+    if (const Value* application = update.find(kClientApplicationKey)) {
+        configuration_.set(kHostApplicationKey, *application);
+    }
+    configuration_.merge(update);
+}
+
+HYReportingSession::TransactionCompleteBlock
+HYReportingSession::exchangeTransactionCompleteBlock(TransactionCompleteBlock block) {
+    const MutexLock lock(stateMutex_);
+    return std::exchange(transactionCompleteBlock_, std::move(block));
+}
+
+void HYReportingSession::start() {
+    HY_LOG_DEBUG(HYReportingSessionCategory, "starting session owned by {}", reporterID_);
+    if (started()) {
+        HY_LOG_INFO(HYReportingSessionCategory, "{} is already started", reporterID_);
+        return;
+    }
+    {
+        const MutexLock lock(batchMutex_);
+        batch_ = std::make_unique<MessageBatch>();
+        started_.store(true);
+    }
+    mark(kStartMark);
+    if (relayReportingEnabled()) {
+        startRelayReporting();
+    }
+}
+
+void HYReportingSession::stop() {
+    HY_LOG_DEBUG(HYReportingSessionCategory, "ending session {}", reporterID_);
+    if (!started()) {
+        return;
+    }
+    HY_LOG_DEBUG(HYReportingSessionCategory, "ending session {}", reporterID_);
+    mark(kStopMark);
+    if (relayReportingEnabled()) {
+        stopRelayReporting();
+    }
+    std::unique_ptr<MessageBatch> finished; // Freed after the lock.
+    {
+        const MutexLock lock(batchMutex_);
+        finished = std::move(batch_);
+        started_.store(false);
+    }
+}
+
+bool HYReportingSession::createMessageIdentifierWithCategory(AudioEventCategory category,
+                                                             AudioEventType type,
+                                                             const Dictionary& message) {
+    if (batch_ == nullptr) {
+        return false; // Not started: nothing is recorded, nothing is a repeat.
+    }
+    const bool redundant = batch_->addUnlessRedundant(category, type, message);
+    if (redundant) {
+        HY_LOG_DEBUG(HYReportingSessionCategory, "dropping redundant event");
+    }
+    return redundant;
+}
+
+void HYReportingSession::sendMessage(const Dictionary& message, AudioEventCategory category,
+                                     AudioEventType type, bool /*sync*/, const SendReply& reply) {
+    HY_LOG_DEBUG(HYReportingSessionCategory, "sending message for session owned by {}",
+                 reporterID_);
+    Dictionary tagged = HYReportingUtilityAddAudioMessageTag(
+        HYReportingUtilityRemoveWhiteSpaceFromKeys(message), category, type);
+    bool redundant = false;
+    {
+        const MutexLock lock(batchMutex_);
+        redundant = createMessageIdentifierWithCategory(category, type, tagged);
+    }
+    mark(kMessageMark);
+    const bool wasStarted = started();
+    if (relayReportingEnabled()) {
+        relay({std::move(tagged), message, category, type, wasStarted, redundant});
+    }
+    if (reply) {
+        reply(std::nullopt);
+    }
+}
+
+std::uint32_t HYReportingSession::messageIdentifierCount(std::string_view base) const {
+    const MutexLock lock(batchMutex_);
+    return batch_ != nullptr ? batch_->countFor(base) : 0;
+}
+
+std::vector<HYReportingSession::BatchedMessage>
+HYReportingSession::nestedAggregatedPayloadData() const {
+    const MutexLock lock(batchMutex_);
+    std::vector<BatchedMessage> messages;
+    if (batch_ != nullptr) {
+        for (const MessageBatch::Entry& entry : batch_->entries()) {
+            messages.push_back({entry.identifier(), entry.message});
+        }
+    }
+    return messages;
+}
+
+} // namespace halyard

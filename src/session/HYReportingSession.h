@@ -1,0 +1,166 @@
+// One reporting session of one client, from its creation to its destruction: its
+// service type and configuration and, while it runs, the batch of the messages
+// it accepted and its upload session.
+//
+// Threads: the client's requests call it on the service work queue. Opening the
+// upload session, every delivery to it and its closing run, in that order, on
+// the session's own relay queue. The accessors may be used from any thread; each
+// yields a whole value.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "common/Error.h"
+#include "common/HYReportingUtility.h"
+#include "common/Mutex.h"
+#include "common/Value.h"
+#include "platform/RelayReporting.h"
+#include "platform/WorkQueue.h"
+#include "session/AsyncSemaphore.h"
+#include "session/MessageBatch.h"
+
+namespace halyard {
+
+// Keys that clients may put into messages; the session treats them like any other.
+inline constexpr const char* HYReportingSessionBlacklistFieldsKey = "_comparison_field_blacklist";
+inline constexpr const char* HYReportingSessionThrottleSecondsKey = "_throttle_seconds";
+
+// How long an opening upload session waits for its back ends, in seconds; the
+// integer part counts.
+inline constexpr const char* HYReportingRelayReportingTimeOut = "9.0";
+
+class HYReportingSession final : public std::enable_shared_from_this<HYReportingSession> {
+public:
+    using SendReply = std::function<void(const MaybeError&)>;
+    using TransactionCompleteBlock = std::function<void(const MaybeError&, bool)>;
+
+    // The first process identifier is the owner's.
+    static std::shared_ptr<HYReportingSession>
+    initWithID(std::int64_t reporterID, std::vector<std::int32_t> processIdentifiers);
+    ~HYReportingSession();
+
+    std::string description() const;
+
+    // Starting a started session and stopping one that is not are no-ops.
+    void start();
+    void stop();
+
+    void setServiceType(AudioServiceType type);
+    // Merges; null is ignored. Never removes a key.
+    void setConfiguration(const Dictionary* configuration);
+    // The merge for clients: also takes "VQHostApplicationDisplayID" as the
+    // application's name.
+    void updateConfigurationWithContentsOfConfiguration(const Dictionary& update)
+        HY_EXCLUDES(stateMutex_);
+
+    // Batches the message unless it repeats its predecessor and, with relay
+    // reporting enabled, hands it on to the relay queue. `sync` is ignored: every
+    // delivery is asynchronous. The reply may be null; it is called at once and
+    // never tells what became of the delivery.
+    void sendMessage(const Dictionary& message, AudioEventCategory category, AudioEventType type,
+                     bool sync, const SendReply& reply);
+    void sendMessage(const Dictionary& message, AudioEventCategory category, AudioEventType type,
+                     const SendReply& reply) {
+        sendMessage(message, category, type, false, reply);
+    }
+
+    // Uploads one message on its own, one second later. `userInfo` is ignored:
+    // the user information is built from the service type alone.
+    static void sendSingleMessage(const Dictionary& message, AudioEventCategory category,
+                                  AudioEventType type, AudioServiceType serviceType,
+                                  const Dictionary& userInfo, SendReply reply);
+
+    // Records the message in the batch unless it is redundant; true when it was.
+    bool createMessageIdentifierWithCategory(AudioEventCategory category, AudioEventType type,
+                                             const Dictionary& message) HY_REQUIRES(batchMutex_);
+
+    bool started() const { return started_.load(); }
+    std::int64_t reporterID() const { return reporterID_; }
+    const std::vector<std::int32_t>& processIdentifiers() const { return processIdentifiers_; }
+    AudioServiceType serviceType() const HY_EXCLUDES(stateMutex_);
+    std::string serviceName() const HY_EXCLUDES(stateMutex_);
+    Dictionary configuration() const HY_EXCLUDES(stateMutex_);
+    bool relayReportingEnabled() const { return relayReportingEnabled_.load(); }
+    void setRelayReportingEnabled(bool enabled) { relayReportingEnabled_.store(enabled); }
+    // The flag itself, not a copy.
+    const std::atomic<bool>& getRelayReportingStartedState() const {
+        return relayReportingSessionStarted_;
+    }
+    bool hasRelayReportingSession() const HY_EXCLUDES(stateMutex_);
+    bool shouldReportOrientation() const { return false; }
+    // Stores the reply of a start request that is held until the session stops,
+    // and returns the one held before.
+    TransactionCompleteBlock exchangeTransactionCompleteBlock(TransactionCompleteBlock block);
+
+    // The number of the last accepted message of a base identifier; 0 when there
+    // is none or the session is not started.
+    std::uint32_t messageIdentifierCount(std::string_view base) const HY_EXCLUDES(batchMutex_);
+    struct BatchedMessage {
+        std::string identifier;
+        Dictionary message;
+    };
+    // A copy, empty when the session is not started.
+    std::vector<BatchedMessage> nestedAggregatedPayloadData() const HY_EXCLUDES(batchMutex_);
+
+private:
+    struct Opening;
+    struct Delivery {
+        Dictionary tagged;
+        Dictionary message; // as the client sent it
+        AudioEventCategory category;
+        AudioEventType type;
+        bool wasStarted; // when the message was sent
+        bool redundant;
+    };
+
+    HYReportingSession(std::int64_t reporterID, std::vector<std::int32_t> processIdentifiers);
+
+    // Made on first use.
+    std::shared_ptr<platform::SerialQueue> relayReportingQueue() HY_EXCLUDES(stateMutex_);
+    std::shared_ptr<platform::RelayReporting> relayReportingSession() const
+        HY_EXCLUDES(stateMutex_);
+
+    // Queue what follows below.
+    void startRelayReporting();
+    void stopRelayReporting();
+    void relay(Delivery delivery);
+
+    // On the relay queue.
+    void openRelayReporting(const Opening& opening);
+    void finishOpening(bool signalled);
+    void deliver(const Delivery& delivery);
+    void closeRelayReporting(AudioServiceType type);
+    void dropRelayReportingSession() HY_EXCLUDES(stateMutex_);
+
+    // On a thread of the upload framework.
+    void backendsFound(const std::optional<List>& backends);
+
+    const std::int64_t reporterID_;
+    const std::vector<std::int32_t> processIdentifiers_;
+    const std::shared_ptr<AsyncSemaphore> relayreportingBackendSemaphore_ =
+        std::make_shared<AsyncSemaphore>();
+
+    std::atomic<bool> started_{false};
+    std::atomic<bool> relayReportingEnabled_{false};
+    std::atomic<bool> relayReportingSessionStarted_{false};
+
+    mutable Mutex stateMutex_;
+    AudioServiceType serviceType_ HY_GUARDED_BY(stateMutex_) = kAudioServiceTypeUnknown;
+    std::string serviceName_ HY_GUARDED_BY(stateMutex_) = "unknown";
+    Dictionary configuration_ HY_GUARDED_BY(stateMutex_);
+    TransactionCompleteBlock transactionCompleteBlock_ HY_GUARDED_BY(stateMutex_);
+    std::shared_ptr<platform::SerialQueue> relayReportingQueue_ HY_GUARDED_BY(stateMutex_);
+    std::shared_ptr<platform::RelayReporting> relayReportingSession_ HY_GUARDED_BY(stateMutex_);
+    Value relayReportingAgentToken_ HY_GUARDED_BY(stateMutex_);
+
+    mutable Mutex batchMutex_;
+    // Null while the session is not started.
+    std::unique_ptr<MessageBatch> batch_ HY_GUARDED_BY(batchMutex_);
+};
+
+} // namespace halyard

@@ -1,0 +1,73 @@
+#include "session/MessageBatch.h"
+
+#include <algorithm>
+#include <array>
+
+namespace halyard {
+namespace {
+
+constexpr std::array<std::string_view, 3> kComparisonExcludedKeys = {
+    "processuptime_ms", "systemuptime_sec", "hyreporting_timestamp"};
+
+bool isExcluded(std::string_view key) {
+    return std::find(kComparisonExcludedKeys.begin(), kComparisonExcludedKeys.end(), key) !=
+           kComparisonExcludedKeys.end();
+}
+
+std::size_t countCompared(const Dictionary& message) {
+    return static_cast<std::size_t>(
+        std::count_if(message.begin(), message.end(),
+                      [](const auto& entry) { return !isExcluded(entry.key.text()); }));
+}
+
+} // namespace
+
+bool equalButForTimeStamps(const Dictionary& left, const Dictionary& right) {
+    std::size_t position = 0;
+    std::size_t compared = 0;
+    for (const auto& entry : left) {
+        const std::size_t here = position++;
+        if (isExcluded(entry.key.text())) {
+            continue;
+        }
+        ++compared;
+        // Messages of one kind carry their keys in one order: try that first.
+        const Value* counterpart = here < right.size() && (right.begin() + here)->key == entry.key
+                                       ? &(right.begin() + here)->value
+                                       : right.find(entry.key.text());
+        if (counterpart == nullptr || !(entry.value == *counterpart)) {
+            return false;
+        }
+    }
+    return compared == countCompared(right);
+}
+
+bool MessageBatch::addUnlessRedundant(AudioEventCategory category, AudioEventType type,
+                                      const Dictionary& message) {
+    std::string base;
+    base.reserve(48);
+    appendCategoryString(base, category);
+    base += '_';
+    base += HYReportingUtilityTypeString(type);
+
+    auto kind = kinds_.find(base);
+    if (kind == kinds_.end()) {
+        kind = kinds_.emplace(std::move(base), Kind{}).first;
+    } else {
+        const bool isError = category == kAudioEventCategoryError || type == kAudioEventTypeError;
+        if (!isError && equalButForTimeStamps(message, entries_[kind->second.last].message)) {
+            return true;
+        }
+    }
+    kind->second.count += 1;
+    kind->second.last = entries_.size();
+    entries_.push_back({&kind->first, kind->second.count, message});
+    return false;
+}
+
+std::uint32_t MessageBatch::countFor(std::string_view base) const {
+    const auto kind = kinds_.find(base);
+    return kind != kinds_.end() ? kind->second.count : 0;
+}
+
+} // namespace halyard
