@@ -27,7 +27,9 @@ inline constexpr std::uint32_t kMaxElements = 65536;
 // many pieces is scanned once.
 //
 // Depth: the frame's own array is 1. Elements: every object inside the frame,
-// containers, keys and values alike, the frame itself not counted.
+// containers, keys and values alike, the frame itself not counted. A limit is
+// reported as soon as a head announces more than it allows, so no memory has to
+// be held for bytes that will not be taken.
 class FrameScanner {
 public:
     enum class Outcome {
@@ -47,11 +49,15 @@ public:
     void reset();
 
 private:
+    // Complete: one more object has been passed.
+    Outcome step(std::string_view rest);
+    void take(bool opens, std::uint32_t children);
+
     std::size_t position_ = 0;
+    std::uint32_t pending_ = 1; // Objects announced but not yet passed.
     std::uint32_t elements_ = 0;
     int depth_ = 0;
-    bool begun_ = false;
-    std::uint32_t remaining_[kMaxDepth] = {};
+    std::uint32_t remaining_[kMaxDepth] = {}; // Objects missing in each open container.
 };
 
 // One frame as the server reads it.
@@ -59,7 +65,7 @@ struct Call {
     std::optional<std::uint32_t> messageID; // nullopt: a notification
     // What to run, or why it cannot be run (the answer, in the IPC domain).
     std::optional<Method> method;
-    Arguments arguments;
+    Arguments arguments; // Empty beside an error.
     MaybeError error;
 };
 
@@ -68,7 +74,7 @@ class CallDecoder {
 public:
     // Nullopt when the frame is no MessagePack-RPC request or notification: the
     // connection is not to be kept. Requires that FrameScanner found `frame`
-    // Complete.
+    // Complete; other bytes are memory-safe, but mean nothing.
     [[nodiscard]] std::optional<Call> decode(std::string_view frame);
 
 private:
@@ -82,7 +88,8 @@ void appendAnswer(std::string& out, std::uint32_t messageID, const MaybeError& e
 // The client's side.
 
 // Appends a request, or a notification when there is no message ID. Only the
-// arguments that the method's table names are written.
+// arguments that the method takes are written. The frame's limits are the
+// caller's to keep: the peer closes the connection on what exceeds them.
 void appendCall(std::string& out, std::optional<std::uint32_t> messageID, Method method,
                 const Arguments& arguments);
 
@@ -92,7 +99,7 @@ struct Answer {
     Value result;
 };
 
-// Nullopt when the frame is no answer.
+// Nullopt when the frame is no answer. Requires what CallDecoder::decode does.
 [[nodiscard]] std::optional<Answer> decodeAnswer(std::string_view frame);
 
 // Appends `value` as MessagePack; doubles always as float64, so that a real
