@@ -1,0 +1,77 @@
+// The structured log: native fields under journald, one line on standard error
+// otherwise.
+//
+// Lines are handed to a thread of the log's own, because whoever reads the log
+// (a pipe, a terminal, journald) may stop reading. What does not fit the bounded
+// queue meanwhile is dropped, counted, and told in one line once there is room.
+//
+// Any thread.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/LogSink.h"
+
+namespace halyard::linux_ {
+
+// A finished line on its way out.
+struct LogRecord {
+    LogLevel level;
+    std::string category;
+    std::string message; // prefix and text
+    std::string file;
+    int line;
+    std::string function;
+};
+
+// `%25s:%-5d `, then the text.
+std::string logMessage(const platform::LogLine& line);
+// The standard-error form, control characters and backslashes escaped, so that
+// no text can pass for a line of its own. Ends in a line break.
+std::string standardErrorLine(const LogRecord& record);
+// Whether `fd` leads to journald.
+bool leadsToJournal(int fd);
+
+class LogWriter final : public platform::LogSink {
+public:
+    static constexpr std::size_t kMaxQueuedBytes = 4 * 1024 * 1024;
+    static constexpr std::size_t kRecentLines = 256;
+
+    // Where records go; called on the log's own thread.
+    using Output = std::function<void(const LogRecord&)>;
+
+    explicit LogWriter(Output output);
+    // Writes what is queued, for a second at most.
+    ~LogWriter() override;
+
+    // Journald when standard error leads there, else standard error.
+    static Output defaultOutput();
+
+    bool isEnabled(LogLevel level) const override { return level >= level_.load(); }
+    void write(const platform::LogLine& line) override;
+
+    void setLevel(LogLevel level) { level_.store(level); }
+    // Waits until what is queued has been written, for a second at most.
+    void flush();
+    std::uint64_t droppedLines() const { return dropped_.load(); }
+    // The newest lines in their standard-error form, oldest first.
+    std::vector<std::string> recentLines() const;
+
+private:
+    struct State;
+    static void run(const std::shared_ptr<State>& state, const Output& output);
+
+    // Shared with the thread, which is left behind if its output hangs for good.
+    const std::shared_ptr<State> state_;
+    std::atomic<LogLevel> level_{LogLevel::Info};
+    std::atomic<std::uint64_t> dropped_{0};
+    std::thread thread_;
+};
+
+} // namespace halyard::linux_

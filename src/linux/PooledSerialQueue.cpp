@@ -1,0 +1,113 @@
+#include "linux/PooledSerialQueue.h"
+
+#include <cassert>
+#include <iterator>
+#include <utility>
+
+namespace halyard::linux_ {
+namespace {
+
+// Tasks' worth of room that an idle queue keeps for its next burst.
+constexpr std::size_t kKeptCapacity = 16;
+
+} // namespace
+
+ChargePtr& currentCharge() {
+    thread_local ChargePtr current;
+    return current;
+}
+
+void PooledSerialQueue::async(platform::Task task) {
+    const MutexLock lock(mutex_);
+    items_.push_back({std::move(task), currentCharge()});
+    scheduleLocked();
+}
+
+void PooledSerialQueue::asyncAfter(std::chrono::nanoseconds delay, platform::Task task) {
+    timer_(delay, [self = shared_from_this(), task = std::move(task)] { self->async(task); });
+}
+
+void PooledSerialQueue::scheduleLocked() {
+    if (!scheduled_ && !suspended_) {
+        scheduled_ = true;
+        worker_.post([self = shared_from_this()] { self->drain(); });
+    }
+}
+
+void PooledSerialQueue::suspend(std::chrono::nanoseconds limit, platform::Task onTimeout) {
+    std::uint64_t wait = 0;
+    {
+        const MutexLock lock(mutex_);
+        assert(!suspended_);
+        suspended_ = true;
+        suspendCalled_ = true;
+        wait = ++waits_;
+    }
+    timer_(limit, [self = shared_from_this(), wait, onTimeout = std::move(onTimeout)] {
+        (void)self->resumeWait(wait, onTimeout);
+    });
+}
+
+bool PooledSerialQueue::resume(platform::Task first) {
+    std::uint64_t wait = 0;
+    {
+        const MutexLock lock(mutex_);
+        wait = waits_;
+    }
+    return resumeWait(wait, std::move(first));
+}
+
+bool PooledSerialQueue::resumeWait(std::uint64_t wait, platform::Task first) {
+    const MutexLock lock(mutex_);
+    if (!suspended_ || waits_ != wait) {
+        return false;
+    }
+    suspended_ = false;
+    items_.insert(items_.begin(), Item{std::move(first), nullptr});
+    scheduleLocked();
+    return true;
+}
+
+bool PooledSerialQueue::isIdle() const {
+    const MutexLock lock(mutex_);
+    return items_.empty() && !scheduled_;
+}
+
+void PooledSerialQueue::drain() {
+    std::vector<Item> items;
+    {
+        const MutexLock lock(mutex_);
+        items.swap(items_);
+    }
+    const std::size_t ran = runUntilSuspended(items);
+    {
+        const MutexLock lock(mutex_);
+        if (ran < items.size()) {
+            // If it has been resumed meanwhile, what it resumed with goes first.
+            const auto at = items_.begin() + (suspended_ ? 0 : 1);
+            items_.insert(at, std::make_move_iterator(items.begin() + std::ptrdiff_t(ran)),
+                          std::make_move_iterator(items.end()));
+        }
+        scheduled_ = false;
+        if (!items_.empty()) {
+            scheduleLocked(); // Behind the worker's other queues: nobody starves.
+        } else if (items.capacity() <= kKeptCapacity) {
+            items.clear();
+            items_.swap(items);
+        }
+    }
+}
+
+std::size_t PooledSerialQueue::runUntilSuspended(std::vector<Item>& items) {
+    suspendCalled_ = false;
+    std::size_t ran = 0;
+    while (ran < items.size() && !suspendCalled_) {
+        Item& item = items[ran++];
+        const ChargeScope scope(std::move(item.charge));
+        item.task();
+        item.task = nullptr; // What it holds goes while its charge is current.
+    }
+    return ran;
+}
+
+} // namespace halyard::linux_

@@ -1,0 +1,60 @@
+// A serial queue that owns no thread: it borrows one of a worker's while it has
+// tasks to run and may run them.
+//
+// An idle or suspended queue is a few hundred bytes, so each session can have
+// its own.
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <vector>
+
+#include "common/Mutex.h"
+#include "linux/Charge.h"
+#include "linux/Worker.h"
+#include "platform/WorkQueue.h"
+
+namespace halyard::linux_ {
+
+class PooledSerialQueue final : public platform::SerialQueue,
+                                public std::enable_shared_from_this<PooledSerialQueue> {
+public:
+    // Runs a task once a time has passed; see Queues.
+    using Timer = std::function<void(std::chrono::nanoseconds, platform::Task)>;
+
+    // Borrows both, which must outlive every queue.
+    PooledSerialQueue(Worker& worker, const Timer& timer) : worker_(worker), timer_(timer) {}
+
+    void async(platform::Task task) override HY_EXCLUDES(mutex_);
+    void asyncAfter(std::chrono::nanoseconds delay, platform::Task task) override;
+    void suspend(std::chrono::nanoseconds limit, platform::Task onTimeout) override
+        HY_EXCLUDES(mutex_);
+    bool resume(platform::Task first) override HY_EXCLUDES(mutex_);
+
+    // Nothing runs and nothing waits.
+    bool isIdle() const HY_EXCLUDES(mutex_);
+
+private:
+    struct Item {
+        platform::Task task;
+        ChargePtr charge;
+    };
+
+    bool resumeWait(std::uint64_t wait, platform::Task first) HY_EXCLUDES(mutex_);
+    void scheduleLocked() HY_REQUIRES(mutex_);
+    void drain();
+    // How many ran: all, or as many as up to the one that suspended the queue.
+    std::size_t runUntilSuspended(std::vector<Item>& items) HY_EXCLUDES(mutex_);
+
+    Worker& worker_;
+    const Timer& timer_;
+    mutable Mutex mutex_;
+    std::vector<Item> items_ HY_GUARDED_BY(mutex_);
+    bool scheduled_ HY_GUARDED_BY(mutex_) = false;
+    bool suspended_ HY_GUARDED_BY(mutex_) = false;
+    std::uint64_t waits_ HY_GUARDED_BY(mutex_) = 0;
+    bool suspendCalled_ = false; // Touched only by whoever drains.
+};
+
+} // namespace halyard::linux_

@@ -1,0 +1,339 @@
+#include "linux/SocketConnection.h"
+
+#include <asio/post.hpp>
+#include <cerrno>
+#include <fmt/format.h>
+#include <sys/socket.h>
+#include <utility>
+
+#include "platform/Log.h"
+
+namespace halyard::linux_ {
+namespace {
+
+using protocol::FrameScanner;
+using protocol::Method;
+
+constexpr std::size_t kKeptCapacity = 4096;
+
+bool needsAdministrator(Method method) {
+    return method == Method::KillService || method == Method::AdminPostNotification ||
+           method == Method::AdminFlush || method == Method::AdminStatus;
+}
+
+std::string_view reason(FrameScanner::Outcome outcome) {
+    switch (outcome) {
+    case FrameScanner::Outcome::TooLarge:
+        return "a frame larger than 1 MiB";
+    case FrameScanner::Outcome::TooDeep:
+        return "a frame nested deeper than 32";
+    case FrameScanner::Outcome::TooManyElements:
+        return "a frame of more than 65536 elements";
+    default:
+        return "bytes that are no MessagePack";
+    }
+}
+
+void dropSpareCapacity(std::string& text) {
+    if (text.capacity() > kKeptCapacity) {
+        text = std::string();
+    }
+}
+
+} // namespace
+
+// Counts the requests of one read until all their work is done.
+class SocketConnection::ReadCharge final : public Charge {
+public:
+    explicit ReadCharge(std::shared_ptr<SocketConnection> connection)
+        : connection_(std::move(connection)) {}
+    ~ReadCharge() override { connection_->workDone(requests_, bytes_); }
+
+    void add(std::size_t bytes) {
+        ++requests_;
+        bytes_ += bytes;
+        connection_->unprocessedRequests_.fetch_add(1);
+        connection_->unprocessedBytes_.fetch_add(bytes);
+    }
+
+private:
+    const std::shared_ptr<SocketConnection> connection_;
+    std::size_t requests_ = 0;
+    std::size_t bytes_ = 0;
+};
+
+// Sends the answer to one request back, if its connection is still there.
+class SocketConnection::SocketResponder final : public protocol::Responder {
+public:
+    SocketResponder(std::weak_ptr<SocketConnection> connection, std::uint32_t messageID)
+        : connection_(std::move(connection)), messageID_(messageID) {}
+
+    void answer(const MaybeError& error, const Value& result) override {
+        if (const auto connection = connection_.lock()) {
+            std::string bytes;
+            protocol::appendAnswer(bytes, messageID_, error, result);
+            connection->send(bytes);
+        }
+    }
+
+private:
+    const std::weak_ptr<SocketConnection> connection_;
+    const std::uint32_t messageID_;
+};
+
+SocketConnection::SocketConnection(asio::local::stream_protocol::socket socket, Peer peer,
+                                   Access access, ListenerShared& shared)
+    : socket_(std::move(socket)), peer_(std::move(peer)), access_(access), shared_(shared) {}
+
+SocketConnection::~SocketConnection() = default;
+
+std::string SocketConnection::description() const {
+    return peer_.description();
+}
+
+void SocketConnection::setExportedObject(std::shared_ptr<platform::ExportedObject> object) {
+    exported_ = std::move(object);
+}
+
+void SocketConnection::setInterruptionHandler(std::function<void()> handler) {
+    interruptionHandler_ = std::move(handler);
+}
+
+void SocketConnection::setInvalidationHandler(std::function<void()> handler) {
+    invalidationHandler_ = std::move(handler);
+}
+
+void SocketConnection::resume() {
+    readIfAllowed();
+}
+
+bool SocketConnection::mayRead() const {
+    return unprocessedRequests_.load() < kMaxUnprocessedRequests &&
+           unprocessedBytes_.load() < kMaxUnprocessedBytes && unsentBytes_.load() <= kUnsentPause &&
+           !shared_.pressure.isOn();
+}
+
+void SocketConnection::readIfAllowed() {
+    if (ended_ || waiting_) {
+        return;
+    }
+    if (!mayRead()) {
+        paused_.store(true);
+        if (!mayRead()) {
+            return; // workDone(), writeSome() or the pressure's end calls again.
+        }
+        paused_.store(false);
+    }
+    if (!pending_.empty()) {
+        const std::size_t taken = takeFrames(pending_);
+        if (ended_) {
+            return;
+        }
+        pending_.erase(0, taken);
+        if (!mayRead()) {
+            readIfAllowed();
+            return;
+        }
+    }
+    if (peerFinished_) {
+        end(Ending::Closed);
+        return;
+    }
+    waitReadable();
+}
+
+void SocketConnection::waitReadable() {
+    waiting_ = true;
+    socket_.async_wait(asio::socket_base::wait_read,
+                       [self = shared_from_this()](const asio::error_code& error) {
+                           self->waiting_ = false;
+                           if (!error && !self->ended_) {
+                               self->readAvailable();
+                           }
+                       });
+}
+
+void SocketConnection::readAvailable() {
+    if (!mayRead()) {
+        readIfAllowed();
+        return;
+    }
+    const ssize_t got =
+        ::recv(socket_.native_handle(), shared_.buffer.data(), shared_.buffer.size(), MSG_DONTWAIT);
+    if (got < 0 && errno != EAGAIN && errno != EINTR) {
+        end(Ending::Broken);
+        return;
+    }
+    peerFinished_ = got == 0;
+    if (got > 0) {
+        const std::string_view chunk(shared_.buffer.data(), static_cast<std::size_t>(got));
+        shared_.counters.bytesRead += chunk.size();
+        if (pending_.empty()) {
+            const std::size_t taken = takeFrames(chunk);
+            pending_.assign(chunk.substr(taken));
+        } else {
+            pending_ += chunk;
+            pending_.erase(0, takeFrames(pending_));
+        }
+        if (pending_.empty()) {
+            dropSpareCapacity(pending_);
+        }
+    }
+    readIfAllowed();
+}
+
+std::size_t SocketConnection::takeFrames(std::string_view stream) {
+    const auto charge = std::make_shared<ReadCharge>(shared_from_this());
+    const ChargeScope scope(charge);
+    std::size_t taken = 0;
+    while (taken < stream.size() && !ended_ && mayRead()) {
+        const std::string_view rest = stream.substr(taken);
+        const auto outcome = scanner_.scan(rest);
+        if (outcome == FrameScanner::Outcome::Incomplete) {
+            break;
+        }
+        if (outcome != FrameScanner::Outcome::Complete) {
+            breakOff(reason(outcome));
+            break;
+        }
+        const std::size_t length = scanner_.frameLength();
+        scanner_.reset();
+        taken += length;
+        if (!takeFrame(rest.substr(0, length), charge)) {
+            breakOff("a frame that is no MessagePack-RPC request");
+            break;
+        }
+    }
+    return taken;
+}
+
+bool SocketConnection::takeFrame(std::string_view frame,
+                                 const std::shared_ptr<ReadCharge>& charge) {
+    auto call = shared_.decoder.decode(frame);
+    if (!call) {
+        return false;
+    }
+    ++shared_.counters.requests;
+    if (call->error || !call->method) {
+        refuseCall(*call, std::move(call->error));
+        return true;
+    }
+    if (needsAdministrator(*call->method) && access_ != Access::Administrator) {
+        refuseCall(*call, Error{std::string(kIpcErrorDomain),
+                                static_cast<std::int64_t>(IpcErrorCode::NotAllowed),
+                                fmt::format("{} is not allowed for uid {}",
+                                            protocol::methodName(*call->method), peer_.uid)});
+        return true;
+    }
+    charge->add(frame.size());
+    protocol::Reply reply;
+    if (call->messageID) {
+        reply =
+            protocol::Reply(std::make_unique<SocketResponder>(weak_from_this(), *call->messageID));
+    }
+    exported_->handle({*call->method, std::move(call->arguments), std::move(reply)});
+    return true;
+}
+
+void SocketConnection::refuseCall(const protocol::Call& call, MaybeError error) {
+    ++shared_.counters.badRequests;
+    if (call.messageID) {
+        std::string bytes;
+        protocol::appendAnswer(bytes, *call.messageID, error, Value());
+        send(bytes);
+    }
+}
+
+void SocketConnection::send(std::string_view bytes) {
+    const MutexLock lock(outMutex_);
+    if (out_.size() > kMaxUnsentBytes) {
+        return; // On its way to being closed.
+    }
+    out_ += bytes;
+    unsentBytes_.store(out_.size());
+    if (!writeScheduled_) {
+        writeScheduled_ = true;
+        asio::post(socket_.get_executor(), [self = shared_from_this()] { self->writeSome(); });
+    }
+}
+
+void SocketConnection::writeSome() {
+    if (ended_) {
+        return;
+    }
+    bool blocked = false;
+    bool failed = false;
+    {
+        const MutexLock lock(outMutex_);
+        if (out_.size() > kMaxUnsentBytes) {
+            failed = true;
+        } else {
+            const ssize_t sent = ::send(socket_.native_handle(), out_.data(), out_.size(),
+                                        MSG_DONTWAIT | MSG_NOSIGNAL);
+            if (sent > 0) {
+                out_.erase(0, static_cast<std::size_t>(sent));
+            }
+            failed = sent < 0 && errno != EAGAIN && errno != EINTR;
+        }
+        blocked = !out_.empty();
+        writeScheduled_ = blocked;
+        unsentBytes_.store(out_.size());
+        if (!blocked) {
+            dropSpareCapacity(out_);
+        }
+    }
+    if (failed) {
+        breakOff("answers left lying");
+        return;
+    }
+    if (blocked) {
+        socket_.async_wait(asio::socket_base::wait_write,
+                           [self = shared_from_this()](const asio::error_code& error) {
+                               if (!error) {
+                                   self->writeSome();
+                               }
+                           });
+    }
+    if (paused_.load()) {
+        readIfAllowed();
+    }
+}
+
+void SocketConnection::workDone(std::size_t requests, std::size_t bytes) {
+    unprocessedRequests_.fetch_sub(requests);
+    unprocessedBytes_.fetch_sub(bytes);
+    if (paused_.exchange(false)) {
+        asio::post(socket_.get_executor(), [self = shared_from_this()] { self->readIfAllowed(); });
+    }
+}
+
+void SocketConnection::breakOff(std::string_view why) {
+    HY_LOG_ERROR(HYReportingPlatformCategory, "closing connection {}: {}", description(), why);
+    ++shared_.counters.broken;
+    end(Ending::Broken);
+}
+
+void SocketConnection::close() {
+    end(Ending::Closed);
+}
+
+void SocketConnection::end(Ending ending) {
+    if (std::exchange(ended_, true)) {
+        return;
+    }
+    const auto self = shared_from_this();
+    asio::error_code ignored;
+    socket_.close(ignored);
+    shared_.connections.erase(self);
+    if (ending == Ending::Broken && interruptionHandler_) {
+        interruptionHandler_();
+    }
+    if (invalidationHandler_) {
+        invalidationHandler_();
+    }
+    interruptionHandler_ = nullptr;
+    invalidationHandler_ = nullptr;
+    exported_ = nullptr;
+}
+
+} // namespace halyard::linux_

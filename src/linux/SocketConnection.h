@@ -1,0 +1,126 @@
+// One client's connection.
+//
+// Reads many frames at once into a buffer that all connections share, hands the
+// requests over, and keeps a buffer of its own only for a frame that has not
+// come in whole, so an idle connection is small. It stops reading
+//  - while its requests that are not processed number more than 1,024 or measure
+//    more than 4 MiB,
+//  - while the peer leaves answers lying, and closes when they pass 4 MiB,
+//  - while the whole daemon is under pressure.
+//
+// A peer that breaks the protocol loses this connection and nothing else.
+#pragma once
+
+#include <asio/io_context.hpp>
+#include <asio/local/stream_protocol.hpp>
+#include <atomic>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <string>
+#include <string_view>
+#include <unordered_set>
+
+#include "common/Mutex.h"
+#include "linux/Charge.h"
+#include "linux/Peer.h"
+#include "linux/Pressure.h"
+#include "platform/Listener.h"
+#include "protocol/Wire.h"
+
+namespace halyard::linux_ {
+
+struct ListenerCounters {
+    std::uint64_t accepted = 0;
+    std::uint64_t refused = 0;
+    std::uint64_t broken = 0; // closed for what the peer sent or left lying
+    std::uint64_t requests = 0;
+    std::uint64_t badRequests = 0; // answered with an IPC error
+    std::uint64_t bytesRead = 0;
+};
+
+class SocketConnection;
+
+// What the connections of one listener share; on the io_context's thread.
+struct ListenerShared {
+    explicit ListenerShared(Pressure& p) : pressure(p), buffer(kReadSize, '\0') {}
+
+    static constexpr std::size_t kReadSize = 64 * 1024;
+
+    Pressure& pressure;
+    std::string buffer;
+    protocol::CallDecoder decoder;
+    std::unordered_set<std::shared_ptr<SocketConnection>> connections;
+    ListenerCounters counters;
+};
+
+class SocketConnection final : public platform::Connection,
+                               public std::enable_shared_from_this<SocketConnection> {
+public:
+    static constexpr std::size_t kMaxUnprocessedRequests = 1024;
+    static constexpr std::size_t kMaxUnprocessedBytes = 4 * 1024 * 1024;
+    static constexpr std::size_t kMaxUnsentBytes = 4 * 1024 * 1024;
+    // More unsent bytes than this, and the peer is not read from.
+    static constexpr std::size_t kUnsentPause = 64 * 1024;
+
+    SocketConnection(asio::local::stream_protocol::socket socket, Peer peer, Access access,
+                     ListenerShared& shared);
+    ~SocketConnection() override;
+
+    std::int32_t processIdentifier() const override { return peer_.pid; }
+    std::string description() const override;
+    void setExportedObject(std::shared_ptr<platform::ExportedObject> object) override;
+    void setInterruptionHandler(std::function<void()> handler) override;
+    void setInvalidationHandler(std::function<void()> handler) override;
+    void resume() override;
+
+    // On the io_context's thread.
+    void close();
+    void readIfAllowed();
+
+    // Any thread.
+    void send(std::string_view bytes) HY_EXCLUDES(outMutex_);
+    void workDone(std::size_t requests, std::size_t bytes);
+
+private:
+    class ReadCharge;
+    class SocketResponder;
+    enum class Ending { Closed, Broken };
+
+    bool mayRead() const;
+    void waitReadable();
+    void readAvailable();
+    // Takes the frames at the front of `stream`; returns how many bytes they had.
+    std::size_t takeFrames(std::string_view stream);
+    bool takeFrame(std::string_view frame, const std::shared_ptr<ReadCharge>& charge);
+    void refuseCall(const protocol::Call& call, MaybeError error);
+    void writeSome() HY_EXCLUDES(outMutex_);
+    void breakOff(std::string_view why);
+    void end(Ending ending);
+
+    asio::local::stream_protocol::socket socket_;
+    const Peer peer_;
+    const Access access_;
+    ListenerShared& shared_;
+
+    std::shared_ptr<platform::ExportedObject> exported_;
+    std::function<void()> interruptionHandler_;
+    std::function<void()> invalidationHandler_;
+
+    protocol::FrameScanner scanner_;
+    std::string pending_; // The bytes of frames that wait to be taken.
+    bool waiting_ = false;
+    bool ended_ = false;
+    bool peerFinished_ = false;
+
+    std::atomic<std::size_t> unprocessedRequests_{0};
+    std::atomic<std::size_t> unprocessedBytes_{0};
+    std::atomic<bool> paused_{false};
+
+    Mutex outMutex_;
+    std::string out_ HY_GUARDED_BY(outMutex_);
+    bool writeScheduled_ HY_GUARDED_BY(outMutex_) = false;
+    std::atomic<std::size_t> unsentBytes_{0};
+};
+
+} // namespace halyard::linux_

@@ -1,0 +1,183 @@
+#include "linux/SocketListener.h"
+
+#include <cerrno>
+#include <cstring>
+#include <fmt/format.h>
+#include <sys/resource.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <systemd/sd-daemon.h>
+#include <unistd.h>
+
+#include "platform/Log.h"
+
+namespace halyard::linux_ {
+namespace {
+
+constexpr std::chrono::milliseconds kAcceptRetry{100};
+constexpr int kBacklog = 4096;
+constexpr mode_t kSocketMode = 0666; // Who may connect is decided by the peer.
+
+// One descriptor a connection: take all that the administrator allows.
+void raiseDescriptorLimit() {
+    rlimit limit{};
+    if (::getrlimit(RLIMIT_NOFILE, &limit) == 0) {
+        limit.rlim_cur = limit.rlim_max;
+        (void)::setrlimit(RLIMIT_NOFILE, &limit);
+    }
+}
+
+bool makeAddress(const std::string& path, sockaddr_un& address) {
+    address.sun_family = AF_UNIX;
+    if (path.size() >= sizeof address.sun_path) {
+        return false;
+    }
+    std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
+    return true;
+}
+
+bool somebodyListens(const sockaddr_un& address) {
+    const int probe = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+    const bool connected =
+        ::connect(probe, reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0 ||
+        errno == EAGAIN;
+    ::close(probe);
+    return connected;
+}
+
+} // namespace
+
+ListeningSocket listenAt(const std::string& path) {
+    sockaddr_un address{};
+    if (!makeAddress(path, address)) {
+        return {-1, fmt::format("the path of the socket is too long: {}", path)};
+    }
+    struct stat facts {};
+    if (::lstat(path.c_str(), &facts) == 0) {
+        if (!S_ISSOCK(facts.st_mode)) {
+            return {-1, fmt::format("{} is in the way: it is no socket", path)};
+        }
+        if (somebodyListens(address)) {
+            return {-1, fmt::format("another daemon listens at {}", path)};
+        }
+        (void)::unlink(path.c_str());
+    }
+    const int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+    if (fd < 0 || ::bind(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 ||
+        ::chmod(path.c_str(), kSocketMode) != 0 || ::listen(fd, kBacklog) != 0) {
+        const std::string error = std::strerror(errno);
+        ::close(fd);
+        return {-1, fmt::format("cannot listen at {}: {}", path, error)};
+    }
+    return {fd, {}};
+}
+
+int inheritedSocket(std::string_view name) {
+    char** names = nullptr;
+    const int count = ::sd_listen_fds_with_names(0, &names);
+    int found = -1;
+    for (int i = 0; i < count; ++i) {
+        const int fd = SD_LISTEN_FDS_START + i;
+        const bool fits = ::sd_is_socket_unix(fd, SOCK_STREAM, 1, nullptr, 0) > 0;
+        if (found < 0 && fits && (count == 1 || name == names[i])) {
+            found = fd;
+        }
+    }
+    for (int i = 0; i < count; ++i) {
+        std::free(names[i]);
+    }
+    std::free(names);
+    return found;
+}
+
+SocketListener::SocketListener(asio::io_context& context, Pressure& pressure, int listeningSocket,
+                               Authorizer authorizer)
+    : context_(context), acceptor_(context, asio::local::stream_protocol(), listeningSocket),
+      retry_(context), authorizer_(std::move(authorizer)), shared_(pressure) {
+    raiseDescriptorLimit();
+    pressure.setReliefHandler([this] { asio::post(context_, [this] { resumeReading(); }); });
+}
+
+SocketListener::~SocketListener() = default;
+
+void SocketListener::resume() {
+    accept();
+    context_.run();
+}
+
+void SocketListener::accept() {
+    acceptor_.async_accept(
+        [this](const asio::error_code& error, asio::local::stream_protocol::socket socket) {
+            if (error == asio::error::operation_aborted || !acceptor_.is_open()) {
+                return;
+            }
+            if (error) {
+                acceptFailed(error);
+                return;
+            }
+            acceptFailureLogged_ = false;
+            accepted(std::move(socket));
+            accept();
+        });
+}
+
+// Out of descriptors or memory: the others go on, new ones wait.
+void SocketListener::acceptFailed(const asio::error_code& error) {
+    if (!std::exchange(acceptFailureLogged_, true)) {
+        HY_LOG_ERROR(HYReportingPlatformCategory, "cannot accept a connection: {}",
+                     error.message());
+    }
+    retry_.expires_after(kAcceptRetry);
+    retry_.async_wait([this](const asio::error_code& aborted) {
+        if (!aborted) {
+            accept();
+        }
+    });
+}
+
+void SocketListener::accepted(asio::local::stream_protocol::socket socket) {
+    const Peer peer = peerOfSocket(socket.native_handle());
+    const Access access = authorizer_(peer);
+    if (access == Access::Refused) {
+        refuse(peer);
+        return;
+    }
+    refusedUid_.reset();
+    ++shared_.counters.accepted;
+    auto connection = std::make_shared<SocketConnection>(std::move(socket), peer, access, shared_);
+    shared_.connections.insert(connection);
+    if (delegate_ == nullptr || !delegate_->shouldAcceptNewConnection(connection)) {
+        connection->close();
+    }
+}
+
+void SocketListener::refuse(const Peer& peer) {
+    ++shared_.counters.refused;
+    if (refusedUid_ != peer.uid) {
+        refusedUid_ = peer.uid;
+        HY_LOG_ERROR(HYReportingPlatformCategory, "refusing connections of {}", peer.description());
+    }
+}
+
+void SocketListener::resumeReading() {
+    const auto connections = shared_.connections; // Reading may end some.
+    for (const auto& connection : connections) {
+        connection->readIfAllowed();
+    }
+}
+
+void SocketListener::stopAccepting() {
+    asio::error_code ignored;
+    acceptor_.close(ignored);
+    retry_.cancel();
+}
+
+void SocketListener::closeAllConnections() {
+    const auto connections = shared_.connections;
+    for (const auto& connection : connections) {
+        connection->close();
+    }
+}
+
+} // namespace halyard::linux_

@@ -1,0 +1,72 @@
+// The named service: an AF_UNIX stream socket that speaks MessagePack-RPC.
+//
+// Everything here runs on the one thread that runs the io_context, but for the
+// answers and the charges, which come back from the queues' threads.
+#pragma once
+
+#include <asio/io_context.hpp>
+#include <asio/local/stream_protocol.hpp>
+#include <asio/steady_timer.hpp>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <unordered_set>
+#include <vector>
+
+#include "linux/Peer.h"
+#include "linux/Pressure.h"
+#include "linux/SocketConnection.h"
+#include "platform/Listener.h"
+
+namespace halyard::linux_ {
+
+class SocketListener final : public platform::Listener {
+public:
+    using Authorizer = std::function<Access(const Peer&)>;
+
+    // Takes over a listening socket. Borrows `context` and `pressure`.
+    SocketListener(asio::io_context& context, Pressure& pressure, int listeningSocket,
+                   Authorizer authorizer);
+    ~SocketListener() override;
+
+    void setDelegate(platform::ListenerDelegate* delegate) override { delegate_ = delegate; }
+    // Runs the io_context: returns when that is stopped.
+    void resume() override;
+
+    // On the io_context's thread.
+    void stopAccepting();
+    void closeAllConnections();
+
+    ListenerCounters counters() const { return shared_.counters; }
+
+private:
+    void accept();
+    void accepted(asio::local::stream_protocol::socket socket);
+    void acceptFailed(const asio::error_code& error);
+    void refuse(const Peer& peer);
+    void resumeReading();
+
+    asio::io_context& context_;
+    asio::local::stream_protocol::acceptor acceptor_;
+    asio::steady_timer retry_;
+    const Authorizer authorizer_;
+    platform::ListenerDelegate* delegate_ = nullptr;
+    ListenerShared shared_;
+    std::optional<std::uint32_t> refusedUid_; // The episode that has been logged.
+    bool acceptFailureLogged_ = false;
+};
+
+// A listening socket at `path` (mode 0666), replacing the leftover of a daemon
+// that is gone. The error says what is in the way.
+struct ListeningSocket {
+    int fd = -1;
+    std::string error;
+};
+ListeningSocket listenAt(const std::string& path);
+
+// The socket that a service manager passed under `name`; -1 when there is none.
+int inheritedSocket(std::string_view name);
+
+} // namespace halyard::linux_
