@@ -90,8 +90,6 @@ void appendNested(std::string& out, const Value& value, int depth) {
     out.append(outer, ' ').append("}");
 }
 
-// fmt's own shortest form, but with the exponent spelled as a reader of any
-// language takes it, and without a trailing ".0".
 template <class Real> std::string shortest(Real value) {
     return fmt::format("{}", value);
 }
@@ -107,9 +105,10 @@ struct CivilTime {
 
 CivilTime civilTime(std::int64_t seconds) {
     constexpr std::int64_t kDay = 86400;
-    // Keeps the calendar below inside the range of std::chrono::year.
-    constexpr std::int64_t kLimit = 1'000'000'000'000;
-    seconds = std::clamp(seconds, -kLimit, kLimit);
+    // Years 0000 to 9999, the range of a four-digit year.
+    constexpr std::int64_t kFirst = -62'167'219'200;
+    constexpr std::int64_t kLast = 253'402'300'799;
+    seconds = std::clamp(seconds, kFirst, kLast);
     std::int64_t days = seconds / kDay;
     std::int64_t rest = seconds % kDay;
     if (rest < 0) {

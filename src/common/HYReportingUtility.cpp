@@ -88,8 +88,7 @@ bool hasBlank(std::string_view key) noexcept {
 }
 
 std::string formatNumber(double value, std::uint32_t maximumFractionDigits) {
-    // Beyond this a double has no digits left.
-    constexpr std::uint32_t kMostDigits = 1074;
+    constexpr std::uint32_t kMostDigits = 300; // no bucket needs more
     const std::uint32_t digits = std::min(maximumFractionDigits, kMostDigits);
     std::string text = fmt::format("{:.{}f}", value, digits);
     if (digits > 0) {

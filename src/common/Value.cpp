@@ -153,8 +153,11 @@ template <class Number> Number leadingNumber(std::string_view text) noexcept {
         return 0;
     }
     text.remove_prefix(start);
-    if (text.front() == '+') {
+    if (text.starts_with('+')) {
         text.remove_prefix(1);
+        if (text.starts_with('-')) {
+            return 0;
+        }
     }
     const std::size_t digit = text.find_first_not_of("-.");
     if (digit == std::string_view::npos || text[digit] < '0' || text[digit] > '9') {
@@ -163,6 +166,12 @@ template <class Number> Number leadingNumber(std::string_view text) noexcept {
     Number number = 0;
     const auto result = std::from_chars(text.data(), text.data() + text.size(), number);
     if (result.ec == std::errc::result_out_of_range) {
+        const std::string_view taken =
+            text.substr(0, static_cast<std::size_t>(result.ptr - text.data()));
+        if (taken.find("e-") != std::string_view::npos ||
+            taken.find("E-") != std::string_view::npos) {
+            return 0; // Too small rather than too large.
+        }
         return text.front() == '-' ? std::numeric_limits<Number>::lowest()
                                    : std::numeric_limits<Number>::max();
     }
@@ -475,7 +484,7 @@ const Value& Dictionary::operator[](std::string_view key) const noexcept {
     return found != nullptr ? *found : none;
 }
 
-void Dictionary::set(const Value& key, Value value) {
+void Dictionary::set(Value key, Value value) {
     assert(key.isString());
     if (value.isNone()) {
         erase(key.text());
@@ -490,21 +499,23 @@ void Dictionary::set(const Value& key, Value value) {
     if (!own.order.empty()) {
         const auto at = own.order.begin() + static_cast<std::ptrdiff_t>(own.lowerBound(key.text()));
         own.order.insert(at, static_cast<std::uint32_t>(own.entries.size()));
-        own.entries.push_back({key, std::move(value)});
+        own.entries.push_back({std::move(key), std::move(value)});
         return;
     }
-    own.entries.push_back({key, std::move(value)});
+    own.entries.push_back({std::move(key), std::move(value)});
     if (own.entries.size() > kIndexedAbove) {
         own.rebuildOrder();
     }
 }
 
 void Dictionary::erase(std::string_view key) {
-    if (!contains(key)) {
+    const Entry* present = block() != nullptr ? block()->find(key) : nullptr;
+    if (present == nullptr) {
         return;
     }
+    // `key` may lie in the entries, which do not outlive the next line.
+    const std::ptrdiff_t index = present - begin();
     DictionaryBlock& own = ownBlock();
-    const auto index = static_cast<std::ptrdiff_t>(own.find(key) - own.entries.data());
     own.entries.erase(own.entries.begin() + index);
     own.rebuildOrder();
 }

@@ -240,7 +240,7 @@ public:
 
     // Replaces in place or appends; a value of none erases. Requires that `key`
     // is a string.
-    void set(const Value& key, Value value);
+    void set(Value key, Value value);
     void erase(std::string_view key);
     // Sets every entry of `other` here, in its order.
     void merge(const Dictionary& other);

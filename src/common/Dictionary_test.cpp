@@ -1,0 +1,158 @@
+#include <gtest/gtest.h>
+
+#include "common/Value.h"
+
+namespace halyard {
+namespace {
+
+// Keys that sort differently from their order of insertion.
+std::string keyAt(int index) {
+    return "key number " + std::to_string((index * 37) % 101);
+}
+
+// On the linear and the indexed side of the threshold.
+class DictionarySizeTest : public ::testing::TestWithParam<int> {
+protected:
+    DictionarySizeTest() {
+        for (int i = 0; i < GetParam(); ++i) {
+            dictionary_.set(keyAt(i), i);
+        }
+    }
+
+    Dictionary dictionary_;
+};
+
+constexpr int kThreshold = static_cast<int>(Dictionary::kIndexedAbove);
+
+INSTANTIATE_TEST_SUITE_P(AroundTheIndex, DictionarySizeTest,
+                         ::testing::Values(1, kThreshold - 1, kThreshold, kThreshold + 1, 100));
+
+TEST_P(DictionarySizeTest, FindsEveryKeyAndNoOther) {
+    for (int i = 0; i < GetParam(); ++i) {
+        EXPECT_EQ(dictionary_[keyAt(i)], Value(i));
+    }
+    EXPECT_FALSE(dictionary_.contains("key number"));
+    EXPECT_FALSE(dictionary_.contains("z"));
+    EXPECT_TRUE(dictionary_[""].isNone());
+}
+
+TEST_P(DictionarySizeTest, IteratesInTheOrderOfInsertion) {
+    int index = 0;
+    for (const auto& entry : dictionary_) {
+        EXPECT_EQ(entry.key.text(), keyAt(index));
+        ++index;
+    }
+    EXPECT_EQ(index, GetParam());
+}
+
+TEST_P(DictionarySizeTest, ReplacingKeepsThePlace) {
+    dictionary_.set(keyAt(0), "new");
+    EXPECT_EQ(dictionary_.size(), static_cast<std::size_t>(GetParam()));
+    EXPECT_EQ(dictionary_.begin()->value, Value("new"));
+}
+
+TEST_P(DictionarySizeTest, ErasesOneKeyOnly) {
+    dictionary_.erase(keyAt(0));
+    dictionary_.erase("absent");
+    EXPECT_FALSE(dictionary_.contains(keyAt(0)));
+    EXPECT_EQ(dictionary_.size(), static_cast<std::size_t>(GetParam() - 1));
+    for (int i = 1; i < GetParam(); ++i) {
+        EXPECT_EQ(dictionary_[keyAt(i)], Value(i));
+    }
+}
+
+TEST_P(DictionarySizeTest, EqualsTheSameEntriesInAnotherOrder) {
+    std::vector<Dictionary::Entry> reversed(dictionary_.begin(), dictionary_.end());
+    std::reverse(reversed.begin(), reversed.end());
+    Dictionary other(reversed);
+    EXPECT_EQ(dictionary_, other);
+    other.set(keyAt(0), "different");
+    EXPECT_FALSE(dictionary_ == other);
+    other.erase(keyAt(0));
+    EXPECT_FALSE(dictionary_ == other);
+}
+
+TEST_P(DictionarySizeTest, AnAbsentKeyIsNotEqualToAnother) {
+    Dictionary other = dictionary_;
+    other.erase(keyAt(0));
+    other.set("another", 0);
+    EXPECT_FALSE(dictionary_ == other);
+}
+
+TEST_P(DictionarySizeTest, ChangingACopyLeavesTheOriginalAlone) {
+    Dictionary copy = dictionary_;
+    copy.set("added", true);
+    copy.set(keyAt(0), "changed");
+    EXPECT_FALSE(dictionary_.contains("added"));
+    EXPECT_EQ(dictionary_[keyAt(0)], Value(0));
+    EXPECT_EQ(copy.size(), dictionary_.size() + 1);
+}
+
+TEST_P(DictionarySizeTest, TheLastOfEqualKeysWins) {
+    std::vector<Dictionary::Entry> twice(dictionary_.begin(), dictionary_.end());
+    for (const auto& entry : dictionary_) {
+        twice.push_back({entry.key, "second"});
+    }
+    const Dictionary merged(twice);
+    EXPECT_EQ(merged.size(), dictionary_.size());
+    for (const auto& entry : merged) {
+        EXPECT_EQ(entry.value, Value("second"));
+    }
+}
+
+TEST_P(DictionarySizeTest, MergingReplacesAndAppends) {
+    Dictionary target{{keyAt(0), "old"}, {"own", 1}};
+    target.merge(dictionary_);
+    EXPECT_EQ(target[keyAt(0)], Value(0));
+    EXPECT_EQ(target["own"], Value(1));
+    EXPECT_EQ(target.size(), dictionary_.size() + 1);
+    EXPECT_EQ(target.begin()->key.text(), keyAt(0));
+}
+
+TEST_P(DictionarySizeTest, MergingIntoItselfChangesNothing) {
+    const Dictionary before = dictionary_;
+    dictionary_.merge(dictionary_);
+    EXPECT_EQ(dictionary_, before);
+}
+
+TEST(DictionaryTest, SettingNoneErases) {
+    Dictionary dictionary{{"a", 1}};
+    dictionary.set("a", Value());
+    EXPECT_TRUE(dictionary.empty());
+    EXPECT_EQ(dictionary, Dictionary());
+    dictionary.set("a", Value());
+    EXPECT_TRUE(dictionary.empty());
+}
+
+TEST(DictionaryTest, EntriesOfNoneAreLeftOut) {
+    const Dictionary dictionary{{"a", 1}, {"b", Value()}, {"a", Value()}};
+    EXPECT_TRUE(dictionary.empty());
+}
+
+TEST(DictionaryTest, AKeyOfTheDictionaryItselfMayBeErased) {
+    Dictionary dictionary{{"a key beyond the inline length", 1}, {"b", 2}};
+    dictionary.erase(dictionary.begin()->key.text());
+    EXPECT_EQ(dictionary, (Dictionary{{"b", 2}}));
+}
+
+TEST(DictionaryTest, CopiesShareTheirContents) {
+    const Dictionary inner{{"text", "a text that does not fit inside the value"}};
+    Dictionary outer{{"inner", inner}};
+    Dictionary copy = outer;
+    EXPECT_EQ(copy.begin(), outer.begin());
+    copy.set("more", 1);
+    // The entries were copied, what they refer to was not.
+    EXPECT_EQ(copy["inner"].dictionary().begin(), inner.begin());
+}
+
+TEST(DictionaryTest, SortedEntriesFollowTheBytesOfTheKeys) {
+    const Dictionary dictionary{{"b", 1}, {"a", 2}, {"B", 3}, {"\xC3\xA4", 4}};
+    std::string keys;
+    for (const auto* entry : sortedEntries(dictionary)) {
+        keys += entry->key.text();
+    }
+    EXPECT_EQ(keys, "Bab\xC3\xA4");
+}
+
+} // namespace
+} // namespace halyard

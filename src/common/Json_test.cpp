@@ -1,0 +1,61 @@
+#include "common/Json.h"
+
+#include <gtest/gtest.h>
+#include <limits>
+
+namespace halyard {
+namespace {
+
+TEST(JsonTest, ScalarsTakeTheirJsonForm) {
+    EXPECT_EQ(toJson(Value()), "null");
+    EXPECT_EQ(toJson(true), "true");
+    EXPECT_EQ(toJson(false), "false");
+    EXPECT_EQ(toJson(-1), "-1");
+    EXPECT_EQ(toJson("text"), "\"text\"");
+}
+
+TEST(JsonTest, IntegersStayExact) {
+    EXPECT_EQ(toJson(std::numeric_limits<std::int64_t>::min()), "-9223372036854775808");
+    EXPECT_EQ(toJson(std::numeric_limits<std::uint64_t>::max()), "18446744073709551615");
+}
+
+TEST(JsonTest, RealsTakeTheShortestFormThatReadsBack) {
+    EXPECT_EQ(toJson(0.1), "0.1");
+    EXPECT_EQ(toJson(0.1f), "0.1");
+    EXPECT_EQ(toJson(1e300), "1e+300");
+    EXPECT_EQ(toJson(5e-324), "5e-324");
+    EXPECT_EQ(toJson(2.0), "2");
+}
+
+TEST(JsonTest, WhatJsonCannotWriteBecomesText) {
+    EXPECT_EQ(toJson(std::numeric_limits<double>::quiet_NaN()), "\"NaN\"");
+    EXPECT_EQ(toJson(std::numeric_limits<double>::infinity()), "\"Infinity\"");
+    EXPECT_EQ(toJson(-std::numeric_limits<float>::infinity()), "\"-Infinity\"");
+    EXPECT_EQ(toJson(Date{0, 500'000'000}), "\"1970-01-01T00:00:00.5Z\"");
+}
+
+TEST(JsonTest, TextIsEscapedAndRepaired) {
+    EXPECT_EQ(toJson("\"\\\n\x01"), "\"\\\"\\\\\\n\\u0001\"");
+    EXPECT_EQ(toJson(std::string_view("\0", 1)), "\"\\u0000\"");
+    EXPECT_EQ(toJson("\xC3\xA4\xFF"), "\"\xC3\xA4\xEF\xBF\xBD\"");
+    EXPECT_EQ(toJson(Dictionary{{"\xFF", 1}}), "{\"\xEF\xBF\xBD\":1}");
+}
+
+TEST(JsonTest, ContainersKeepTheirOrder) {
+    const Dictionary dictionary{{"b", List{Value(1), Value(), Value("x")}}, {"a", Dictionary()}};
+    EXPECT_EQ(toJson(dictionary), "{\"b\":[1,null,\"x\"],\"a\":{}}");
+    EXPECT_EQ(toJson(List()), "[]");
+}
+
+TEST(JsonTest, PrettyFormIndentsByTwo) {
+    EXPECT_EQ(toPrettyJson(Dictionary{{"a", List{Value(1)}}}), "{\n  \"a\": [\n    1\n  ]\n}");
+}
+
+TEST(JsonTest, OneWriterWritesManyValues) {
+    JsonWriter writer;
+    EXPECT_EQ(writer.write(Dictionary{{"a", 1}}), "{\"a\":1}");
+    EXPECT_EQ(writer.write(List{Value(2)}), "[2]");
+}
+
+} // namespace
+} // namespace halyard
