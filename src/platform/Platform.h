@@ -15,6 +15,7 @@ class ConditionFactory;
 class DeviceProperties;
 class EnergyLedger;
 class FeatureFlags;
+class IncidentReporter;
 class LogSink;
 class MetricService;
 class Notifications;
@@ -44,6 +45,7 @@ struct Platform {
     AnalyticsService* analytics = nullptr;
     EnergyLedger* energyLedger = nullptr;
     MetricService* metrics = nullptr;
+    IncidentReporter* incidentReporter = nullptr;
     Operations* operations = nullptr;
 };
 
