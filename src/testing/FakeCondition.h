@@ -1,0 +1,52 @@
+#pragma once
+
+#include <cassert>
+#include <functional>
+#include <memory>
+#include <vector>
+
+#include "platform/Condition.h"
+
+namespace halyard::testing {
+
+// A condition for tests of one thread: a wait asks `onWait` what becomes of it,
+// and without one runs into its deadline.
+class FakeCondition final : public platform::Condition {
+public:
+    void lock() override {
+        assert(!locked);
+        locked = true;
+    }
+    void unlock() override {
+        assert(locked);
+        locked = false;
+    }
+    bool waitFor(std::chrono::nanoseconds timeout) override {
+        assert(locked);
+        waits.push_back(timeout);
+        return onWait && onWait();
+    }
+    void signal() override {
+        assert(locked);
+        ++signals;
+    }
+
+    // Runs under the lock; false is the deadline.
+    std::function<bool()> onWait;
+    std::vector<std::chrono::nanoseconds> waits;
+    int signals = 0;
+    bool locked = false;
+};
+
+class FakeConditionFactory final : public platform::ConditionFactory {
+public:
+    std::unique_ptr<platform::Condition> makeCondition() override {
+        auto condition = std::make_unique<FakeCondition>();
+        condition->onWait = onWait;
+        return condition;
+    }
+
+    std::function<bool()> onWait; // of the conditions it makes
+};
+
+} // namespace halyard::testing
