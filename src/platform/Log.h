@@ -12,10 +12,10 @@
 #include "platform/LogSink.h"
 
 // A Value prints as its description.
-template <> struct fmt::formatter<halyard::Value> : fmt::formatter<std::string_view> {
-    template <class Context> auto format(const halyard::Value& value, Context& context) const {
-        return fmt::formatter<std::string_view>::format(halyard::describe(value), context);
-    }
+template <> struct fmt::formatter<halyard::Value> {
+    constexpr auto parse(fmt::format_parse_context& context) { return context.begin(); }
+    fmt::format_context::iterator format(const halyard::Value& value,
+                                         fmt::format_context& context) const;
 };
 
 namespace halyard::platform {

@@ -1,8 +1,17 @@
 #include "platform/Platform.h"
 
+#include <algorithm>
 #include <cassert>
 
+#include "common/Description.h"
 #include "platform/Log.h"
+
+fmt::format_context::iterator
+fmt::formatter<halyard::Value>::format(const halyard::Value& value,
+                                       fmt::format_context& context) const {
+    const std::string text = halyard::describe(value);
+    return std::copy(text.begin(), text.end(), context.out());
+}
 
 namespace halyard::platform {
 namespace {
