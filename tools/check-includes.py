@@ -1,0 +1,219 @@
+#!/usr/bin/env python3
+"""Checks who may include what.
+
+The tables below are the dependency rule; docs and reviewers quote them. A
+violation is printed as FILE:LINE: text, and the exit code is 1.
+
+usage: check-includes.py [ROOT]        check ROOT/src and ROOT/tools
+       check-includes.py --self-test   check the checker
+"""
+
+import os
+import re
+import sys
+import tempfile
+
+# What the sources of a folder may include, by #include "folder/...". A folder
+# always sees itself.
+BASE = {"common", "protocol", "platform"}
+FOLDERS = {
+    "common": set(),
+    "protocol": {"common"},
+    "platform": {"common", "protocol"},
+    "sinks": BASE,
+    "tracing": BASE,
+    "session": BASE | {"sinks", "tracing"},
+    "drivers": BASE | {"sinks", "tracing", "session"},
+    "service": BASE | {"sinks", "tracing", "session", "drivers"},
+    "linux": BASE,
+    "client": {"common", "protocol"},
+    "testing": BASE,
+}
+# Files that see more than their folder does.
+EXTRA = {"service/main.cpp": {"linux", "client"}}
+# A unit test (X_test.cpp) also sees the fakes.
+TEST_EXTRA = {"testing"}
+# Programs beside the daemon are clients of it.
+TOOLS = {"common", "protocol", "client"}
+# The client's public headers, included as <halyard/...> or "halyard/...".
+PUBLIC = {"halyard": "client"}
+
+# The core: takes time, threads and files from platform/ and asks nothing of the
+# system itself. Maps to the libraries that a folder's headers and sources use.
+CORE = {
+    "common": ("fmt/", "rapidjson/"),
+    "protocol": ("fmt/", "msgpack.hpp", "msgpack/"),
+    "platform": ("fmt/",),
+    "sinks": ("fmt/", "protozero/"),
+    "tracing": ("fmt/", "plist/", "rapidjson/"),
+    "session": ("fmt/",),
+    "drivers": ("fmt/",),
+    "service": ("fmt/",),
+}
+# Standard headers that reach past the platform.
+NOT_IN_CORE = {
+    "barrier", "condition_variable", "csignal", "filesystem", "fstream", "future", "iostream",
+    "latch", "random", "semaphore", "shared_mutex", "stop_token", "thread",
+}
+# Time that does not come from platform::Clock, also in unit tests of the core.
+CALLS_NOT_IN_CORE = re.compile(
+    r"\b(now\s*\(\s*\)|(?:sleep|sleep_for|sleep_until|usleep|nanosleep|clock_gettime|gettimeofday)"
+    r"\s*\()")
+
+INCLUDE = re.compile(r'^\s*#\s*include\s*(?:"([^"]+)"|<([^>]+)>)')
+STANDARD = re.compile(r"[a-z_0-9]+")
+COMMENT_OR_TEXT = re.compile(
+    r'//[^\n]*|/\*.*?\*/|R"\((?:.*?)\)"|"(?:\\.|[^"\\\n])*"|\'(?:\\.|[^\'\\\n])+\'', re.DOTALL)
+
+
+def without_comments_and_text(source):
+    """The same lines, with comments and literals blanked."""
+    return COMMENT_OR_TEXT.sub(lambda match: "\n" * match.group().count("\n"), source)
+
+
+class File:
+    """One source file and what it may see."""
+
+    def __init__(self, path):
+        parts = path.split("/")
+        self.path = path
+        self.is_test = path.endswith("_test.cpp")
+        self.folder = parts[1] if parts[0] == "src" and len(parts) > 2 else None
+        inner = "/".join(parts[1:])
+        self.is_core = self.folder in CORE and inner not in EXTRA
+        if self.folder is None:
+            self.sees = set(TOOLS)
+        else:
+            self.sees = FOLDERS[self.folder] | {self.folder} | EXTRA.get(inner, set())
+        if self.is_test:
+            self.sees = self.sees | TEST_EXTRA
+
+    def include_error(self, name, quoted):
+        """Why this file may not include `name`; None when it may."""
+        first = name.split("/")[0] if "/" in name else None
+        if first in PUBLIC:
+            first = PUBLIC[first]
+            quoted = True
+        if quoted:
+            if self.folder is None and first is None:
+                return None  # a program's own header
+            if first not in FOLDERS:
+                return None if self.folder is None else f'write "{name}" from src/ on'
+            if first not in self.sees:
+                return f"{self.folder or 'tools'} does not see {first}"
+            return None
+        if not self.is_core or self.is_test:
+            return None
+        if STANDARD.fullmatch(name):
+            return f"<{name}> does not belong in the core" if name in NOT_IN_CORE else None
+        if name.startswith(CORE[self.folder]):
+            return None
+        return f"<{name}> is no library of {self.folder}"
+
+
+def check_file(path, source):
+    """Yields (line, text) for each violation in one file."""
+    file = File(path)
+    for number, line in enumerate(source.splitlines(), 1):
+        match = INCLUDE.match(line)
+        if match:
+            error = file.include_error(match[1] or match[2], match[1] is not None)
+            if error:
+                yield number, error
+    if file.is_core:
+        for number, line in enumerate(without_comments_and_text(source).splitlines(), 1):
+            match = CALLS_NOT_IN_CORE.search(line)
+            if match:
+                yield number, f"{match[1].strip()}: the core's time comes from platform::Clock"
+
+
+def sources(root):
+    for top in ("src", "tools"):
+        for folder, subfolders, names in os.walk(os.path.join(root, top)):
+            subfolders.sort()
+            for name in sorted(names):
+                if name.endswith((".h", ".cpp", ".c")):
+                    yield os.path.relpath(os.path.join(folder, name), root)
+
+
+def check(root):
+    """All violations under `root`, as lines of text."""
+    found = []
+    for path in sources(root):
+        parts = path.split("/")
+        if parts[0] == "src" and len(parts) > 2 and parts[1] not in FOLDERS:
+            found.append(f"{path}:1: src/{parts[1]} is not in the table of folders")
+            continue
+        with open(os.path.join(root, path), encoding="utf-8") as file:
+            found += [f"{path}:{line}: {text}" for line, text in check_file(path, file.read())]
+    return found
+
+
+ALLOWED = {
+    "src/common/A.cpp": '#include "common/A.h"\n#include <vector>\n#include <fmt/core.h>\n',
+    "src/session/A.cpp": '#include "sinks/B.h"\n#include "protocol/Wire.h"\n// calls now() never\n',
+    "src/session/A_test.cpp": '#include "testing/Fake.h"\n#include <gtest/gtest.h>\n',
+    "src/service/main.cpp": '#include "linux/Server.h"\n#include "client/Mark.h"\n'
+                            "#include <unistd.h>\n",
+    "src/linux/A.cpp": '#include "platform/Clock.h"\n#include <asio.hpp>\n#include <thread>\n'
+                       "auto t = std::chrono::steady_clock::now();\n",
+    "src/client/A.cpp": '#include <halyard/halyard.h>\n#include "protocol/Wire.h"\n',
+    "src/tracing/A.cpp": 'const char* text = "sleep(1)"; /* now() */\nint asleep(int);\n',
+    "tools/ctl/A.cpp": '#include "Table.h"\n#include "protocol/Wire.h"\n#include <unistd.h>\n',
+}
+FORBIDDEN = {
+    "src/common/A.cpp": '#include "platform/Clock.h"\n',
+    "src/common/B.cpp": '#include "B.h"\n',
+    "src/protocol/A.h": '#include "platform/Log.h"\n',
+    "src/platform/A.h": "#include <sys/socket.h>\n",
+    "src/sinks/A.cpp": '#include "session/HYReportingSession.h"\n',
+    "src/sinks/B.cpp": '#include "tracing/Trace.h"\n',
+    "src/session/A.cpp": '  #  include "testing/Fake.h"\n',
+    "src/session/B.cpp": "auto t = Clock::now();\n",
+    "src/session/B_test.cpp": "std::this_thread::sleep_for(1s);\n",
+    "src/session/C_test.cpp": '#include "linux/Server.h"\n',
+    "src/drivers/A.cpp": "#include <thread>\n",
+    "src/drivers/B.cpp": "#include <sqlite3.h>\n",
+    "src/service/A.cpp": '#include "linux/Server.h"\n',
+    "src/service/B.cpp": "#include <halyard/halyard.h>\n",
+    "src/linux/A.cpp": '#include "session/HYReportingSession.h"\n',
+    "src/client/A.cpp": '#include "platform/Clock.h"\n',
+    "src/testing/A.h": '#include "session/HYReportingSession.h"\n',
+    "src/novel/A.h": "\n",
+    "tools/ctl/A.cpp": '#include "service/Registry.h"\n',
+}
+
+
+def check_tree(files):
+    with tempfile.TemporaryDirectory() as root:
+        for path, text in files.items():
+            os.makedirs(os.path.join(root, os.path.dirname(path)), exist_ok=True)
+            with open(os.path.join(root, path), "w", encoding="utf-8") as file:
+                file.write(text)
+        return check(root)
+
+
+def self_test():
+    errors = [f"should be allowed: {text}" for text in check_tree(ALLOWED)]
+    for path, text in FORBIDDEN.items():
+        if len(check_tree({path: text})) != 1:
+            errors.append(f"should be one violation: {path}: {text.strip()}")
+    return errors
+
+
+def main(arguments):
+    if arguments == ["--self-test"]:
+        found = self_test()
+    else:
+        root = arguments[0] if arguments else os.path.join(os.path.dirname(__file__), "..")
+        if not any(True for _ in sources(root)):
+            found = [f"{root}: no sources here"]
+        else:
+            found = check(root)
+    for line in found:
+        print(line)
+    return 1 if found else 0
+
+
+if __name__ == "__main__":
+    sys.exit(main(sys.argv[1:]))
