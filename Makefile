@@ -1,0 +1,88 @@
+# Entry points; CMake does the work. `make run` shows the system at work,
+# `make test` builds and runs every test, `make check` does that with every
+# compiler and sanitizer. docs/dependencies.md says what each package is for.
+
+# What a program of ours needs to be built and to run.
+BUILD_PACKAGES := g++ cmake ninja-build ccache pkg-config python3 \
+	libasio-dev libmsgpack-cxx-dev libsqlite3-dev libtomlplusplus-dev libsystemd-dev \
+	libfmt-dev rapidjson-dev libprotozero-dev libplist-dev libtracefs-dev \
+	libtraceevent-dev libpipewire-0.3-dev libspa-0.2-dev
+# What the demonstration plays with.
+RUN_PACKAGES := pipewire pipewire-bin pipewire-pulse libspa-0.2-modules wireplumber \
+	sox espeak-ng sqlite3 procps
+TEST_PACKAGES := libgtest-dev libgmock-dev libbenchmark-dev clang-format python3-msgpack \
+	neovim
+CHECK_PACKAGES := clang clang-tidy libclang-rt-14-dev
+BENCH_PACKAGES := libbenchmark-dev sqlite3
+
+JOBS ?= $(shell nproc)
+TEST_JOBS ?= 2
+FUZZ_SECONDS ?= 60
+# `make check PRESETS=gcc-tsan` for one of them; `make check TIDY=1` adds clang-tidy.
+PRESETS ?= gcc-debug gcc-release gcc-asan gcc-tsan clang-debug clang-release clang-asan clang-tsan
+TIDY ?=
+# `make run KEEP=DIR` leaves the demonstration's directories there.
+KEEP ?=
+
+CTEST_FLAGS := --output-on-failure --no-label-summary --parallel $(TEST_JOBS)
+# ThreadSanitizer of these compilers does not cope with more than 28 bits of
+# address space randomisation, which newer kernels use.
+FIXED_ADDRESSES := setarch $(shell uname -m) -R
+
+.DEFAULT_GOAL := build
+.PHONY: deps build run test check fuzz tidy bench format clean
+
+deps:
+	@tools/install-deps.sh $(BUILD_PACKAGES) $(RUN_PACKAGES) $(TEST_PACKAGES)
+
+build:
+	@tools/install-deps.sh $(BUILD_PACKAGES)
+	cmake --preset release
+	cmake --build --preset release --parallel $(JOBS)
+
+run:
+	@tools/install-deps.sh $(BUILD_PACKAGES) $(RUN_PACKAGES)
+	@$(MAKE) --no-print-directory build
+	tools/demo/run-demo build/release $(if $(KEEP),KEEP=$(KEEP))
+
+test: deps
+	cmake --preset test
+	cmake --build --preset test --parallel $(JOBS)
+	ctest --preset test $(CTEST_FLAGS)
+
+check: deps
+	@tools/install-deps.sh $(CHECK_PACKAGES)
+	set -e; for preset in $(PRESETS); do \
+		echo "== $$preset"; \
+		wrapper=; case $$preset in *-tsan) wrapper="$(FIXED_ADDRESSES)";; esac; \
+		cmake --preset $$preset; \
+		$$wrapper cmake --build --preset $$preset --parallel $(JOBS); \
+		$$wrapper ctest --preset $$preset $(CTEST_FLAGS); \
+	done
+	$(MAKE) fuzz
+	$(if $(TIDY),$(MAKE) tidy)
+
+fuzz:
+	@tools/install-deps.sh $(BUILD_PACKAGES) $(CHECK_PACKAGES)
+	cmake --preset fuzz
+	cmake --build --preset fuzz --parallel $(JOBS)
+	tools/run-fuzzers.sh build/fuzz $(FUZZ_SECONDS)
+
+# Reads the compile commands of the clang debug build.
+tidy:
+	@tools/install-deps.sh $(BUILD_PACKAGES) $(TEST_PACKAGES) $(CHECK_PACKAGES)
+	cmake --preset clang-debug
+	run-clang-tidy-14 -quiet -p build/clang-debug '$(CURDIR)/(src|tools|benchmarks)/.*\.cpp'
+
+bench:
+	@tools/install-deps.sh $(BUILD_PACKAGES) $(BENCH_PACKAGES)
+	cmake --preset bench
+	cmake --build --preset bench --parallel $(JOBS)
+	tools/run-benchmarks.sh build/bench
+
+format:
+	@tools/install-deps.sh clang-format
+	tools/check-format.sh --fix
+
+clean:
+	rm -rf build
