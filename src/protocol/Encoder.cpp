@@ -61,6 +61,20 @@ void appendSigned(std::string& out, std::int64_t value) {
     }
 }
 
+// `small` is the head of up to 15 elements, `wide` that of a 16-bit count; the
+// head of a 32-bit one follows it.
+void appendContainer(std::string& out, unsigned small, unsigned wide, std::size_t size) {
+    if (size <= 15) {
+        appendByte(out, small | static_cast<unsigned>(size));
+    } else if (size <= 0xFFFF) {
+        appendHead(out, wide, static_cast<std::uint16_t>(size));
+    } else {
+        appendHead(out, wide + 1, static_cast<std::uint32_t>(size));
+    }
+}
+
+} // namespace
+
 void appendText(std::string& out, std::string_view text) {
     if (text.size() <= 31) {
         appendByte(out, 0xA0U | static_cast<unsigned>(text.size()));
@@ -74,18 +88,6 @@ void appendText(std::string& out, std::string_view text) {
     out += text;
 }
 
-// `small` is the head of up to 15 elements, `wide` that of a 16-bit count; the
-// head of a 32-bit one follows it.
-void appendContainer(std::string& out, unsigned small, unsigned wide, std::size_t size) {
-    if (size <= 15) {
-        appendByte(out, small | static_cast<unsigned>(size));
-    } else if (size <= 0xFFFF) {
-        appendHead(out, wide, static_cast<std::uint16_t>(size));
-    } else {
-        appendHead(out, wide + 1, static_cast<std::uint32_t>(size));
-    }
-}
-
 void appendArray(std::string& out, std::size_t size) {
     appendContainer(out, 0x90, 0xDC, size);
 }
@@ -93,6 +95,8 @@ void appendArray(std::string& out, std::size_t size) {
 void appendMap(std::string& out, std::size_t size) {
     appendContainer(out, 0x80, 0xDE, size);
 }
+
+namespace {
 
 // The smallest of the three timestamps that holds the date.
 void appendDate(std::string& out, Date date) {

@@ -106,6 +106,12 @@ struct Answer {
 // keeps its kind.
 void appendValue(std::string& out, const Value& value);
 
+// The pieces, for a caller that writes an object as it goes: a string, and the
+// heads of containers, to be followed by `size` objects (a map: pairs).
+void appendText(std::string& out, std::string_view text);
+void appendArray(std::string& out, std::size_t size);
+void appendMap(std::string& out, std::size_t size);
+
 std::string_view methodName(Method method);
 
 } // namespace halyard::protocol
