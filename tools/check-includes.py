@@ -31,7 +31,8 @@ FOLDERS = {
 }
 # Files that see more than their folder does.
 EXTRA = {"service/main.cpp": {"linux", "client"}}
-# A unit test (X_test.cpp) also sees the fakes.
+# A unit test (X_test.cpp, and what several of them share) also sees the fakes.
+TEST_FILES = ("_test.cpp", "Fixture.h", "TestSupport.h")
 TEST_EXTRA = {"testing"}
 # Programs beside the daemon are clients of it.
 TOOLS = {"common", "protocol", "client"}
@@ -77,7 +78,7 @@ class File:
     def __init__(self, path):
         parts = path.split("/")
         self.path = path
-        self.is_test = path.endswith("_test.cpp")
+        self.is_test = path.endswith(TEST_FILES)
         self.folder = parts[1] if parts[0] == "src" and len(parts) > 2 else None
         inner = "/".join(parts[1:])
         self.is_core = self.folder in CORE and inner not in EXTRA

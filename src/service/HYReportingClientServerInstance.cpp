@@ -4,6 +4,7 @@
 #include <utility>
 
 #include "platform/Device.h"
+#include "platform/HYReportingUtilityDevice.h"
 #include "platform/Log.h"
 #include "platform/Platform.h"
 #include "platform/TraceMarks.h"
@@ -164,18 +165,23 @@ void HYReportingClientServerInstance::start(Delegate& delegate, std::int64_t rep
 void HYReportingClientServerInstance::sendMessage(
     Dictionary message, AudioEventCategory category, std::uint16_t type,
     std::optional<std::vector<std::int64_t>> reporterIDs, ErrorReply reply) {
+    // Only issue capture looks at the sender's name, and it costs a file.
+    auto processName = HYReportingUtilityIsInternalBuild()
+                           ? HYReportingUtilityProcessNameForPID(pid_)
+                           : std::nullopt;
     onServiceQueue([message = std::move(message), category, type,
-                    reporterIDs = std::move(reporterIDs),
+                    processName = std::move(processName), reporterIDs = std::move(reporterIDs),
                     reply = std::move(reply)](auto& self, Delegate& delegate) {
-        reply(self.send(delegate, message, category, type, reporterIDs));
+        reply(self.send(delegate, message, category, type, reporterIDs, processName));
     });
 }
 
 MaybeError
 HYReportingClientServerInstance::send(Delegate& delegate, const Dictionary& message,
                                       AudioEventCategory category, std::uint16_t type,
-                                      const std::optional<std::vector<std::int64_t>>& reporterIDs) {
-    const MessageFanOut fanOut(delegate, {message, category, type});
+                                      const std::optional<std::vector<std::int64_t>>& reporterIDs,
+                                      const std::optional<std::string>& processName) {
+    const MessageFanOut fanOut(delegate, {message, category, type, processName});
     return fanOut.route(reporterIDs, [&](std::int64_t reporterID) {
         return findReportingSessionForID(delegate, reporterID, true);
     });

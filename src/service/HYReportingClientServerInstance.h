@@ -80,8 +80,8 @@ private:
     void stop(Delegate& delegate, std::int64_t reporterID);
     void destroy(std::int64_t reporterID);
     MaybeError send(Delegate& delegate, const Dictionary& message, AudioEventCategory category,
-                    std::uint16_t type,
-                    const std::optional<std::vector<std::int64_t>>& reporterIDs);
+                    std::uint16_t type, const std::optional<std::vector<std::int64_t>>& reporterIDs,
+                    const std::optional<std::string>& processName);
     void leave(Delegate& delegate);
 
     std::shared_ptr<HYReportingSession> findReportingSessionForID(const Delegate& delegate,

@@ -52,6 +52,9 @@ double uptimeSeconds(std::int32_t pid, const std::optional<platform::WallTime>& 
 std::shared_ptr<HYReportingServiceDelegate> HYReportingServiceDelegate::make() {
     std::shared_ptr<HYReportingServiceDelegate> delegate(new HYReportingServiceDelegate);
     delegate->listenForFeatureStateChanges();
+    if (HYReportingUtilityIsInternalBuild()) {
+        delegate->ibxStateManager_ = std::make_unique<HYReportingUtilityIBXStateManager>();
+    }
     return delegate;
 }
 
@@ -197,6 +200,15 @@ HYReportingServiceDelegate::getAllActiveReportingSessions() const {
                      [](const Session& session) { return session->started(); });
     }
     return active;
+}
+
+void HYReportingServiceDelegate::handleEventForIBX(const Dictionary& message,
+                                                   AudioEventCategory category, std::uint16_t type,
+                                                   const Session& session,
+                                                   const std::optional<std::string>& processName) {
+    if (HYReportingUtilityIsInternalBuild() && ibxStateManager_ != nullptr) {
+        ibxStateManager_->handleEvent(&message, category, type, session, processName);
+    }
 }
 
 void HYReportingServiceDelegate::stopAllSessions() {

@@ -19,6 +19,7 @@
 #include "platform/WorkQueue.h"
 #include "service/FeatureState.h"
 #include "service/HYReportingServiceDelegateProtocol.h"
+#include "sinks/HYReportingUtilityIBXStateManager.h"
 
 namespace halyard {
 
@@ -40,6 +41,9 @@ public:
     std::vector<Session> getAllActiveReportingSessions() const override;
     Session findReportingSessionForID(std::int64_t reporterID) const override;
     void removeClient(const HYReportingClientServerInstance& client) override;
+    void handleEventForIBX(const Dictionary& message, AudioEventCategory category,
+                           std::uint16_t type, const Session& session,
+                           const std::optional<std::string>& processName) override;
     std::int64_t activeSessionCount() const override { return activeSessionCount_; }
     void setActiveSessionCount(std::int64_t count) override { activeSessionCount_ = count; }
 
@@ -64,6 +68,8 @@ private:
     const Dictionary defaults_;
     std::int64_t activeSessionCount_ = 0;
     std::vector<FeatureRecord> features_;
+    // Null but on internal builds.
+    std::unique_ptr<HYReportingUtilityIBXStateManager> ibxStateManager_;
 
     mutable Mutex monitor_;
     std::vector<Client> clients_ HY_GUARDED_BY(monitor_);

@@ -4,6 +4,9 @@
 #include "platform/Log.h"
 #include "platform/Platform.h"
 #include "platform/TraceMarks.h"
+#include "sinks/HYReportingEnergyLedgerUtility.h"
+#include "sinks/HYReportingTMXBridge.h"
+#include "sinks/HYReportingTallyhubBridge.h"
 
 namespace halyard {
 namespace {
@@ -53,6 +56,8 @@ void MessageFanOut::sendToAddressed(const std::vector<std::int64_t>& reporterIDs
             continue;
         }
         if (const Session session = findAcrossAllClients(reporterID)) {
+            offerToSinks(session);
+            offerToIssueCapture(session);
             sendToSession(*session);
         }
     }
@@ -63,7 +68,11 @@ void MessageFanOut::broadcast() const {
     HY_LOG_DEFAULT(HYReportingClientCategory, "active reporting sessions {} : {}", sessions.size(),
                    describeSessions(sessions));
     for (const Session& session : sessions) {
+        // The session first here, last when it is addressed: readers of the
+        // store rely on either order.
         sendToSession(*session);
+        offerToSinks(session);
+        offerToIssueCapture(session);
     }
     if (sessions.empty()) {
         sendStandalone();
@@ -71,11 +80,30 @@ void MessageFanOut::broadcast() const {
 }
 
 void MessageFanOut::sendStandalone() const {
+    const Session standalone = HYReportingSession::initWithID(
+        kStandaloneReporterID, {platform::current().ownProcess->pid()});
+    standalone->setServiceType(kAudioServiceTypeStandalone);
+    standalone->updateConfigurationWithContentsOfConfiguration(
+        Dictionary{{"HostApplicationDisplayID", "Unknown"}});
+    offerToSinks(standalone);
+    offerToIssueCapture(standalone);
     HY_LOG_DEFAULT(HYReportingClientCategory,
                    "no active reporting sessions found, sending as standalone");
     HYReportingSession::sendSingleMessage(message_.payload, message_.category, message_.type,
                                           kAudioServiceTypeStandalone, delegate_.getDefaults(),
                                           nullptr);
+}
+
+void MessageFanOut::offerToSinks(const Session& session) const {
+    const auto& [payload, category, type, processName] = message_;
+    HYReportingTallyhubBridge::handleEvent(&payload, category, type, session);
+    HYReportingEnergyLedgerUtility::handleEvent(&payload, category, type, session);
+    HYReportingTMXBridge::handleEvent(&payload, category, type, session);
+}
+
+void MessageFanOut::offerToIssueCapture(const Session& session) const {
+    delegate_.handleEventForIBX(message_.payload, message_.category, message_.type, session,
+                                message_.processName);
 }
 
 void MessageFanOut::sendToSession(HYReportingSession& session) const {

@@ -1,4 +1,4 @@
-// Routes one client message to the sessions concerned.
+// Routes one client message to the sessions concerned and to the four sinks.
 //
 // Runs on the service work queue, so sessions see one message at a time, in the
 // order of arrival. Borrows everything it is given; lives for one message.
@@ -8,6 +8,7 @@
 #include <functional>
 #include <memory>
 #include <optional>
+#include <string>
 #include <vector>
 
 #include "common/Error.h"
@@ -23,6 +24,8 @@ struct ClientMessage {
     const Dictionary& payload;
     AudioEventCategory category;
     std::uint16_t type;
+    // The sender's, where issue capture will want it.
+    const std::optional<std::string>& processName;
 };
 
 class MessageFanOut {
@@ -45,6 +48,8 @@ private:
     void broadcast() const;
     void sendStandalone() const;
     void sendToSession(HYReportingSession& session) const;
+    void offerToSinks(const Session& session) const;
+    void offerToIssueCapture(const Session& session) const;
 
     HYReportingServiceDelegateProtocol& delegate_;
     const ClientMessage message_;

@@ -23,6 +23,7 @@
 #include "platform/WorkQueue.h"
 #include "session/AsyncSemaphore.h"
 #include "session/MessageBatch.h"
+#include "sinks/SessionFacts.h"
 
 namespace halyard {
 
@@ -34,7 +35,8 @@ inline constexpr const char* HYReportingSessionThrottleSecondsKey = "_throttle_s
 // integer part counts.
 inline constexpr const char* HYReportingRelayReportingTimeOut = "9.0";
 
-class HYReportingSession final : public std::enable_shared_from_this<HYReportingSession> {
+class HYReportingSession final : public SessionFacts,
+                                 public std::enable_shared_from_this<HYReportingSession> {
 public:
     using SendReply = std::function<void(const MaybeError&)>;
     using TransactionCompleteBlock = std::function<void(const MaybeError&, bool)>;
@@ -42,7 +44,7 @@ public:
     // The first process identifier is the owner's.
     static std::shared_ptr<HYReportingSession>
     initWithID(std::int64_t reporterID, std::vector<std::int32_t> processIdentifiers);
-    ~HYReportingSession();
+    ~HYReportingSession() override;
 
     std::string description() const;
 
@@ -82,9 +84,9 @@ public:
     bool started() const { return started_.load(); }
     std::int64_t reporterID() const { return reporterID_; }
     const std::vector<std::int32_t>& processIdentifiers() const { return processIdentifiers_; }
-    AudioServiceType serviceType() const HY_EXCLUDES(stateMutex_);
+    AudioServiceType serviceType() const override HY_EXCLUDES(stateMutex_);
     std::string serviceName() const HY_EXCLUDES(stateMutex_);
-    Dictionary configuration() const HY_EXCLUDES(stateMutex_);
+    Dictionary configuration() const override HY_EXCLUDES(stateMutex_);
     bool relayReportingEnabled() const { return relayReportingEnabled_.load(); }
     void setRelayReportingEnabled(bool enabled) { relayReportingEnabled_.store(enabled); }
     // The flag itself, not a copy.
