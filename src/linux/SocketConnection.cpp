@@ -251,7 +251,10 @@ void SocketConnection::send(std::string_view bytes) {
     }
     out_ += bytes;
     unsentBytes_.store(out_.size());
-    if (!writeScheduled_) {
+    if (out_.size() > kMaxUnsentBytes) {
+        asio::post(socket_.get_executor(),
+                   [self = shared_from_this()] { self->breakOff("answers left lying"); });
+    } else if (!writeScheduled_) {
         writeScheduled_ = true;
         asio::post(socket_.get_executor(), [self = shared_from_this()] { self->writeSome(); });
     }
@@ -265,16 +268,12 @@ void SocketConnection::writeSome() {
     bool failed = false;
     {
         const MutexLock lock(outMutex_);
-        if (out_.size() > kMaxUnsentBytes) {
-            failed = true;
-        } else {
-            const ssize_t sent = ::send(socket_.native_handle(), out_.data(), out_.size(),
-                                        MSG_DONTWAIT | MSG_NOSIGNAL);
-            if (sent > 0) {
-                out_.erase(0, static_cast<std::size_t>(sent));
-            }
-            failed = sent < 0 && errno != EAGAIN && errno != EINTR;
+        const ssize_t sent =
+            ::send(socket_.native_handle(), out_.data(), out_.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
+        if (sent > 0) {
+            out_.erase(0, static_cast<std::size_t>(sent));
         }
+        failed = sent < 0 && errno != EAGAIN && errno != EINTR;
         blocked = !out_.empty();
         writeScheduled_ = blocked;
         unsentBytes_.store(out_.size());
@@ -283,7 +282,7 @@ void SocketConnection::writeSome() {
         }
     }
     if (failed) {
-        breakOff("answers left lying");
+        end(Ending::Broken);
         return;
     }
     if (blocked) {
@@ -308,6 +307,9 @@ void SocketConnection::workDone(std::size_t requests, std::size_t bytes) {
 }
 
 void SocketConnection::breakOff(std::string_view why) {
+    if (ended_) {
+        return;
+    }
     HY_LOG_ERROR(HYReportingPlatformCategory, "closing connection {}: {}", description(), why);
     ++shared_.counters.broken;
     end(Ending::Broken);
