@@ -162,7 +162,7 @@ void expectSame(const Value& left, const Value& right) {
     EXPECT_EQ(left, right);
 }
 
-constexpr int kRounds = 300;
+constexpr int kRounds = 100;
 
 TEST(WireOracleTest, ReadsWhatWeWrite) {
     RandomValues random;
