@@ -1,6 +1,6 @@
 #!/bin/sh
 # Runs every fuzzer of a build for a while, as many at once as there are
-# processors. Corpora grow in BUILD_DIR/corpus; fuzz/seeds/NAME, where it exists,
+# processors. Corpora grow in BUILD_DIR/corpus; fuzz/corpus/NAME, where it exists,
 # seeds the fuzzer NAME_fuzz.
 #
 # usage: tools/run-fuzzers.sh BUILD_DIR SECONDS
@@ -13,7 +13,7 @@ run_one() {
     name=$(basename "$1" _fuzz)
     corpus="$build/corpus/$name"
     mkdir -p "$corpus"
-    seeds="$root/fuzz/seeds/$name"
+    seeds="$root/fuzz/corpus/$name"
     [ -d "$seeds" ] || seeds=""
     # $seeds is one word or none.
     # shellcheck disable=SC2086
