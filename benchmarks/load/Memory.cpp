@@ -143,12 +143,11 @@ std::vector<HoldSample> holdLoad(const Options& options) {
         for (HoldClient& client : clients) {
             client.sendUpTo(due);
         }
-        if (elapsed >= interval * static_cast<double>(samples.size())) {
+        const bool last = elapsed >= options.holdSeconds;
+        if (last || elapsed >= interval * static_cast<double>(samples.size())) {
             samples.push_back({elapsed, daemon.memory().residentBytes, due * options.clients});
         }
     } while (elapsed < options.holdSeconds);
-    samples.push_back({elapsed, daemon.memory().residentBytes,
-                       static_cast<std::uint64_t>(elapsed * rate) * options.clients});
     return samples;
 }
 

@@ -24,8 +24,8 @@ struct Measurement {
     std::uint64_t bytes = 0;
     double seconds = 0;
     std::uint64_t cpuNanoseconds = 0;
-    std::optional<std::uint64_t> peakBytes; // unknown for the floor
-    std::optional<Rows> rows;
+    std::optional<std::uint64_t> peakBytes = {}; // unknown for the floor
+    std::optional<Rows> rows = {};
 
     double messagesPerSecond() const { return static_cast<double>(messages) / seconds; }
     double cpuPerMessage() const {
