@@ -1,5 +1,6 @@
 #pragma once
 
+#include <mutex>
 #include <vector>
 
 #include "platform/Random.h"
@@ -7,16 +8,21 @@
 
 namespace halyard::testing {
 
+// Any thread; the members want the markers at rest.
 class FakeTraceMarks final : public platform::TraceMarks {
 public:
     void mark(std::uint32_t code, std::uint64_t arg1, std::uint64_t arg2, std::uint64_t arg3,
               std::uint64_t arg4) override {
+        const std::lock_guard lock(mutex_);
         codes.push_back(code);
         argumentsAllZero = argumentsAllZero && (arg1 | arg2 | arg3 | arg4) == 0;
     }
 
     std::vector<std::uint32_t> codes;
     bool argumentsAllZero = true;
+
+private:
+    std::mutex mutex_;
 };
 
 // Returns what a test put in, cut to the bound.
