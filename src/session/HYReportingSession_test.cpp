@@ -1,4 +1,4 @@
-#include "session/HYReportingSession_test.h"
+#include "session/SessionFixture.h"
 
 #include <thread>
 
