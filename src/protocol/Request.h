@@ -41,11 +41,11 @@ using ReporterIDs = std::vector<std::int64_t>;
 struct Arguments {
     std::int64_t reporterID = 0;
     std::uint16_t serviceType = 0;
-    Dictionary dictionary; // a message or a configuration
+    Dictionary dictionary{}; // a message or a configuration
     std::uint32_t category = 0;
     std::uint16_t type = 0;
-    std::optional<ReporterIDs> reporterIDs; // nullopt: no list at all (broadcast)
-    std::string name;
+    std::optional<ReporterIDs> reporterIDs{}; // nullopt: no list at all (broadcast)
+    std::string name{};
 };
 
 // Takes the answer to one request.
