@@ -153,6 +153,7 @@ TEST_F(HYReportingSessionTest, MakesItsRelayQueueOnFirstUseAndOnce) {
     session->start();
     send(*session, {});
     EXPECT_EQ(platform_.queues.queuesMade(name), 1U);
+    EXPECT_EQ(platform_.queues.priority(name), platform::QueuePriority::Utility);
 }
 
 TEST_F(HYReportingSessionTest, HandsBackTheTransactionItHeldBefore) {

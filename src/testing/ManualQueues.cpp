@@ -52,9 +52,9 @@ ManualQueues::ManualQueues(ManualClock& clock)
 
 ManualQueues::~ManualQueues() = default;
 
-std::shared_ptr<platform::SerialQueue> ManualQueues::makeSerialQueue(std::string_view name,
-                                                                     platform::QueuePriority) {
-    made_.emplace_back(name);
+std::shared_ptr<platform::SerialQueue>
+ManualQueues::makeSerialQueue(std::string_view name, platform::QueuePriority priority) {
+    made_.push_back({std::string(name), priority});
     return std::make_shared<Queue>(*this, std::string(name));
 }
 
@@ -103,7 +103,14 @@ void ManualQueues::advance(std::chrono::nanoseconds by) {
 }
 
 std::size_t ManualQueues::queuesMade(std::string_view name) const {
-    return static_cast<std::size_t>(std::count(made_.begin(), made_.end(), name));
+    return static_cast<std::size_t>(std::count_if(
+        made_.begin(), made_.end(), [&](const Made& made) { return made.name == name; }));
+}
+
+std::optional<platform::QueuePriority> ManualQueues::priority(std::string_view name) const {
+    const auto made = std::find_if(made_.rbegin(), made_.rend(),
+                                   [&](const Made& each) { return each.name == name; });
+    return made != made_.rend() ? std::optional(made->priority) : std::nullopt;
 }
 
 std::size_t ManualQueues::pending(std::string_view name) const {

@@ -7,6 +7,7 @@
 
 #include <deque>
 #include <memory>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -21,8 +22,8 @@ public:
     explicit ManualQueues(ManualClock& clock);
     ~ManualQueues() override;
 
-    std::shared_ptr<platform::SerialQueue> makeSerialQueue(std::string_view name,
-                                                           platform::QueuePriority) override;
+    std::shared_ptr<platform::SerialQueue>
+    makeSerialQueue(std::string_view name, platform::QueuePriority priority) override;
     platform::WorkQueue& backgroundQueue() override;
 
     // Runs the oldest ready task of any queue that is not suspended; false when
@@ -34,6 +35,8 @@ public:
     void advance(std::chrono::nanoseconds by);
 
     std::size_t queuesMade(std::string_view name) const;
+    // Of the queue made last under this name; none when there is none.
+    std::optional<platform::QueuePriority> priority(std::string_view name) const;
     // Tasks submitted to queues of this name that have not run.
     std::size_t pending(std::string_view name) const;
 
@@ -52,7 +55,11 @@ private:
     ManualClock& clock_;
     std::deque<Ready> ready_;
     std::deque<Delayed> delayed_;
-    std::vector<std::string> made_;
+    struct Made {
+        std::string name;
+        platform::QueuePriority priority;
+    };
+    std::vector<Made> made_;
     std::shared_ptr<Queue> background_;
 };
 
