@@ -126,20 +126,19 @@ bool HYReportingServiceDelegate::shouldAcceptNewConnection(
             interrupted->handleConnectionError();
         }
     });
-    connection->setInvalidationHandler([weak] {
-        if (const auto invalidated = weak.lock()) {
+    connection->setInvalidationHandler([weak, pid] {
+        const auto invalidated = weak.lock();
+        if (invalidated != nullptr) {
             invalidated->handleConnectionError();
-            reportUptime(invalidated.get());
-        } else {
-            reportUptime(nullptr);
         }
+        reportUptime(pid, invalidated.get());
     });
     connection->resume();
     return true;
 }
 
-void HYReportingServiceDelegate::reportUptime(const HYReportingClientServerInstance* client) {
-    const std::int32_t pid = client != nullptr ? client->processIdentifier() : 0;
+void HYReportingServiceDelegate::reportUptime(std::int32_t pid,
+                                              const HYReportingClientServerInstance* client) {
     const auto name = client != nullptr ? client->clientProcessName() : std::nullopt;
     const std::string nameForLog = name.value_or("unknown");
     const double seconds = uptimeSeconds(

@@ -61,7 +61,8 @@ private:
 
     void listenForFeatureStateChanges();
     void featureChanged(int token);
-    static void reportUptime(const HYReportingClientServerInstance* client);
+    // The client may be gone already.
+    static void reportUptime(std::int32_t pid, const HYReportingClientServerInstance* client);
 
     std::shared_ptr<platform::SerialQueue> serviceQueue_;
     bool reportingEnabled_ = true;
