@@ -86,8 +86,6 @@ typedef struct halyard_error {
 #define HALYARD_ERROR_CLOSED 3
 /* The daemon answered with something else than this request's result. */
 #define HALYARD_ERROR_BAD_ANSWER 4
-/* Too many requests of this client are waiting for their answers. */
-#define HALYARD_ERROR_TOO_MANY 5
 
 /* ---- Vocabulary ------------------------------------------------------------- */
 
@@ -230,9 +228,9 @@ typedef struct halyard_options {
  * also when the daemon starts later. The caller owns the result. NULL with errno
  * set when there is no memory, no thread, or the path is too long.
  *
- * `socket_path` NULL: reporting.sock in $RUNTIME_DIRECTORY; else for root in
- * /run/halyard; else in $XDG_RUNTIME_DIR/halyard if that is set, in
- * /run/halyard if not. */
+ * `socket_path` NULL: reporting.sock is looked for, at each attempt, in
+ * $RUNTIME_DIRECTORY if that is set, in $XDG_RUNTIME_DIR/halyard if that is set
+ * and the process is not root's, and in /run/halyard. */
 HALYARD_EXPORT halyard_client* halyard_client_create(const char* socket_path);
 HALYARD_EXPORT halyard_client* halyard_client_create_with_options(const halyard_options* options);
 
