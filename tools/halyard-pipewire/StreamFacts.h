@@ -1,0 +1,43 @@
+// Rules that read a stream's properties: what it is, whose it is, and which
+// service it counts for. Pure functions, from any thread.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+
+#include "GraphEvents.h"
+
+namespace halyard::pipewire {
+
+enum class Direction : std::uint8_t { Playback, Capture };
+
+// Which streams report: playback and capture streams of applications. Not level
+// meters, nor the ends of loopbacks and filters, whose sound comes from streams
+// that report already. Nullopt for those and for everything that is no stream.
+[[nodiscard]] std::optional<Direction> reportedDirection(const Properties& node);
+
+// A device, or what stands for one: something that streams are linked to.
+[[nodiscard]] bool isDevice(const Properties& node);
+
+// The service type (as the daemon numbers them) of a stream by its media role.
+[[nodiscard]] std::uint16_t serviceTypeOf(const Properties& node, Direction direction);
+
+// What to call the application. `client` is the stream's client, empty if
+// unknown. "Unknown" when nobody gives a name.
+[[nodiscard]] std::string applicationName(const Properties& node, const Properties& client);
+
+// The program's file name; empty when unknown.
+[[nodiscard]] std::string processName(const Properties& node, const Properties& client);
+
+// The application's process, not that of a server that speaks for it.
+[[nodiscard]] std::optional<std::int64_t> processId(const Properties& node,
+                                                    const Properties& client);
+
+// The volume as sliders show it, 0 to 1, of what multiplies samples.
+[[nodiscard]] double perceivedVolume(float linearVolume);
+
+// Empty when absent.
+[[nodiscard]] std::string property(const Properties& properties, std::string_view key);
+
+} // namespace halyard::pipewire

@@ -1,0 +1,116 @@
+#include "StreamFacts.h"
+
+#include <gtest/gtest.h>
+#include <limits>
+
+#include "halyard/halyard.h"
+
+namespace halyard::pipewire {
+namespace {
+
+std::uint16_t playbackService(const char* role) {
+    return serviceTypeOf({{"media.role", role}}, Direction::Playback);
+}
+
+TEST(StreamFactsTest, PlaybackAndCaptureStreamsReport) {
+    EXPECT_EQ(reportedDirection({{"media.class", "Stream/Output/Audio"}}), Direction::Playback);
+    EXPECT_EQ(reportedDirection({{"media.class", "Stream/Input/Audio"}}), Direction::Capture);
+}
+
+TEST(StreamFactsTest, DevicesVideoAndMidiDoNotReport) {
+    EXPECT_EQ(reportedDirection({{"media.class", "Audio/Sink"}}), std::nullopt);
+    EXPECT_EQ(reportedDirection({{"media.class", "Stream/Input/Video"}}), std::nullopt);
+    EXPECT_EQ(reportedDirection({{"media.class", "Midi/Bridge"}}), std::nullopt);
+    EXPECT_EQ(reportedDirection({}), std::nullopt);
+}
+
+TEST(StreamFactsTest, LevelMetersDoNotReport) {
+    EXPECT_EQ(
+        reportedDirection({{"media.class", "Stream/Input/Audio"}, {"stream.monitor", "true"}}),
+        std::nullopt);
+}
+
+TEST(StreamFactsTest, EndsOfLoopbacksDoNotReport) {
+    EXPECT_EQ(
+        reportedDirection({{"media.class", "Stream/Output/Audio"}, {"node.link-group", "loop-1"}}),
+        std::nullopt);
+}
+
+TEST(StreamFactsTest, SinksSourcesAndTheirVirtualKindsAreDevices) {
+    EXPECT_TRUE(isDevice({{"media.class", "Audio/Sink"}}));
+    EXPECT_TRUE(isDevice({{"media.class", "Audio/Source/Virtual"}}));
+    EXPECT_FALSE(isDevice({{"media.class", "Stream/Output/Audio"}}));
+    EXPECT_FALSE(isDevice({}));
+}
+
+TEST(StreamFactsTest, RolesOfPlaybackMapToServices) {
+    EXPECT_EQ(playbackService("Music"), HALYARD_SERVICE_LONG_FORM_AUDIO);
+    EXPECT_EQ(playbackService("Movie"), HALYARD_SERVICE_LONG_FORM_AUDIO);
+    EXPECT_EQ(playbackService("Notification"), HALYARD_SERVICE_ALERTS);
+    EXPECT_EQ(playbackService("Communication"), HALYARD_SERVICE_TELEPHONY);
+    EXPECT_EQ(playbackService("Event"), HALYARD_SERVICE_SYSTEM_SOUNDS);
+    EXPECT_EQ(playbackService("Game"), HALYARD_SERVICE_NON_LONG_FORM_AUDIO);
+    EXPECT_EQ(playbackService("Alarm"), HALYARD_SERVICE_ALARMS);
+    EXPECT_EQ(playbackService("Test"), HALYARD_SERVICE_TEST);
+}
+
+TEST(StreamFactsTest, RolesAreComparedWithoutRegardToCase) {
+    EXPECT_EQ(playbackService("music"), HALYARD_SERVICE_LONG_FORM_AUDIO);
+    EXPECT_EQ(playbackService("PHONE"), HALYARD_SERVICE_TELEPHONY);
+}
+
+TEST(StreamFactsTest, UnknownAndAbsentRolesAreGeneric) {
+    EXPECT_EQ(playbackService("Production"), HALYARD_SERVICE_GENERIC);
+    EXPECT_EQ(playbackService("Musi"), HALYARD_SERVICE_GENERIC);
+    EXPECT_EQ(serviceTypeOf({}, Direction::Playback), HALYARD_SERVICE_GENERIC);
+}
+
+TEST(StreamFactsTest, AThemedEventWithoutARoleIsASystemSound) {
+    EXPECT_EQ(serviceTypeOf({{"event.id", "bell"}}, Direction::Playback),
+              HALYARD_SERVICE_SYSTEM_SOUNDS);
+}
+
+TEST(StreamFactsTest, CaptureIsGenericUnlessTwoSpeak) {
+    EXPECT_EQ(serviceTypeOf({{"media.role", "Music"}}, Direction::Capture),
+              HALYARD_SERVICE_GENERIC);
+    EXPECT_EQ(serviceTypeOf({{"media.role", "Communication"}}, Direction::Capture),
+              HALYARD_SERVICE_TELEPHONY);
+}
+
+TEST(StreamFactsTest, TheNodesApplicationNameComesFirst) {
+    const Properties node = {{"application.name", "Player"}, {"node.name", "pw-play"}};
+    EXPECT_EQ(applicationName(node, {{"application.name", "client"}}), "Player");
+}
+
+TEST(StreamFactsTest, TheApplicationNameFallsBackStepByStep) {
+    const Properties node = {{"application.process.binary", "bin"}, {"node.name", "node"}};
+    EXPECT_EQ(applicationName(node, {{"application.name", "client"}}), "client");
+    EXPECT_EQ(applicationName(node, {}), "bin");
+    EXPECT_EQ(applicationName({{"node.name", "node"}}, {}), "node");
+    EXPECT_EQ(applicationName({{"application.name", ""}}, {}), "Unknown");
+}
+
+TEST(StreamFactsTest, TheProcessIsTheApplicationsOwn) {
+    const Properties server = {{"application.process.id", "7"}, {"pipewire.sec.pid", "7"}};
+    EXPECT_EQ(processId({{"application.process.id", "42"}}, server), 42);
+    EXPECT_EQ(processId({}, server), 7);
+    EXPECT_EQ(processId({}, {{"pipewire.sec.pid", "7"}}), std::nullopt);
+}
+
+TEST(StreamFactsTest, AProcessIdThatIsNoNumberIsNone) {
+    EXPECT_EQ(processId({{"application.process.id", "12x"}}, {}), std::nullopt);
+    EXPECT_EQ(processId({{"application.process.id", "-3"}}, {}), std::nullopt);
+    EXPECT_EQ(processId({{"application.process.id", "99999999999999999999"}}, {}), std::nullopt);
+}
+
+TEST(StreamFactsTest, VolumesAreTheCubeRootWithinZeroAndOne) {
+    EXPECT_DOUBLE_EQ(perceivedVolume(0.064F), 0.4);
+    EXPECT_DOUBLE_EQ(perceivedVolume(0), 0);
+    EXPECT_DOUBLE_EQ(perceivedVolume(1), 1);
+    EXPECT_DOUBLE_EQ(perceivedVolume(3.375F), 1);
+    EXPECT_DOUBLE_EQ(perceivedVolume(-1), 0);
+    EXPECT_DOUBLE_EQ(perceivedVolume(std::numeric_limits<float>::quiet_NaN()), 0);
+}
+
+} // namespace
+} // namespace halyard::pipewire

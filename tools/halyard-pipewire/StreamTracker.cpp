@@ -1,0 +1,324 @@
+#include "StreamTracker.h"
+
+#include <algorithm>
+#include <charconv>
+#include <utility>
+
+#include "halyard/halyard.h"
+
+namespace halyard::pipewire {
+
+namespace {
+
+constexpr std::string_view kFormat = "session_selected_format";
+constexpr std::string_view kActiveDevices = "active_devices";
+constexpr std::string_view kPreviousDevices = "previous_devices";
+constexpr std::string_view kVolume = "VQSessionVolume";
+constexpr std::string_view kPlayingState = "VQSessionVolumePlayingState";
+constexpr std::string_view kVolumeProcess = "VQSessionVolumeOperationProcess";
+// Counts a session's runs, so that the second start is no repeat of the first.
+constexpr std::string_view kRun = "stream_run";
+
+List listOf(const std::set<std::string>& names) {
+    List list;
+    for (const std::string& name : names) {
+        list.append(name);
+    }
+    return list;
+}
+
+void setText(Dictionary& dictionary, std::string_view key, const std::string& text) {
+    if (!text.empty()) {
+        dictionary.set(key, text);
+    }
+}
+
+std::uint32_t categoryOf(Direction direction) {
+    return direction == Direction::Playback ? HALYARD_CATEGORY_PLAYBACK : HALYARD_CATEGORY_RECORD;
+}
+
+// Facts that help to tell streams apart, and none that tell what is listened
+// to: titles and file names stay here.
+Dictionary configurationOf(const Properties& node, const Properties& client, Direction direction) {
+    Dictionary configuration;
+    configuration.set("HostApplicationDisplayID", applicationName(node, client));
+    if (const auto pid = processId(node, client)) {
+        configuration.set("application_pid", *pid);
+    }
+    setText(configuration, "application_binary", processName(node, client));
+    setText(configuration, "media_role", property(node, "media.role"));
+    setText(configuration, "node_name", property(node, "node.name"));
+    configuration.set("stream_direction",
+                      direction == Direction::Playback ? "playback" : "capture");
+    return configuration;
+}
+
+} // namespace
+
+StreamTracker::StreamTracker(SessionSink& sink, std::int64_t firstReporterID)
+    : sink_(sink), nextReporterID_(firstReporterID) {}
+
+void StreamTracker::handle(const GraphEvent& event) {
+    std::visit([this](const auto& what) { on(what); }, event);
+}
+
+std::size_t StreamTracker::openSessions() const {
+    const auto open = std::count_if(nodes_.begin(), nodes_.end(), [](const auto& entry) {
+        return entry.second.session.has_value();
+    });
+    return static_cast<std::size_t>(open);
+}
+
+void StreamTracker::restate() {
+    for (auto& [id, node] : nodes_) {
+        if (!node.session || !node.session->playing) {
+            continue;
+        }
+        tellStart(*node.session, *node.direction);
+        if (const auto volume = std::exchange(node.session->toldVolume, std::nullopt)) {
+            tellVolume(*node.session, *volume, true);
+        }
+    }
+}
+
+void StreamTracker::closeAll() {
+    for (auto& [id, node] : nodes_) {
+        close(node);
+    }
+}
+
+// ---- The picture of the graph
+
+template <class Map> bool StreamTracker::hasRoom(const Map& map, ObjectId id) {
+    if (map.size() < kMaxObjects || map.contains(id)) {
+        return true;
+    }
+    ++ignoredObjects_;
+    return false;
+}
+
+StreamTracker::Node* StreamTracker::find(ObjectId id) {
+    const auto found = nodes_.find(id);
+    return found == nodes_.end() ? nullptr : &found->second;
+}
+
+void StreamTracker::on(const ClientChanged& event) {
+    if (hasRoom(clients_, event.id)) {
+        clients_[event.id] = event.properties;
+    }
+}
+
+void StreamTracker::on(const NodeChanged& event) {
+    if (!hasRoom(nodes_, event.id)) {
+        return;
+    }
+    Node& node = nodes_[event.id];
+    node.properties = event.properties;
+    node.device = isDevice(node.properties);
+    // A session goes on as what it began.
+    if (!node.session) {
+        node.direction = reportedDirection(node.properties);
+    }
+}
+
+void StreamTracker::on(const NodeStateChanged& event) {
+    if (Node* const node = find(event.id)) {
+        node->running = event.state == NodeState::Running;
+        node->ranSinceLook = node->ranSinceLook || node->running;
+    }
+}
+
+void StreamTracker::on(const NodeVolumeChanged& event) {
+    if (Node* const node = find(event.id)) {
+        node->volume = event.muted ? 0 : event.linearVolume;
+    }
+}
+
+void StreamTracker::on(const NodeFormatChanged& event) {
+    if (Node* const node = find(event.id)) {
+        node->format = event.format;
+    }
+}
+
+void StreamTracker::on(const LinkAdded& event) {
+    if (hasRoom(links_, event.id)) {
+        links_[event.id] = event;
+    }
+}
+
+void StreamTracker::on(const ObjectRemoved& event) {
+    if (Node* const node = find(event.id)) {
+        close(*node);
+        nodes_.erase(event.id);
+    }
+    links_.erase(event.id);
+    clients_.erase(event.id);
+}
+
+void StreamTracker::on(const Disconnected&) {
+    closeAll();
+    nodes_.clear();
+    links_.clear();
+    clients_.clear();
+}
+
+void StreamTracker::addToRoute(std::map<ObjectId, Route>& routes, ObjectId stream,
+                               ObjectId device) const {
+    const auto from = nodes_.find(stream);
+    const auto to = nodes_.find(device);
+    if (from == nodes_.end() || to == nodes_.end() || !from->second.direction ||
+        !to->second.device) {
+        return;
+    }
+    Route& route = routes[stream];
+    route.devices.insert(property(to->second.properties, "node.name"));
+    route.volume = std::max(route.volume, to->second.volume);
+}
+
+std::map<ObjectId, StreamTracker::Route> StreamTracker::routes() const {
+    std::map<ObjectId, Route> result;
+    for (const auto& [id, link] : links_) {
+        addToRoute(result, link.outputNode, link.inputNode);
+        addToRoute(result, link.inputNode, link.outputNode);
+    }
+    return result;
+}
+
+// ---- What comes of looking at it
+
+void StreamTracker::on(const Settled&) {
+    const std::map<ObjectId, Route> all = routes();
+    for (auto& [id, node] : nodes_) {
+        if (node.direction) {
+            const auto found = all.find(id);
+            look(node, found == all.end() ? Route{} : found->second);
+        }
+    }
+}
+
+void StreamTracker::look(Node& stream, const Route& route) {
+    const bool ran = std::exchange(stream.ranSinceLook, false) || stream.running;
+    if (!stream.session && ran) {
+        open(stream);
+    }
+    if (!stream.session) {
+        return;
+    }
+    Session& session = *stream.session;
+    follow(session, stream, route);
+    const double volume = perceivedVolume(stream.volume * session.deviceVolume);
+    if (ran && !session.playing) {
+        session.playing = true;
+        ++session.run;
+        tellStart(session, *stream.direction);
+    }
+    // Also for a stream that is over already: it played at this volume.
+    if (ran) {
+        tellVolume(session, volume, true);
+    }
+    if (!stream.running) {
+        tellVolume(session, volume, false);
+        if (session.playing) {
+            tellStop(session, *stream.direction);
+        }
+    }
+}
+
+void StreamTracker::open(Node& stream) {
+    static const Properties kNobody;
+    Properties client;
+    ObjectId clientId = 0;
+    const std::string text = property(stream.properties, "client.id");
+    const char* const end = text.data() + text.size();
+    if (std::from_chars(text.data(), end, clientId).ec == std::errc()) {
+        const auto found = clients_.find(clientId);
+        client = found == clients_.end() ? kNobody : found->second;
+    }
+    const Direction direction = *stream.direction;
+    Session& session = stream.session.emplace();
+    session.reporterID = nextReporterID_++;
+    session.operationProcess = processName(stream.properties, client);
+    if (session.operationProcess.empty()) {
+        session.operationProcess = applicationName(stream.properties, client);
+    }
+    sink_.open(session.reporterID, serviceTypeOf(stream.properties, direction),
+               configurationOf(stream.properties, client, direction));
+}
+
+void StreamTracker::close(Node& stream) {
+    if (!stream.direction) {
+        return;
+    }
+    stream.running = false;
+    look(stream, Route{});
+    if (stream.session) {
+        sink_.close(stream.session->reporterID);
+        stream.session.reset();
+    }
+}
+
+// A stretch of playback belongs to one device and one format, so a change of
+// either ends it before the change is told. Links and format vanish before a
+// stream does; what they were last stays.
+void StreamTracker::follow(Session& session, const Node& stream, const Route& route) {
+    const bool rerouted = !route.devices.empty() && route.devices != session.devices;
+    const bool reformatted = !stream.format.empty() && stream.format != session.format;
+    const bool endsStretch =
+        (rerouted && !session.devices.empty()) || (reformatted && !session.format.empty());
+    if (endsStretch && session.playing && session.toldVolume) {
+        tellVolume(session, *session.toldVolume, false);
+    }
+    if (reformatted) {
+        session.format = stream.format;
+    }
+    if (!route.devices.empty()) {
+        session.deviceVolume = route.volume;
+    }
+    if (rerouted) {
+        const std::set<std::string> previous = std::exchange(session.devices, route.devices);
+        if (!previous.empty()) {
+            tellRoute(session, previous);
+        }
+    }
+}
+
+void StreamTracker::addContext(const Session& session, Dictionary& contents) const {
+    setText(contents, kFormat, session.format);
+    if (!session.devices.empty()) {
+        contents.set(kActiveDevices, listOf(session.devices));
+    }
+}
+
+void StreamTracker::tellStart(Session& session, Direction direction) {
+    Dictionary contents{{kRun, session.run}};
+    addContext(session, contents);
+    sink_.send(session.reporterID, {categoryOf(direction), HALYARD_TYPE_START, contents});
+}
+
+void StreamTracker::tellStop(Session& session, Direction direction) {
+    session.playing = false;
+    sink_.send(session.reporterID,
+               {categoryOf(direction), HALYARD_TYPE_STOP, Dictionary{{kRun, session.run}}});
+}
+
+void StreamTracker::tellRoute(Session& session, const std::set<std::string>& previous) {
+    Dictionary contents{{kPreviousDevices, listOf(previous)}};
+    addContext(session, contents);
+    sink_.send(session.reporterID,
+               {HALYARD_CATEGORY_ROUTE_CHANGE, HALYARD_TYPE_ACTIVATE, contents});
+}
+
+void StreamTracker::tellVolume(Session& session, double volume, bool playing) {
+    if (session.toldVolume == volume && session.toldPlaying == playing) {
+        return;
+    }
+    session.toldVolume = volume;
+    session.toldPlaying = playing;
+    Dictionary contents{{kVolume, volume},
+                        {kPlayingState, playing ? 1 : 0},
+                        {kVolumeProcess, session.operationProcess}};
+    addContext(session, contents);
+    sink_.send(session.reporterID, {HALYARD_CATEGORY_VOLUME, HALYARD_TYPE_ACTIVATE, contents});
+}
+
+} // namespace halyard::pipewire

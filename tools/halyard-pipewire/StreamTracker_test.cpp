@@ -1,0 +1,396 @@
+#include "StreamTracker.h"
+
+#include <gtest/gtest.h>
+#include <string>
+#include <vector>
+
+#include "common/Description.h"
+#include "halyard/halyard.h"
+
+namespace halyard::pipewire {
+namespace {
+
+constexpr std::int64_t kFirstID = 1000;
+constexpr ObjectId kClient = 5;
+constexpr ObjectId kSpeaker = 10;
+constexpr ObjectId kHeadphones = 11;
+constexpr ObjectId kStream = 20;
+
+// Writes down what the tracker does: "open 1000 7", "Volume 0.4 playing", ...
+class ScriptSink final : public SessionSink {
+public:
+    void open(std::int64_t id, std::uint16_t service, const Dictionary& configuration) override {
+        lines.push_back("open " + std::to_string(id) + " " + std::to_string(service));
+        configurations.push_back(configuration);
+    }
+    void send(std::int64_t, const Message& message) override {
+        lines.push_back(textOf(message));
+        messages.push_back(message);
+    }
+    void close(std::int64_t id) override { lines.push_back("close " + std::to_string(id)); }
+
+    std::vector<std::string> takeLines() { return std::exchange(lines, {}); }
+    const Message& last() const { return messages.back(); }
+
+    std::vector<std::string> lines;
+    std::vector<Dictionary> configurations;
+    std::vector<Message> messages;
+
+private:
+    static std::string textOf(const Message& message) {
+        switch (message.category) {
+        case HALYARD_CATEGORY_VOLUME:
+            return "volume " + describe(message.contents["VQSessionVolume"]) +
+                   (message.contents["VQSessionVolumePlayingState"].boolValue() ? " playing"
+                                                                                : " silent");
+        case HALYARD_CATEGORY_ROUTE_CHANGE:
+            return "route " + devices(message);
+        default:
+            return (message.category == HALYARD_CATEGORY_RECORD ? "record " : "playback ") +
+                   std::string(message.type == HALYARD_TYPE_START ? "start" : "stop");
+        }
+    }
+    static std::string devices(const Message& message) {
+        std::string text;
+        for (const Value& name : message.contents["active_devices"].list()) {
+            text += (text.empty() ? "" : "+") + std::string(name.text());
+        }
+        return text;
+    }
+};
+
+using Lines = std::vector<std::string>;
+
+class StreamTrackerTest : public testing::Test {
+protected:
+    StreamTrackerTest() {
+        device(kSpeaker, "out.speaker");
+        device(kHeadphones, "out.headphones");
+        tracker_.handle(ClientChanged{
+            kClient, {{"application.name", "Player"}, {"application.process.id", "42"}}});
+    }
+
+    void device(ObjectId id, const char* name) {
+        tracker_.handle(NodeChanged{id, {{"media.class", "Audio/Sink"}, {"node.name", name}}});
+    }
+    void stream(ObjectId id = kStream, const char* mediaClass = "Stream/Output/Audio") {
+        tracker_.handle(NodeChanged{id,
+                                    {{"media.class", mediaClass},
+                                     {"media.role", "Music"},
+                                     {"node.name", "pw-play"},
+                                     {"client.id", std::to_string(kClient)}}});
+    }
+    void state(NodeState state, ObjectId id = kStream) {
+        tracker_.handle(NodeStateChanged{id, state});
+    }
+    void volume(float linear, bool muted = false, ObjectId id = kStream) {
+        tracker_.handle(NodeVolumeChanged{id, linear, muted});
+    }
+    void format(const char* text) { tracker_.handle(NodeFormatChanged{kStream, text}); }
+    void link(ObjectId id, ObjectId from, ObjectId to) { tracker_.handle(LinkAdded{id, from, to}); }
+    void remove(ObjectId id) { tracker_.handle(ObjectRemoved{id}); }
+    void settle() { tracker_.handle(Settled{}); }
+
+    // A stream that plays to the speaker at full volume; forgets how it began.
+    void play() {
+        stream();
+        format("F32LE 2ch 48000Hz");
+        link(30, kStream, kSpeaker);
+        link(31, kStream, kSpeaker);
+        state(NodeState::Running);
+        settle();
+        sink_.takeLines();
+    }
+
+    ScriptSink sink_;
+    StreamTracker tracker_{sink_, kFirstID};
+};
+
+TEST_F(StreamTrackerTest, AStreamThatHasNotRunHasNoSession) {
+    stream();
+    settle();
+    remove(kStream);
+    EXPECT_TRUE(sink_.lines.empty());
+}
+
+TEST_F(StreamTrackerTest, TheFirstRunOpensTheSession) {
+    stream();
+    state(NodeState::Running);
+    settle();
+    EXPECT_EQ(sink_.takeLines(), (Lines{"open 1000 7", "playback start", "volume 1 playing"}));
+    EXPECT_EQ(tracker_.openSessions(), 1U);
+}
+
+TEST_F(StreamTrackerTest, NothingIsSaidBeforeTheBurstHasSettled) {
+    stream();
+    state(NodeState::Running);
+    EXPECT_TRUE(sink_.lines.empty());
+}
+
+TEST_F(StreamTrackerTest, TheConfigurationNamesTheApplication) {
+    stream();
+    state(NodeState::Running);
+    settle();
+    const Dictionary expected{{"HostApplicationDisplayID", "Player"},
+                              {"application_pid", 42},
+                              {"media_role", "Music"},
+                              {"node_name", "pw-play"},
+                              {"stream_direction", "playback"}};
+    ASSERT_EQ(sink_.configurations.size(), 1U);
+    EXPECT_EQ(sink_.configurations.front(), expected);
+}
+
+TEST_F(StreamTrackerTest, ACaptureStreamRecords) {
+    stream(kStream, "Stream/Input/Audio");
+    link(30, kSpeaker, kStream);
+    state(NodeState::Running);
+    settle();
+    EXPECT_EQ(sink_.takeLines(), (Lines{"open 1000 0", "record start", "volume 1 playing"}));
+    EXPECT_EQ(sink_.last().contents["active_devices"], Value(List{"out.speaker"}));
+}
+
+TEST_F(StreamTrackerTest, AVolumeMessageCarriesWhatPlaysAndWhere) {
+    play();
+    volume(0.064F);
+    settle();
+    const Dictionary expected{{"VQSessionVolume", 0.4},
+                              {"VQSessionVolumePlayingState", 1},
+                              {"VQSessionVolumeOperationProcess", "Player"},
+                              {"session_selected_format", "F32LE 2ch 48000Hz"},
+                              {"active_devices", List{"out.speaker"}}};
+    EXPECT_EQ(sink_.last().contents, expected);
+}
+
+TEST_F(StreamTrackerTest, AnUnchangedVolumeIsToldOnce) {
+    play();
+    volume(1);
+    settle();
+    settle();
+    EXPECT_TRUE(sink_.lines.empty());
+}
+
+TEST_F(StreamTrackerTest, AMutedStreamPlaysAtVolumeZero) {
+    play();
+    volume(1, true);
+    settle();
+    volume(1, false);
+    settle();
+    EXPECT_EQ(sink_.takeLines(), (Lines{"volume 0 playing", "volume 1 playing"}));
+}
+
+TEST_F(StreamTrackerTest, TheDevicesVolumeCounts) {
+    play();
+    volume(0.125F);
+    volume(0.125F, false, kSpeaker);
+    settle();
+    EXPECT_EQ(sink_.takeLines(), (Lines{"volume 0.25 playing"}));
+}
+
+TEST_F(StreamTrackerTest, AMutedDeviceSilencesItsStreams) {
+    play();
+    volume(1, true, kSpeaker);
+    settle();
+    EXPECT_EQ(sink_.takeLines(), (Lines{"volume 0 playing"}));
+}
+
+TEST_F(StreamTrackerTest, OfSeveralDevicesTheLoudestCounts) {
+    volume(0.125F, false, kHeadphones);
+    play();
+    link(32, kStream, kHeadphones);
+    settle();
+    EXPECT_EQ(sink_.last().contents["VQSessionVolume"], Value(1.0));
+}
+
+TEST_F(StreamTrackerTest, APauseEndsTheStretchAndTheRun) {
+    play();
+    state(NodeState::Stopped);
+    settle();
+    EXPECT_EQ(sink_.takeLines(), (Lines{"volume 1 silent", "playback stop"}));
+}
+
+TEST_F(StreamTrackerTest, TheNextRunIsNoRepeatOfTheFirst) {
+    play();
+    const Message first = sink_.messages.front();
+    state(NodeState::Stopped);
+    settle();
+    sink_.takeLines();
+    state(NodeState::Running);
+    settle();
+    EXPECT_EQ(sink_.takeLines(), (Lines{"playback start", "volume 1 playing"}));
+    const Message& second = sink_.messages[sink_.messages.size() - 2];
+    EXPECT_EQ(first.contents["stream_run"], Value(1));
+    EXPECT_EQ(second.contents["stream_run"], Value(2));
+}
+
+TEST_F(StreamTrackerTest, AVolumeChangedInAPauseIsToldAsSilent) {
+    play();
+    state(NodeState::Stopped);
+    settle();
+    sink_.takeLines();
+    volume(0.125F);
+    settle();
+    EXPECT_EQ(sink_.takeLines(), (Lines{"volume 0.5 silent"}));
+}
+
+TEST_F(StreamTrackerTest, AStopWithinABurstIsNoStop) {
+    play();
+    state(NodeState::Stopped);
+    state(NodeState::Running);
+    settle();
+    EXPECT_TRUE(sink_.lines.empty());
+}
+
+TEST_F(StreamTrackerTest, ASoundShorterThanABurstIsToldWhole) {
+    stream();
+    state(NodeState::Running);
+    state(NodeState::Stopped);
+    settle();
+    EXPECT_EQ(sink_.takeLines(), (Lines{"open 1000 7", "playback start", "volume 1 playing",
+                                        "volume 1 silent", "playback stop"}));
+}
+
+TEST_F(StreamTrackerTest, ASoundGoneWithinABurstIsToldWhole) {
+    stream();
+    state(NodeState::Running);
+    remove(kStream);
+    EXPECT_EQ(sink_.takeLines(), (Lines{"open 1000 7", "playback start", "volume 1 playing",
+                                        "volume 1 silent", "playback stop", "close 1000"}));
+}
+
+TEST_F(StreamTrackerTest, AMoveEndsTheStretchBeforeTheRouteChanges) {
+    play();
+    remove(30);
+    remove(31);
+    link(32, kStream, kHeadphones);
+    settle();
+    EXPECT_EQ(sink_.takeLines(),
+              (Lines{"volume 1 silent", "route out.headphones", "volume 1 playing"}));
+    const Message& end = sink_.messages[sink_.messages.size() - 3];
+    const Message& route = sink_.messages[sink_.messages.size() - 2];
+    EXPECT_EQ(end.contents["active_devices"], Value(List{"out.speaker"}));
+    EXPECT_EQ(route.contents["previous_devices"], Value(List{"out.speaker"}));
+    EXPECT_EQ(sink_.last().contents["active_devices"], Value(List{"out.headphones"}));
+}
+
+TEST_F(StreamTrackerTest, AMoveWhilePausedChangesTheRouteAlone) {
+    play();
+    state(NodeState::Stopped);
+    settle();
+    sink_.takeLines();
+    remove(30);
+    remove(31);
+    settle();
+    link(32, kStream, kHeadphones);
+    settle();
+    EXPECT_EQ(sink_.takeLines(), (Lines{"route out.headphones"}));
+}
+
+TEST_F(StreamTrackerTest, LosingAllLinksIsNoRoute) {
+    play();
+    remove(30);
+    remove(31);
+    settle();
+    EXPECT_TRUE(sink_.lines.empty());
+}
+
+TEST_F(StreamTrackerTest, ANewFormatBeginsAStretch) {
+    play();
+    format("S16LE 2ch 44100Hz");
+    settle();
+    EXPECT_EQ(sink_.takeLines(), (Lines{"volume 1 silent", "volume 1 playing"}));
+    EXPECT_EQ(sink_.last().contents["session_selected_format"], Value("S16LE 2ch 44100Hz"));
+}
+
+TEST_F(StreamTrackerTest, TheLastMessagesStillKnowTheDeviceAndItsVolume) {
+    volume(0.125F, false, kSpeaker);
+    play();
+    remove(30);
+    remove(31);
+    format("");
+    state(NodeState::Stopped);
+    settle();
+    EXPECT_EQ(sink_.takeLines(), (Lines{"volume 0.5 silent", "playback stop"}));
+    const Message& end = sink_.messages[sink_.messages.size() - 2];
+    EXPECT_EQ(end.contents["active_devices"], Value(List{"out.speaker"}));
+    EXPECT_EQ(end.contents["session_selected_format"], Value("F32LE 2ch 48000Hz"));
+}
+
+TEST_F(StreamTrackerTest, AStreamThatGoesAwayClosesItsSession) {
+    play();
+    remove(kStream);
+    EXPECT_EQ(sink_.takeLines(), (Lines{"volume 1 silent", "playback stop", "close 1000"}));
+    EXPECT_EQ(tracker_.openSessions(), 0U);
+}
+
+TEST_F(StreamTrackerTest, ObjectNumbersThatComeAgainAreNewStreams) {
+    play();
+    remove(kStream);
+    sink_.takeLines();
+    stream();
+    state(NodeState::Running);
+    settle();
+    EXPECT_EQ(sink_.lines.front(), "open 1001 7");
+}
+
+TEST_F(StreamTrackerTest, EachStreamHasItsOwnSession) {
+    play();
+    stream(21);
+    state(NodeState::Running, 21);
+    settle();
+    remove(kStream);
+    EXPECT_EQ(sink_.takeLines(), (Lines{"open 1001 7", "playback start", "volume 1 playing",
+                                        "volume 1 silent", "playback stop", "close 1000"}));
+}
+
+TEST_F(StreamTrackerTest, ALostConnectionClosesEverySession) {
+    play();
+    tracker_.handle(Disconnected{});
+    EXPECT_EQ(sink_.takeLines(), (Lines{"volume 1 silent", "playback stop", "close 1000"}));
+    state(NodeState::Running);
+    settle();
+    EXPECT_TRUE(sink_.lines.empty());
+}
+
+TEST_F(StreamTrackerTest, RestatingSaysWhatPlays) {
+    play();
+    tracker_.restate();
+    EXPECT_EQ(sink_.takeLines(), (Lines{"playback start", "volume 1 playing"}));
+    EXPECT_EQ(sink_.messages[sink_.messages.size() - 2].contents["stream_run"], Value(1));
+}
+
+TEST_F(StreamTrackerTest, RestatingLeavesPausedStreamsAlone) {
+    play();
+    state(NodeState::Stopped);
+    settle();
+    sink_.takeLines();
+    tracker_.restate();
+    EXPECT_TRUE(sink_.lines.empty());
+}
+
+TEST_F(StreamTrackerTest, ClosingAllIsSaidOnce) {
+    play();
+    tracker_.closeAll();
+    EXPECT_EQ(sink_.takeLines(), (Lines{"volume 1 silent", "playback stop", "close 1000"}));
+    tracker_.closeAll();
+    EXPECT_TRUE(sink_.lines.empty());
+}
+
+TEST_F(StreamTrackerTest, ASessionGoesOnWhenItsNodeTurnsIntoSomethingElse) {
+    play();
+    tracker_.handle(NodeChanged{kStream, {{"media.class", "Stream/Output/Video"}}});
+    remove(kStream);
+    EXPECT_EQ(sink_.takeLines(), (Lines{"volume 1 silent", "playback stop", "close 1000"}));
+}
+
+TEST_F(StreamTrackerTest, ObjectsBeyondTheBoundAreIgnoredAndCounted) {
+    for (ObjectId id = 0; id < StreamTracker::kMaxObjects; ++id) {
+        link(id, 1, 2);
+    }
+    EXPECT_EQ(tracker_.ignoredObjects(), 0U);
+    link(100000, kStream, kSpeaker);
+    link(0, 1, 3);
+    EXPECT_EQ(tracker_.ignoredObjects(), 1U);
+}
+
+} // namespace
+} // namespace halyard::pipewire

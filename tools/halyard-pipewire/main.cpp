@@ -1,0 +1,202 @@
+// halyard-pipewire: one reporting session for each stream of a PipeWire daemon.
+
+#include <chrono>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <exception>
+#include <fmt/core.h>
+#include <getopt.h>
+#include <stdexcept>
+#include <string>
+
+#include "ClientSessions.h"
+#include "PipeWireAdapter.h"
+#include "StreamTracker.h"
+
+namespace {
+
+using namespace halyard::pipewire;
+namespace reporting = halyard::reporting;
+
+constexpr const char* kUsage =
+    R"(Usage: halyard-pipewire [OPTION]...
+Reports the playback and capture streams of a PipeWire daemon to halyardd.
+
+  -r, --remote=NAME   the PipeWire daemon to watch (its usual one)
+  -s, --socket=PATH   the socket of halyardd (its usual place)
+  -v, --verbose       say on standard error what is reported
+  -h, --help          show this help
+  -V, --version       show the version
+
+Waits for both daemons and finds them again after a restart. SIGTERM and SIGINT
+close the sessions and end it.
+)";
+
+struct Arguments {
+    std::string remote;
+    std::string socket;
+    bool verbose = false;
+    int exitStatus = -1; // set: nothing to run
+};
+
+Arguments parse(int argc, char** argv) {
+    static const option kOptions[] = {
+        {"remote", required_argument, nullptr, 'r'}, {"socket", required_argument, nullptr, 's'},
+        {"verbose", no_argument, nullptr, 'v'},      {"help", no_argument, nullptr, 'h'},
+        {"version", no_argument, nullptr, 'V'},      {}};
+    Arguments arguments;
+    for (int found = 0; (found = getopt_long(argc, argv, "r:s:vhV", kOptions, nullptr)) != -1;) {
+        switch (found) {
+        case 'r':
+            arguments.remote = optarg;
+            break;
+        case 's':
+            arguments.socket = optarg;
+            break;
+        case 'v':
+            arguments.verbose = true;
+            break;
+        case 'h':
+            fmt::print("{}", kUsage);
+            arguments.exitStatus = EXIT_SUCCESS;
+            return arguments;
+        case 'V':
+            fmt::print("halyard-pipewire {}\n", HALYARD_VERSION);
+            arguments.exitStatus = EXIT_SUCCESS;
+            return arguments;
+        default:
+            arguments.exitStatus = 2;
+            return arguments;
+        }
+    }
+    if (optind < argc) {
+        fmt::print(stderr, "halyard-pipewire: unexpected argument \"{}\"; see --help\n",
+                   argv[optind]);
+        arguments.exitStatus = 2;
+    }
+    return arguments;
+}
+
+void note(const std::string& text) {
+    fmt::print(stderr, "halyard-pipewire: {}\n", text);
+}
+
+// Hands everything on, and says so when asked.
+class NotingSink final : public SessionSink {
+public:
+    NotingSink(SessionSink& next, bool verbose) : next_(next), verbose_(verbose) {}
+
+    void open(std::int64_t id, std::uint16_t service,
+              const halyard::Dictionary& configuration) override {
+        if (verbose_) {
+            note(fmt::format("session {} (service type {}) for {}", id, service,
+                             configuration["HostApplicationDisplayID"].text()));
+        }
+        next_.open(id, service, configuration);
+    }
+    void send(std::int64_t id, const Message& message) override {
+        if (verbose_) {
+            note(fmt::format("session {}: category {}, type {}", id, message.category,
+                             message.type));
+        }
+        next_.send(id, message);
+    }
+    void close(std::int64_t id) override {
+        if (verbose_) {
+            note(fmt::format("session {} closed", id));
+        }
+        next_.close(id);
+    }
+
+private:
+    SessionSink& next_;
+    const bool verbose_;
+};
+
+// Positive, apart from what an earlier run gave out, and with room for 2^20
+// sessions before a run that began a millisecond later.
+std::int64_t firstReporterID() {
+    const auto now = std::chrono::system_clock::now().time_since_epoch();
+    return std::chrono::duration_cast<std::chrono::milliseconds>(now).count() << 20;
+}
+
+class Watcher final {
+public:
+    explicit Watcher(const Arguments& arguments)
+        : graph_({.remote = arguments.remote, .note = note},
+                 [this](const GraphEvent& event) { streams_.handle(event); }),
+          client_({.socketPath = arguments.socket.empty() ? nullptr : arguments.socket.c_str(),
+                   .connectionChanged = [this](bool connected) { post(connected); }}),
+          sessions_(client_), sink_(sessions_, arguments.verbose),
+          streams_(sink_, firstReporterID()) {
+        if (!client_) {
+            throw std::runtime_error("libhalyard gives no client: is the socket's path too long?");
+        }
+    }
+
+    void run() {
+        graph_.quitOnSignal(SIGTERM);
+        graph_.quitOnSignal(SIGINT);
+        graph_.run();
+        streams_.closeAll();
+        sayLosses();
+    }
+
+private:
+    // On libhalyard's thread.
+    void post(bool connected) {
+        graph_.post([this, connected] { connectionChanged(connected); });
+    }
+
+    // A daemon that comes back knows the sessions, libhalyard sees to that, but
+    // not that they play.
+    void connectionChanged(bool connected) {
+        note(connected ? "connected to halyardd" : "waiting for halyardd");
+        if (connected && wasLost_) {
+            streams_.restate();
+        }
+        wasLost_ = !connected;
+    }
+
+    void sayLosses() const {
+        if (sessions_.refused() + streams_.ignoredObjects() != 0) {
+            note(fmt::format("{} reports dropped, {} PipeWire objects ignored", sessions_.refused(),
+                             streams_.ignoredObjects()));
+        }
+    }
+
+    PipeWireAdapter graph_;
+    reporting::Client client_;
+    ClientSessions sessions_;
+    NotingSink sink_;
+    StreamTracker streams_;
+    bool wasLost_ = false;
+};
+
+// Before any thread starts: one that does not block them would take the signals
+// away from the loop, and end the process.
+void blockSignals() {
+    sigset_t signals;
+    sigemptyset(&signals);
+    sigaddset(&signals, SIGTERM);
+    sigaddset(&signals, SIGINT);
+    pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+}
+
+} // namespace
+
+int main(int argc, char** argv) {
+    const Arguments arguments = parse(argc, argv);
+    if (arguments.exitStatus != -1) {
+        return arguments.exitStatus;
+    }
+    blockSignals();
+    try {
+        Watcher(arguments).run();
+        return EXIT_SUCCESS;
+    } catch (const std::exception& error) {
+        note(error.what());
+        return EXIT_FAILURE;
+    }
+}
