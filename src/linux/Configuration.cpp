@@ -1,0 +1,105 @@
+#include "linux/Configuration.h"
+
+#include <utility>
+
+#include "linux/SmallFile.h"
+#include "platform/Log.h"
+
+namespace halyard::linux_ {
+namespace {
+
+bool isMissing(std::errc error) {
+    return error == std::errc::no_such_file_or_directory || error == std::errc::not_a_directory;
+}
+
+void logWarnings(const std::string& file, const ParsedSettings& parsed) {
+    for (const SettingsWarning& warning : parsed.warnings) {
+        HY_LOG_DEFAULT(HYReportingPlatformCategory, "{}:{}: {}", file, warning.line,
+                       warning.message);
+    }
+    if (parsed.warningsLeftOut > 0) {
+        HY_LOG_DEFAULT(HYReportingPlatformCategory, "{}: {} more warnings", file,
+                       parsed.warningsLeftOut);
+    }
+}
+
+} // namespace
+
+Configuration::Configuration(const std::filesystem::path& directory)
+    : file_(directory / kFileName), settings_(std::make_shared<const Settings>()) {}
+
+std::shared_ptr<const Settings> Configuration::settings() const {
+    const MutexLock lock(mutex_);
+    return settings_;
+}
+
+Configuration::Outcome Configuration::reload() {
+    const MutexLock lock(reloading_);
+    auto text = readSmallFile(file_, kMaxFileBytes);
+    if (const auto* const error = std::get_if<std::errc>(&text)) {
+        if (!isMissing(*error)) {
+            return refuse({file_, 0, 0, std::make_error_code(*error).message()});
+        }
+        return putInForce(Settings());
+    }
+    auto parsed = parseSettings(std::get<std::string>(text), file_.native());
+    if (const auto* const error = std::get_if<SettingsError>(&parsed)) {
+        return refuse(*error);
+    }
+    logWarnings(file_, std::get<ParsedSettings>(parsed));
+    return putInForce(std::get<ParsedSettings>(std::move(parsed)).settings);
+}
+
+Configuration::Outcome Configuration::refuse(const SettingsError& error) {
+    HY_LOG_ERROR(HYReportingPlatformCategory, "{}:{}:{}: {}; {} in force", error.file, error.line,
+                 error.column, error.message,
+                 taken_ ? "the last good configuration stays" : "the defaults are");
+    return Outcome::Refused;
+}
+
+Configuration::Outcome Configuration::putInForce(Settings settings) {
+    taken_ = true;
+    const std::shared_ptr<const Settings> before = this->settings();
+    if (*before == settings) {
+        return Outcome::Unchanged;
+    }
+    const auto after = std::make_shared<const Settings>(std::move(settings));
+    {
+        const MutexLock lock(mutex_);
+        settings_ = after;
+    }
+    HY_LOG_INFO(HYReportingPlatformCategory, "configuration of {} is in force", file_.native());
+    for (const Observer& observer : observers_) {
+        observer(*before, *after);
+    }
+    return Outcome::Changed;
+}
+
+void Configuration::observe(Observer observer) {
+    const MutexLock lock(reloading_);
+    observers_.push_back(std::move(observer));
+}
+
+Value Configuration::value(std::string_view key, std::string_view domain) const {
+    const std::shared_ptr<const Settings> now = settings();
+    const auto found = now->preferences.find(domain);
+    return found == now->preferences.end() ? Value() : found->second[key];
+}
+
+bool Configuration::isEnabled(std::string_view domain, std::string_view flag) const {
+    const std::shared_ptr<const Settings> now = settings();
+    const auto flags = now->featureFlags.find(domain);
+    if (flags == now->featureFlags.end()) {
+        return false;
+    }
+    const auto found = flags->second.find(flag);
+    return found != flags->second.end() && found->second;
+}
+
+std::optional<bool> Configuration::boolean(std::string_view name) const {
+    const std::shared_ptr<const Settings> now = settings();
+    const auto found = now->deviceProperties.find(name);
+    return found == now->deviceProperties.end() ? std::nullopt : std::optional(found->second);
+}
+
+} // namespace halyard::linux_

@@ -1,0 +1,18 @@
+// Reads files that are known to be small: configuration, procfs.
+#pragma once
+
+#include <cstddef>
+#include <filesystem>
+#include <string>
+#include <system_error>
+#include <variant>
+
+namespace halyard::linux_ {
+
+// The whole of a regular file. file_too_large when it has more than `most`
+// bytes, invalid_argument when it is none; never waits, whatever `path` is. Any
+// thread.
+[[nodiscard]] std::variant<std::string, std::errc> readSmallFile(const std::filesystem::path& path,
+                                                                 std::size_t most);
+
+} // namespace halyard::linux_

@@ -1,0 +1,44 @@
+#include "linux/SmallFile.h"
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include "testing/TempTree.h"
+
+namespace halyard::linux_ {
+namespace {
+
+using Result = std::variant<std::string, std::errc>;
+
+TEST(SmallFileTest, ReadsAWholeFile) {
+    const testing::TempTree tree;
+    const std::string text(10000, 'x');
+
+    EXPECT_EQ(readSmallFile(tree.write("f", text), 10000), Result(text));
+    EXPECT_EQ(readSmallFile(tree.write("f", ""), 0), Result(std::string()));
+}
+
+TEST(SmallFileTest, RefusesAByteMoreThanTheBound) {
+    const testing::TempTree tree;
+
+    EXPECT_EQ(readSmallFile(tree.write("f", "1234"), 4), Result(std::string("1234")));
+    EXPECT_EQ(readSmallFile(tree.write("f", "12345"), 4), Result(std::errc::file_too_large));
+}
+
+TEST(SmallFileTest, ReadsFilesThatDoNotTellTheirSize) {
+    EXPECT_EQ(readSmallFile("/proc/sys/kernel/ostype", 100), Result(std::string("Linux\n")));
+}
+
+TEST(SmallFileTest, TellsWhyThereIsNoText) {
+    const testing::TempTree tree;
+    tree.write("file", "");
+    ASSERT_EQ(::mkfifo((tree / "pipe").c_str(), 0600), 0);
+
+    EXPECT_EQ(readSmallFile(tree / "none", 9), Result(std::errc::no_such_file_or_directory));
+    EXPECT_EQ(readSmallFile(tree / "file/x", 9), Result(std::errc::not_a_directory));
+    EXPECT_EQ(readSmallFile(tree.path(), 9), Result(std::errc::is_a_directory));
+    EXPECT_EQ(readSmallFile(tree / "pipe", 9), Result(std::errc::invalid_argument));
+}
+
+} // namespace
+} // namespace halyard::linux_
