@@ -249,9 +249,10 @@ void SettingsReader::readSection(const toml::node& node, const std::string& name
         return;
     }
     for (const auto& [key, element] : *section) {
-        const std::string path = join(name, key.str());
+        const std::string_view keyName = key.str();
+        const std::string path = join(name, keyName);
         const auto known = std::find_if(keys.begin(), keys.end(),
-                                        [&](const Key& each) { return each.name == key.str(); });
+                                        [&](const Key& each) { return each.name == keyName; });
         if (known == keys.end()) {
             warn(key.source(), fmt::format("unknown key {} has no effect", path));
         } else {
