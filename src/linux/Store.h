@@ -1,0 +1,80 @@
+// The store: telemetry.db in the state directory, behind the upload framework,
+// the analytics service, the energy ledger, the metric service and the incident
+// reporter.
+//
+// Adding a row costs the caller a reference and a short lock; everything else
+// happens on the store's own thread, which writes rows in the order in which
+// they were added and commits them in groups. While nothing can be written the
+// daemon goes on: see StoreQueue for what is kept and StoreStatus for what was
+// not.
+//
+// Any thread. docs/store.md describes the file.
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <string>
+#include <string_view>
+#include <thread>
+
+#include "linux/StoreWriter.h"
+
+namespace halyard::linux_ {
+
+struct StoreEnding;
+
+class Store final {
+public:
+    // Opens or creates the file, which may take a moment when it is damaged.
+    // Borrows `clock`, which must outlive the store's thread (see close()).
+    Store(StoreOptions options, const platform::Clock& clock);
+    ~Store();
+    Store(const Store&) = delete;
+    Store& operator=(const Store&) = delete;
+
+    // False when the store cannot be opened at all; it stays so. Everything that
+    // is added is counted as lost then.
+    bool isOpen() const { return open_; }
+
+    // Writes the session's row. Never null.
+    StoreUploadPtr openUpload(std::int64_t sessionID, const Dictionary& sessionInfo,
+                              const Dictionary& userInfo);
+    // Requires that nothing more is added to it.
+    void closeUpload(const StoreUploadPtr& upload);
+
+    // False when the row was dropped, which happens only while nothing can be
+    // written.
+    [[nodiscard]] bool addMessage(const StoreUploadPtr& upload, std::uint16_t category,
+                                  std::uint32_t type, const Dictionary& payload);
+    [[nodiscard]] bool addSingleMessage(const Dictionary& sessionInfo, const Dictionary& userInfo,
+                                        std::uint16_t category, std::uint32_t type,
+                                        const Dictionary& payload);
+    // `builder` is called once at most: on the store's thread, or at once while
+    // rows pile up, so that their size is known.
+    bool addAnalyticsEvent(const Value& name, std::function<Dictionary()> builder);
+    bool addEnergyEvent(std::uint32_t client, std::string_view name, const Dictionary& payload);
+    bool addMetric(std::uint32_t metricID, std::string message);
+    // `report` is a path or a text.
+    bool addIncident(const Dictionary& signature, std::string_view report);
+
+    // Calls `done` once every row added before is committed or counted as lost: on
+    // the store's thread, or at once when nothing is waiting.
+    void flush(std::function<void()> done) { writer_->queue().flush(std::move(done)); }
+
+    void setLimits(StoreLimits limits) { writer_->setLimits(limits); }
+    StoreStatus status() const { return writer_->status(); }
+
+    // Writes what is waiting, moves the write-ahead log into the file and closes
+    // it. False when that did not end within the limit: the thread is left behind
+    // then, and the process should end without tearing anything down.
+    bool close();
+
+private:
+    const std::shared_ptr<StoreEnding> ending_;
+    const std::shared_ptr<StoreWriter> writer_;
+    bool open_ = false;
+    std::thread writing_;
+    std::thread watching_;
+};
+
+} // namespace halyard::linux_

@@ -1,0 +1,221 @@
+#include "linux/StoreQueue.h"
+
+#include <algorithm>
+#include <iterator>
+#include <utility>
+
+namespace halyard::linux_ {
+namespace {
+
+// Rows' worth of room that the queue keeps for its next burst.
+constexpr std::size_t kKeptCapacity = 8192;
+
+} // namespace
+
+StoreQueue::StoreQueue(Marks marks, std::size_t groupRows, PressureHandler onPressure)
+    : marks_(marks), groupRows_(groupRows), onPressure_(std::move(onPressure)) {}
+
+bool StoreQueue::push(StoreRow row, std::size_t hiddenBytes, OnDrop onDrop) {
+    const std::size_t bytes = storeBytes(row) + hiddenBytes;
+    bool nowCrowded = false;
+    {
+        const MutexLock lock(mutex_);
+        const bool refused = stopping_ || (failing_ && crowdedLocked());
+        if (refused) {
+            if (onDrop == OnDrop::Count) {
+                ++lost_[static_cast<std::size_t>(failing_.value_or(StoreLoss::NoStore))];
+            }
+            return false;
+        }
+        appendLocked(std::move(row), bytes);
+        nowCrowded = !pressure_ && !failing_ && crowdedLocked();
+    }
+    if (nowCrowded) {
+        tellPressure();
+    }
+    return true;
+}
+
+void StoreQueue::pushAlways(StoreRow row) {
+    const std::size_t bytes = storeBytes(row);
+    const MutexLock lock(mutex_);
+    if (!stopping_) {
+        appendLocked(std::move(row), bytes);
+    }
+}
+
+void StoreQueue::appendLocked(StoreRow&& row, std::size_t bytes) {
+    if (items_.empty()) {
+        firstCame_ = std::chrono::steady_clock::now();
+    }
+    items_.push_back({std::move(row), bytes});
+    ++pushed_;
+    ++heldRows_;
+    heldBytes_ += bytes;
+    noteTightLocked();
+    // The writer sleeps through what lies between the first row and a full group.
+    if (items_.size() == 1 || items_.size() == groupRows_) {
+        wakeUp_.notify_one();
+    }
+}
+
+void StoreQueue::flush(std::function<void()> done) {
+    {
+        const MutexLock lock(mutex_);
+        if (settled_ != pushed_) {
+            flushes_.push_back({pushed_, std::move(done)});
+            takeAll_ = true;
+            wakeUp_.notify_all();
+            return;
+        }
+    }
+    done();
+}
+
+void StoreQueue::wake() {
+    const MutexLock lock(mutex_);
+    woken_ = true;
+    wakeUp_.notify_all();
+}
+
+void StoreQueue::stop() {
+    const MutexLock lock(mutex_);
+    stopping_ = true;
+    takeAll_ = true;
+    wakeUp_.notify_all();
+}
+
+bool StoreQueue::isStopping() const {
+    const MutexLock lock(mutex_);
+    return stopping_;
+}
+
+void StoreQueue::setFailing(std::optional<StoreLoss> reason) {
+    {
+        const MutexLock lock(mutex_);
+        failing_ = reason;
+        noteTightLocked();
+    }
+    tellPressure();
+}
+
+bool StoreQueue::crowdedLocked() const {
+    return heldRows_ >= marks_.highRows || heldBytes_ >= marks_.highBytes;
+}
+
+bool StoreQueue::isCrowded() const {
+    const MutexLock lock(mutex_);
+    return crowdedLocked();
+}
+
+StoreQueue::Levels StoreQueue::levels() const {
+    const MutexLock lock(mutex_);
+    return {heldRows_, heldBytes_, lost_};
+}
+
+void StoreQueue::countLost(StoreLoss reason, std::uint64_t rows) {
+    const MutexLock lock(mutex_);
+    lost_[static_cast<std::size_t>(reason)] += rows;
+}
+
+void StoreQueue::noteTightLocked() {
+    tight_.store(failing_.has_value() || crowdedLocked(), std::memory_order_relaxed);
+}
+
+bool StoreQueue::groupReadyLocked(std::chrono::nanoseconds groupDelay) {
+    return items_.size() >= groupRows_ || takeAll_ ||
+           std::chrono::steady_clock::now() - firstCame_ >= groupDelay;
+}
+
+StoreQueue::Wake StoreQueue::waitForGroup(std::chrono::nanoseconds groupDelay,
+                                          std::chrono::nanoseconds idleDelay) {
+    const MutexLock lock(mutex_);
+    while (items_.empty()) {
+        if (stopping_) {
+            return Wake::Stopped;
+        }
+        takeAll_ = false;
+        if (std::exchange(woken_, false) ||
+            wakeUp_.wait_for(mutex_, idleDelay) == std::cv_status::timeout) {
+            return Wake::Idle;
+        }
+    }
+    while (!groupReadyLocked(groupDelay)) {
+        wakeUp_.wait_until(mutex_, firstCame_ + groupDelay);
+    }
+    return Wake::Rows;
+}
+
+void StoreQueue::take(std::vector<StoreItem>& items, std::chrono::nanoseconds groupDelay) {
+    items.clear();
+    if (items.capacity() > kKeptCapacity) {
+        std::vector<StoreItem>().swap(items);
+    }
+    const MutexLock lock(mutex_);
+    const Instant now = std::chrono::steady_clock::now();
+    const bool all = takeAll_ || now - firstCame_ >= groupDelay;
+    const std::size_t rest = all ? 0 : items_.size() % groupRows_;
+    items.swap(items_);
+    takeAll_ = false;
+    if (rest != 0) {
+        const auto cut = std::prev(items.end(), static_cast<std::ptrdiff_t>(rest));
+        std::move(cut, items.end(), std::back_inserter(items_));
+        items.erase(cut, items.end());
+        firstCame_ = now;
+    }
+}
+
+void StoreQueue::pause(std::chrono::nanoseconds delay) {
+    const MutexLock lock(mutex_);
+    const Instant until = std::chrono::steady_clock::now() + delay;
+    while (!stopping_ && wakeUp_.wait_until(mutex_, until) != std::cv_status::timeout) {
+    }
+}
+
+void StoreQueue::settle(std::size_t rows, std::size_t bytes) {
+    std::vector<Flush> finished;
+    bool relieved = false;
+    {
+        const MutexLock lock(mutex_);
+        settled_ += rows;
+        heldRows_ -= rows;
+        heldBytes_ -= std::min(bytes, heldBytes_);
+        noteTightLocked();
+        const auto rest = std::find_if(flushes_.begin(), flushes_.end(),
+                                       [&](const Flush& flush) { return flush.upTo > settled_; });
+        std::move(flushes_.begin(), rest, std::back_inserter(finished));
+        flushes_.erase(flushes_.begin(), rest);
+        relieved = pressure_;
+    }
+    if (relieved) {
+        tellPressure();
+    }
+    for (const Flush& flush : finished) {
+        flush.done();
+    }
+}
+
+bool StoreQueue::wantsPressure() {
+    const MutexLock lock(mutex_);
+    if (failing_) {
+        pressure_ = false;
+    } else if (crowdedLocked()) {
+        pressure_ = true;
+    } else if (heldRows_ <= marks_.lowRows && heldBytes_ <= marks_.lowBytes) {
+        pressure_ = false;
+    }
+    return pressure_;
+}
+
+void StoreQueue::tellPressure() {
+    const MutexLock lock(pressureMutex_);
+    const bool wanted = wantsPressure();
+    if (wanted != toldPressure_) {
+        toldPressure_ = wanted;
+        if (onPressure_) {
+            onPressure_(wanted);
+        }
+    }
+}
+
+} // namespace halyard::linux_

@@ -1,0 +1,105 @@
+// What waits to be written to the store.
+//
+// Rows hold shared values: the JSON text is made on the writer's thread, right
+// before the INSERT, so whoever adds a row pays for a reference and no more.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <string>
+#include <variant>
+
+#include "common/Value.h"
+
+namespace halyard::linux_ {
+
+enum class StoreTable : std::uint8_t {
+    UploadSession,
+    UploadMessage,
+    AnalyticsEvent,
+    EnergyEvent,
+    Metric,
+    Incident,
+};
+inline constexpr std::size_t kStoreTables = 6;
+
+// An upload session, shared by its rows and by whoever sends through it.
+//
+// Its own row is written before its first message, whenever that is: a session
+// that was opened while nothing could be stored still gets its row later.
+struct StoreUpload {
+    std::int64_t sessionID = 0;
+    Dictionary sessionInfo;
+    Dictionary userInfo;
+    double opened = 0;
+
+    // Whether the store took a row of this session, so that it needs closing.
+    std::atomic<bool> accepted{false};
+    // The id of its row once there is one, and which opening of the file gave it.
+    // Only the writer's thread.
+    std::int64_t row = 0;
+    std::uint64_t generation = 0;
+};
+using StoreUploadPtr = std::shared_ptr<StoreUpload>;
+
+struct StoreOpenRow {
+    StoreUploadPtr upload;
+};
+struct StoreCloseRow {
+    StoreUploadPtr upload;
+    double time;
+};
+struct StoreMessageRow {
+    StoreUploadPtr upload;
+    Dictionary payload;
+    std::uint32_t type;
+    std::uint16_t category;
+    double time;
+};
+struct StoreSingleRow {
+    Dictionary sessionInfo;
+    Dictionary userInfo;
+    Dictionary payload;
+    std::uint32_t type;
+    std::uint16_t category;
+    double time;
+};
+struct StoreAnalyticsRow {
+    Value name;
+    std::function<Dictionary()> builder; // null once it has been called
+    Dictionary payload;
+    double time;
+};
+struct StoreEnergyRow {
+    Value name;
+    Dictionary payload;
+    std::uint32_t client;
+    double time;
+};
+struct StoreMetricRow {
+    std::string message;
+    std::uint32_t metricID;
+    double time;
+};
+struct StoreIncidentRow {
+    Dictionary signature;
+    Value report;
+    double time;
+};
+
+using StoreRow = std::variant<StoreOpenRow, StoreCloseRow, StoreMessageRow, StoreSingleRow,
+                              StoreAnalyticsRow, StoreEnergyRow, StoreMetricRow, StoreIncidentRow>;
+
+// A row on its way, with the memory it is charged with.
+struct StoreItem {
+    StoreRow row;
+    std::size_t bytes = 0;
+};
+
+// About how much memory a row keeps alive, contents shared with others included.
+std::size_t storeBytes(const StoreRow& row);
+std::size_t storeBytes(const Dictionary& dictionary);
+
+} // namespace halyard::linux_

@@ -1,0 +1,183 @@
+#include "linux/StoreSalvage.h"
+
+#include <algorithm>
+#include <array>
+#include <fmt/chrono.h>
+#include <fmt/format.h>
+#include <limits>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace halyard::linux_ {
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr std::string_view kMark = ".damaged-";
+constexpr std::array<std::string_view, 2> kCompanions = {"-wal", "-shm"};
+constexpr std::uint64_t kRowsPerCommit = 4096;
+// Behind a hole the next row is looked for this far on, then twice as far and
+// so on: the first step is less than a page's worth of rows.
+constexpr std::int64_t kFirstStep = 4;
+constexpr std::int64_t kLargestStep = std::int64_t{1} << 40;
+
+struct Source {
+    std::string_view table;
+    std::string_view columns; // behind the id
+    int count;                // with the id
+    std::string_view valid;   // what is true of every row that we wrote
+};
+constexpr std::array<Source, 6> kSources = {
+    {{"upload_session", "session_id, session_info, user_info, opened, closed", 6,
+      "json_valid(session_info) AND json_valid(user_info)"},
+     {"upload_message", "upload_session, session_info, user_info, category, type, payload, time", 8,
+      "json_valid(payload) AND coalesce(json_valid(session_info), 1)"
+      " AND coalesce(json_valid(user_info), 1)"},
+     {"analytics_event", "name, payload, time", 4, "json_valid(payload)"},
+     {"energy_event", "client, name, payload, time", 5, "json_valid(payload)"},
+     {"metric", "metric_id, message, time", 4, "typeof(metric_id) = 'integer'"},
+     {"incident", "signature, report, time", 4, "json_valid(signature)"}}};
+
+std::string stampOf(platform::WallTime now) {
+    const auto seconds = std::chrono::floor<std::chrono::seconds>(now);
+    return fmt::format("{:%Y%m%dT%H%M%SZ}", fmt::gmtime(seconds.time_since_epoch().count()));
+}
+
+void removeOldest(const fs::path& path) {
+    std::vector<fs::path> kept;
+    std::error_code ignored;
+    const std::string prefix = path.filename().string() + std::string(kMark);
+    for (const auto& entry : fs::directory_iterator(path.parent_path(), ignored)) {
+        const std::string name = entry.path().filename().string();
+        const bool companion = name.ends_with(kCompanions[0]) || name.ends_with(kCompanions[1]);
+        if (name.starts_with(prefix) && !companion) {
+            kept.push_back(entry.path());
+        }
+    }
+    std::sort(kept.begin(), kept.end());
+    for (std::size_t i = 0; i + kDamagedStoresKept < kept.size(); ++i) {
+        fs::remove(kept[i], ignored);
+        for (const std::string_view companion : kCompanions) {
+            fs::remove(kept[i].string() + std::string(companion), ignored);
+        }
+    }
+}
+
+class TableCarrier {
+public:
+    TableCarrier(const Source& source, sqlite3* from, sqlite3* to, StoreSalvage& result)
+        : source_(source), to_(to), result_(result) {
+        std::string marks = "?";
+        for (int i = 1; i < source.count; ++i) {
+            marks += ", ?";
+        }
+        readable_ = read_.prepare(from, fmt::format("SELECT id, {}, {} FROM {} WHERE id > ? "
+                                                    "ORDER BY id",
+                                                    source.columns, source.valid, source.table));
+        result_.code = insert_.prepare(to, fmt::format("INSERT OR REPLACE INTO {}(id, {}) "
+                                                       "VALUES({})",
+                                                       source.table, source.columns, marks));
+    }
+
+    void run() {
+        if (readable_ != SQLITE_OK) {
+            ++result_.holes;
+            return;
+        }
+        std::int64_t step = 0;
+        while (result_.code == SQLITE_OK && step <= kLargestStep) {
+            const std::int64_t from = last_;
+            if (readFrom(last_ > std::numeric_limits<std::int64_t>::max() - step ? last_
+                                                                                 : last_ + step)) {
+                return;
+            }
+            result_.holes += last_ != from || step == 0 ? 1 : 0;
+            step = last_ != from || step == 0 ? kFirstStep : step * 2;
+        }
+    }
+
+private:
+    // True when it came to the end of the table.
+    bool readFrom(std::int64_t id) {
+        read_.bind(1, id);
+        int code = read_.step();
+        for (; code == SQLITE_ROW && result_.code == SQLITE_OK; code = read_.step()) {
+            last_ = read_.integer(0);
+            if (read_.integer(source_.count) == 1) {
+                carry();
+            } else {
+                ++result_.holes;
+            }
+        }
+        read_.reset();
+        return code == SQLITE_DONE;
+    }
+
+    void carry() {
+        for (int i = 0; i < source_.count; ++i) {
+            insert_.bindColumn(i + 1, read_, i);
+        }
+        result_.code = insert_.run();
+        if (result_.code == SQLITE_OK && ++result_.carried % kRowsPerCommit == 0) {
+            result_.code = sqlite3_exec(to_, "COMMIT; BEGIN IMMEDIATE", nullptr, nullptr, nullptr);
+        }
+    }
+
+    const Source& source_;
+    sqlite3* to_;
+    StoreSalvage& result_;
+    StoreStatement read_;
+    StoreStatement insert_;
+    int readable_ = SQLITE_OK;
+    std::int64_t last_ = 0;
+};
+
+} // namespace
+
+fs::path storeSetAside(const fs::path& path, platform::WallTime now, std::error_code& error) {
+    const std::string base = path.string() + std::string(kMark) + stampOf(now);
+    fs::path aside = base;
+    for (int i = 2; fs::exists(aside, error); ++i) {
+        aside = fmt::format("{}-{}", base, i);
+    }
+    fs::rename(path, aside, error);
+    if (error) {
+        return {};
+    }
+    for (const std::string_view companion : kCompanions) {
+        std::error_code absent;
+        fs::rename(path.string() + std::string(companion), aside.string() + std::string(companion),
+                   absent);
+    }
+    removeOldest(path);
+    return aside;
+}
+
+StoreSalvage storeCarryOver(const fs::path& damaged, sqlite3* fresh) {
+    StoreSalvage result;
+    sqlite3* from = nullptr;
+    if (sqlite3_open_v2(damaged.c_str(), &from, SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX,
+                        nullptr) == SQLITE_OK) {
+        sqlite3_db_config(from, SQLITE_DBCONFIG_NO_CKPT_ON_CLOSE, 1, nullptr);
+        // A table of contents that contradicts the file is what we came for.
+        sqlite3_exec(from, "PRAGMA writable_schema = ON", nullptr, nullptr, nullptr);
+        result.code = sqlite3_exec(fresh, "BEGIN IMMEDIATE", nullptr, nullptr, nullptr);
+        for (const Source& source : kSources) {
+            if (result.code == SQLITE_OK) {
+                TableCarrier(source, from, fresh, result).run();
+            }
+        }
+        const bool whole = result.code == SQLITE_OK;
+        if (sqlite3_get_autocommit(fresh) == 0) {
+            const int code = sqlite3_exec(fresh, "COMMIT", nullptr, nullptr, nullptr);
+            result.code = whole ? code : result.code;
+        }
+    } else {
+        ++result.holes;
+    }
+    sqlite3_close(from);
+    return result;
+}
+
+} // namespace halyard::linux_

@@ -1,0 +1,79 @@
+// The little of SQLite's interface that the store uses, with owners.
+#pragma once
+
+#include <cstdint>
+#include <sqlite3.h>
+#include <string_view>
+#include <utility>
+
+namespace halyard::linux_ {
+
+// A prepared statement, used over and over. Not thread-safe.
+//
+// Text and blobs are bound without a copy: they must live until the statement
+// has been stepped to its end or reset.
+class StoreStatement {
+public:
+    StoreStatement() = default;
+    ~StoreStatement() { sqlite3_finalize(statement_); }
+    StoreStatement(StoreStatement&& other) noexcept
+        : statement_(std::exchange(other.statement_, nullptr)) {}
+    StoreStatement& operator=(StoreStatement&& other) noexcept {
+        std::swap(statement_, other.statement_);
+        return *this;
+    }
+
+    [[nodiscard]] int prepare(sqlite3* database, std::string_view sql) {
+        finalize();
+        return sqlite3_prepare_v3(database, sql.data(), static_cast<int>(sql.size()),
+                                  SQLITE_PREPARE_PERSISTENT, &statement_, nullptr);
+    }
+    void finalize() {
+        sqlite3_finalize(statement_);
+        statement_ = nullptr;
+    }
+
+    void bind(int index, std::int64_t value) { sqlite3_bind_int64(statement_, index, value); }
+    void bind(int index, double value) { sqlite3_bind_double(statement_, index, value); }
+    void bindText(int index, std::string_view text) {
+        sqlite3_bind_text64(statement_, index, text.data(), text.size(), nullptr, SQLITE_UTF8);
+    }
+    void bindBlob(int index, std::string_view bytes) {
+        sqlite3_bind_blob64(statement_, index, bytes.data(), bytes.size(), nullptr);
+    }
+    void bindNull(int index) { sqlite3_bind_null(statement_, index); }
+    void bindColumn(int index, const StoreStatement& from, int column) {
+        sqlite3_bind_value(statement_, index, sqlite3_column_value(from.statement_, column));
+    }
+
+    // SQLITE_ROW while there is a row; resets at the end and on an error.
+    [[nodiscard]] int step() {
+        const int code = sqlite3_step(statement_);
+        return code == SQLITE_ROW ? code : finish(code);
+    }
+    // For statements that give no rows that matter: SQLITE_OK or the error.
+    [[nodiscard]] int run() {
+        const int code = sqlite3_step(statement_);
+        return code == SQLITE_ROW ? finish(SQLITE_OK) : finish(code);
+    }
+    void reset() { sqlite3_reset(statement_); }
+
+    std::int64_t integer(int column) const { return sqlite3_column_int64(statement_, column); }
+    double real(int column) const { return sqlite3_column_double(statement_, column); }
+    bool isNull(int column) const { return sqlite3_column_type(statement_, column) == SQLITE_NULL; }
+    std::string_view text(int column) const {
+        const void* bytes = sqlite3_column_blob(statement_, column);
+        return {static_cast<const char*>(bytes),
+                static_cast<std::size_t>(sqlite3_column_bytes(statement_, column))};
+    }
+
+private:
+    int finish(int code) {
+        const int later = sqlite3_reset(statement_);
+        return code == SQLITE_DONE ? later : code;
+    }
+
+    sqlite3_stmt* statement_ = nullptr;
+};
+
+} // namespace halyard::linux_

@@ -1,0 +1,167 @@
+// What the store's tests share: a state directory of their own, a log that can
+// be waited for, and a reader that is nobody's business but SQLite's.
+#pragma once
+
+#include <condition_variable>
+#include <cstdlib>
+#include <filesystem>
+#include <future>
+#include <gtest/gtest.h>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <vector>
+
+#include "linux/Store.h"
+#include "platform/Log.h"
+#include "platform/Platform.h"
+#include "testing/ManualClock.h"
+
+namespace halyard::linux_ {
+
+class TempDirectory {
+public:
+    TempDirectory() {
+        std::string pattern = (std::filesystem::temp_directory_path() / "halyard.XXXXXX").string();
+        path_ = ::mkdtemp(pattern.data());
+    }
+    ~TempDirectory() {
+        std::error_code ignored;
+        std::filesystem::remove_all(path_, ignored);
+    }
+    TempDirectory(const TempDirectory&) = delete;
+    TempDirectory& operator=(const TempDirectory&) = delete;
+    const std::filesystem::path& path() const { return path_; }
+
+private:
+    std::filesystem::path path_;
+};
+
+class WaitingLog final : public platform::LogSink {
+public:
+    bool isEnabled(LogLevel) const override { return true; }
+    void write(const platform::LogLine& line) override {
+        const std::lock_guard lock(mutex_);
+        lines_.emplace_back(line.level, line.text);
+        changed_.notify_all();
+    }
+    // Returns the first line that holds `text`, once there is one.
+    std::string waitFor(std::string_view text) {
+        std::unique_lock lock(mutex_);
+        std::string found;
+        changed_.wait(lock, [&] {
+            for (const auto& [level, line] : lines_) {
+                found = line.find(text) != std::string::npos ? line : found;
+            }
+            return !found.empty();
+        });
+        return found;
+    }
+    std::size_t count(std::string_view text, LogLevel level) {
+        const std::lock_guard lock(mutex_);
+        std::size_t sum = 0;
+        for (const auto& line : lines_) {
+            sum += line.first == level && line.second.find(text) != std::string::npos ? 1 : 0;
+        }
+        return sum;
+    }
+
+private:
+    std::mutex mutex_;
+    std::condition_variable changed_;
+    std::vector<std::pair<LogLevel, std::string>> lines_;
+};
+
+// Another process's view of the file: results as rows of text joined by "|".
+class Reader {
+public:
+    explicit Reader(const std::filesystem::path& path) {
+        EXPECT_EQ(sqlite3_open_v2(path.c_str(), &database_, SQLITE_OPEN_READWRITE, nullptr),
+                  SQLITE_OK);
+    }
+    ~Reader() { sqlite3_close(database_); }
+    Reader(const Reader&) = delete;
+    Reader& operator=(const Reader&) = delete;
+
+    std::vector<std::string> rows(const std::string& sql) {
+        std::vector<std::string> result;
+        const auto add = [](void* rows, int count, char** values, char**) {
+            std::string row;
+            for (int i = 0; i < count; ++i) {
+                row += (i == 0 ? "" : "|") + std::string(values[i] == nullptr ? "NULL" : values[i]);
+            }
+            static_cast<std::vector<std::string>*>(rows)->push_back(row);
+            return 0;
+        };
+        EXPECT_EQ(sqlite3_exec(database_, sql.c_str(), add, &result, nullptr), SQLITE_OK)
+            << sqlite3_errmsg(database_);
+        return result;
+    }
+    std::string one(const std::string& sql) {
+        const auto all = rows(sql);
+        return all.size() == 1 ? all.front() : "not one row";
+    }
+    std::int64_t number(const std::string& sql) { return std::atoll(one(sql).c_str()); }
+
+private:
+    sqlite3* database_ = nullptr;
+};
+
+class StoreFixture : public ::testing::Test {
+protected:
+    StoreFixture() {
+        options_.path = directory_.path() / "telemetry.db";
+        // Only a full group or a flush commits.
+        options_.groupDelay = std::chrono::hours(1);
+        options_.busyTimeout = std::chrono::milliseconds(0);
+        options_.firstRetry = std::chrono::milliseconds(1);
+        options_.lastRetry = std::chrono::milliseconds(1);
+        platform_.clock = &clock_;
+        platform_.log = &log_;
+        platform::install(&platform_);
+    }
+    ~StoreFixture() override {
+        store_.reset();
+        platform::install(nullptr);
+    }
+
+    Store& open() {
+        store_.reset();
+        store_ = std::make_unique<Store>(options_, clock_);
+        return *store_;
+    }
+    void flush() {
+        std::promise<void> done;
+        store_->flush([&] { done.set_value(); });
+        done.get_future().wait();
+    }
+    void addSingles(int count, const Dictionary& payload) {
+        for (int i = 0; i < count; ++i) {
+            (void)store_->addSingleMessage({}, {}, 1, 2, payload);
+        }
+    }
+    Reader reader() { return Reader(options_.path); }
+    static std::uint64_t total(const StoreLosses& losses) {
+        std::uint64_t sum = 0;
+        for (const std::uint64_t lost : losses) {
+            sum += lost;
+        }
+        return sum;
+    }
+    std::uint64_t lost(StoreLoss reason) {
+        return store_->status().lost[static_cast<std::size_t>(reason)];
+    }
+
+    TempDirectory directory_;
+    testing::ManualClock clock_;
+    WaitingLog log_;
+    platform::Platform platform_;
+    StoreOptions options_;
+    std::unique_ptr<Store> store_;
+};
+
+inline Dictionary examplePayload() {
+    return {{"audiotag", "Playback_Start"}, {"sample_rate", 48000.0}, {"channels", 2}};
+}
+
+} // namespace halyard::linux_

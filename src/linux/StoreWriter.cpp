@@ -1,0 +1,411 @@
+#include "linux/StoreWriter.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <fmt/format.h>
+#include <numeric>
+#include <utility>
+
+#include "linux/StoreSalvage.h"
+#include "platform/Log.h"
+
+namespace halyard::linux_ {
+namespace {
+
+// The write-ahead log is moved into the file at this length, or earlier in a
+// small store.
+constexpr std::uint64_t kCheckpointBytes = 4 * 1024 * 1024;
+constexpr std::uint64_t kLeastCheckpointBytes = 64 * 1024;
+// What a reader that stays in one transaction may make the log grow to, beside
+// the size of the store.
+constexpr std::uint64_t kLogAllowance = 16 * 1024 * 1024;
+// How fast the expected size of payloads forgets a large one.
+constexpr std::size_t kForgetShare = 64;
+
+std::string_view nameOf(StoreLoss reason) {
+    switch (reason) {
+    case StoreLoss::NoStore:
+        return "no store";
+    case StoreLoss::DiskFull:
+        return "disk full";
+    case StoreLoss::ReadOnly:
+        return "read-only";
+    case StoreLoss::Locked:
+        return "locked by another process";
+    case StoreLoss::IoError:
+        return "input/output error";
+    case StoreLoss::Stuck:
+        return "the file system does not answer";
+    case StoreLoss::Rejected:
+        return "rejected";
+    }
+    return "";
+}
+
+std::uint64_t sum(const StoreLosses& losses) {
+    return std::accumulate(losses.begin(), losses.end(), std::uint64_t{0});
+}
+
+bool concernsOneRow(int code) {
+    const int primary = code & 0xFF;
+    return primary == SQLITE_TOOBIG || primary == SQLITE_CONSTRAINT || primary == SQLITE_MISMATCH;
+}
+
+bool isDamage(int code) {
+    const int primary = code & 0xFF;
+    return primary == SQLITE_CORRUPT || primary == SQLITE_NOTADB;
+}
+
+} // namespace
+
+StoreWriter::StoreWriter(StoreOptions options, const platform::Clock& clock)
+    : options_(std::move(options)), clock_(clock),
+      queue_(options_.marks, options_.groupRows, options_.onPressure),
+      database_({options_.path, options_.busyTimeout, options_.vfs}),
+      retention_(platform::secondsSince1970(clock.wallTime())), limits_(options_.limits) {}
+
+bool StoreWriter::open() {
+    const StoreDatabase::Opened opened = openDatabase();
+    const bool usable =
+        opened == StoreDatabase::Opened::Yes || opened == StoreDatabase::Opened::NotNow;
+    if (!usable) {
+        HY_LOG_ERROR(HYReportingPlatformCategory, "running without a store: {}: {}",
+                     options_.path.string(), database_.errorText());
+        queue_.stop();
+    } else if (opened == StoreDatabase::Opened::NotNow) {
+        beginEpisode(lossOf(database_.errorCode()), database_.errorText());
+    }
+    noteSizes();
+    const MutexLock lock(mutex_);
+    status_.open = usable;
+    return usable;
+}
+
+StoreDatabase::Opened StoreWriter::openDatabase() {
+    const StoreDatabase::Opened opened = database_.open();
+    return opened == StoreDatabase::Opened::Damaged ? replaceDamaged() : opened;
+}
+
+StoreDatabase::Opened StoreWriter::replaceDamaged() {
+    const std::string why = database_.errorText();
+    retention_.reset();
+    database_.abandon();
+    std::error_code error;
+    const auto aside = storeSetAside(options_.path, clock_.wallTime(), error);
+    if (error) {
+        HY_LOG_ERROR(HYReportingPlatformCategory, "{} is damaged and cannot be set aside: {}",
+                     options_.path.string(), error.message());
+        return StoreDatabase::Opened::Refused;
+    }
+    HY_LOG_ERROR(HYReportingPlatformCategory, "{} is damaged, set aside as {}: {}",
+                 options_.path.string(), aside.filename().string(), why);
+    const StoreDatabase::Opened opened = database_.open();
+    if (opened == StoreDatabase::Opened::Yes) {
+        carryOver(aside);
+    }
+    return opened;
+}
+
+void StoreWriter::carryOver(const std::filesystem::path& aside) {
+    const StoreSalvage salvage = storeCarryOver(aside, database_.handle());
+    HY_LOG_DEFAULT(HYReportingPlatformCategory,
+                   "carried over {} rows of {}, failed to read in {} places", salvage.carried,
+                   aside.filename().string(), salvage.holes);
+    if (salvage.code != SQLITE_OK) {
+        HY_LOG_ERROR(HYReportingPlatformCategory, "not all rows could be carried over: {}",
+                     sqlite3_errstr(salvage.code));
+    }
+    (void)database_.refreshIds(); // Falls back on the ids' own conflicts.
+}
+
+void StoreWriter::closeDatabase() {
+    retention_.reset();
+    if (database_.hasMoved()) {
+        database_.abandon(); // What lies at its path is not ours.
+    } else {
+        database_.close();
+    }
+}
+
+void StoreWriter::run() {
+    for (;;) {
+        const auto idle = trimMore_            ? std::chrono::nanoseconds(0)
+                          : database_.isOpen() ? options_.agePeriod
+                                               : options_.lastRetry;
+        switch (queue_.waitForGroup(options_.groupDelay, idle)) {
+        case StoreQueue::Wake::Rows:
+            queue_.take(taken_, options_.groupDelay);
+            writeTaken();
+            break;
+        case StoreQueue::Wake::Idle:
+            maintain();
+            break;
+        case StoreQueue::Wake::Stopped:
+            return closeDatabase();
+        }
+    }
+}
+
+void StoreWriter::watch() {
+    const std::int64_t since = busySince_.load();
+    const std::int64_t now = clock_.steadyTime().time_since_epoch().count();
+    if (since != 0 && now - since >= options_.stuckAfter.count()) {
+        beginEpisode(StoreLoss::Stuck, "no answer");
+        if (busySince_.load() != since) {
+            endEpisode(); // It came back meanwhile.
+        }
+    }
+}
+
+void StoreWriter::writeTaken() {
+    std::span<StoreItem> rest(taken_);
+    while (!rest.empty()) {
+        const std::size_t rows = std::min(rest.size(), options_.groupRows);
+        writeGroup(rest.first(rows));
+        rest = rest.subspan(rows);
+    }
+    taken_.clear();
+}
+
+void StoreWriter::writeGroup(std::span<StoreItem> group) {
+    auto delay = options_.firstRetry;
+    for (;;) {
+        if (surrendered_) {
+            return giveUp(group, *surrendered_);
+        }
+        const int code = attempt(group);
+        if (code == SQLITE_OK) {
+            return settle(group);
+        }
+        const StoreLoss reason = lossOf(code);
+        beginEpisode(reason, database_.errorText());
+        if (queue_.isStopping()) {
+            surrendered_ = reason;
+            continue;
+        }
+        queue_.pause(delay);
+        delay = std::min(delay * 2, options_.lastRetry);
+    }
+}
+
+void StoreWriter::maintain() {
+    const bool limitsChanged = limitsChanged_.exchange(false);
+    if (!limitsChanged && !trimMore_ && !isAgeDue() && database_.isOpen() &&
+        !database_.hasMoved()) {
+        return;
+    }
+    trimMore_ = false;
+    agedAt_ = {};
+    if (const int code = attempt({}); code != SQLITE_OK) {
+        beginEpisode(lossOf(code), database_.errorText());
+    }
+}
+
+int StoreWriter::attempt(std::span<StoreItem> group) {
+    busySince_.store(clock_.steadyTime().time_since_epoch().count());
+    int code = reopenIfNeeded();
+    if (code == SQLITE_OK) {
+        code = writeRows(group);
+        if (isDamage(code)) {
+            code = replaceDamaged() == StoreDatabase::Opened::Yes ? writeRows(group)
+                                                                  : database_.errorCode();
+        }
+    }
+    busySince_.store(0);
+    if (code == SQLITE_OK) {
+        noteSizes();
+        endEpisode();
+    }
+    return code;
+}
+
+int StoreWriter::reopenIfNeeded() {
+    if (database_.hasMoved()) {
+        HY_LOG_ERROR(HYReportingPlatformCategory, "{} was removed or replaced, opening it anew",
+                     options_.path.string());
+        retention_.reset();
+        database_.abandon();
+    }
+    if (database_.isOpen() || openDatabase() == StoreDatabase::Opened::Yes) {
+        return SQLITE_OK;
+    }
+    return database_.errorCode();
+}
+
+int StoreWriter::writeRows(std::span<StoreItem> group) {
+    const StoreLimits bounds = limits();
+    const bool ageDue = isAgeDue();
+    rejected_ = 0;
+    int code = database_.boundLog(
+        bounds.maxBytes + kLogAllowance,
+        std::clamp(bounds.maxBytes / 8, kLeastCheckpointBytes, kCheckpointBytes));
+    code = code == SQLITE_OK ? database_.begin() : code;
+    if (code != SQLITE_OK) {
+        return code;
+    }
+    for (StoreItem& item : group) {
+        code = code == SQLITE_OK ? insert(item.row) : code;
+    }
+    bool more = false;
+    if (code == SQLITE_OK) {
+        const double oldest = now() - static_cast<double>(bounds.maxAge.count());
+        code = retention_.trim(database_, bounds.maxBytes,
+                               ageDue ? std::optional(oldest) : std::nullopt, more);
+    }
+    if (code != SQLITE_OK) {
+        database_.rollback();
+        return code;
+    }
+    code = database_.commit();
+    if (code == SQLITE_OK) {
+        trimMore_ = more;
+        if (ageDue && !more) {
+            agedAt_ = clock_.steadyTime();
+        }
+    }
+    return code;
+}
+
+int StoreWriter::insert(StoreRow& row) {
+    const auto* analytics = std::get_if<StoreAnalyticsRow>(&row);
+    const bool built = analytics != nullptr && analytics->builder;
+    const int code = database_.insert(row);
+    if (built) {
+        const std::size_t expected = expectedPayload_.load(std::memory_order_relaxed);
+        expectedPayload_.store(
+            std::max(storeBytes(analytics->payload), expected - expected / kForgetShare),
+            std::memory_order_relaxed);
+    }
+    if (concernsOneRow(code)) {
+        ++rejected_;
+        return SQLITE_OK;
+    }
+    return code;
+}
+
+void StoreWriter::noteSizes() {
+    const MutexLock lock(mutex_);
+    status_.fileBytes = database_.fileBytes();
+    status_.logBytes = database_.logBytes();
+}
+
+void StoreWriter::settle(std::span<StoreItem> group) {
+    std::size_t bytes = 0;
+    for (const StoreItem& item : group) {
+        bytes += item.bytes;
+    }
+    {
+        const MutexLock lock(mutex_);
+        ++status_.commits;
+        for (std::size_t i = 0; i < kStoreTables; ++i) {
+            status_.rows[i] += database_.committedRows()[i];
+        }
+    }
+    if (rejected_ > 0) {
+        queue_.countLost(StoreLoss::Rejected, rejected_);
+        HY_LOG_ERROR(HYReportingPlatformCategory, "the store rejected {} rows: {}", rejected_,
+                     database_.errorText());
+    }
+    queue_.settle(group.size(), bytes);
+}
+
+void StoreWriter::giveUp(std::span<StoreItem> group, StoreLoss reason) {
+    std::size_t bytes = 0;
+    std::uint64_t lost = 0;
+    for (const StoreItem& item : group) {
+        bytes += item.bytes;
+        lost += std::holds_alternative<StoreCloseRow>(item.row) ? 0 : 1;
+    }
+    queue_.countLost(reason, lost);
+    queue_.settle(group.size(), bytes);
+}
+
+bool StoreWriter::isAgeDue() const {
+    return clock_.steadyTime() - agedAt_ >= options_.agePeriod;
+}
+
+StoreLoss StoreWriter::lossOf(int code) const {
+    switch (code & 0xFF) {
+    case SQLITE_FULL:
+        return StoreLoss::DiskFull;
+    case SQLITE_READONLY:
+        return StoreLoss::ReadOnly;
+    case SQLITE_BUSY:
+    case SQLITE_LOCKED:
+    case SQLITE_PROTOCOL:
+        return StoreLoss::Locked;
+    default:
+        break;
+    }
+    switch (database_.systemError()) {
+    case ENOSPC:
+    case EDQUOT:
+        return StoreLoss::DiskFull;
+    case EROFS:
+        return StoreLoss::ReadOnly;
+    default:
+        return StoreLoss::IoError;
+    }
+}
+
+void StoreWriter::beginEpisode(StoreLoss reason, const std::string& text) {
+    bool first = false;
+    {
+        const MutexLock lock(mutex_);
+        first = !episode_;
+        if (first) {
+            episode_ = Episode{reason, clock_.steadyTime(), queue_.levels().lost};
+        }
+        episode_->reason = reason;
+        status_.failing = true;
+    }
+    queue_.setFailing(reason);
+    if (first) {
+        HY_LOG_ERROR(HYReportingPlatformCategory, "cannot write to {}, trying on: {}: {}",
+                     options_.path.string(), nameOf(reason), text);
+    }
+}
+
+void StoreWriter::endEpisode() {
+    std::optional<Episode> ended;
+    {
+        const MutexLock lock(mutex_);
+        ended = std::exchange(episode_, std::nullopt);
+        status_.failing = false;
+    }
+    if (!ended) {
+        return;
+    }
+    queue_.setFailing(std::nullopt);
+    const auto seconds =
+        std::chrono::duration_cast<std::chrono::seconds>(clock_.steadyTime() - ended->began);
+    HY_LOG_DEFAULT(HYReportingPlatformCategory, "writing to {} again after {} s, {} rows lost",
+                   options_.path.string(), seconds.count(),
+                   sum(queue_.levels().lost) - sum(ended->lostBefore));
+}
+
+void StoreWriter::setLimits(StoreLimits limits) {
+    {
+        const MutexLock lock(mutex_);
+        limits_ = limits;
+    }
+    limitsChanged_ = true;
+    queue_.wake();
+}
+
+StoreLimits StoreWriter::limits() const {
+    const MutexLock lock(mutex_);
+    return limits_;
+}
+
+StoreStatus StoreWriter::status() const {
+    const StoreQueue::Levels levels = queue_.levels();
+    const MutexLock lock(mutex_);
+    StoreStatus status = status_;
+    status.queuedRows = levels.rows;
+    status.queuedBytes = levels.bytes;
+    status.lost = levels.lost;
+    return status;
+}
+
+} // namespace halyard::linux_

@@ -1,0 +1,128 @@
+// The store's writing side: takes rows out of the queue, writes them in groups,
+// and keeps at it when they cannot be written.
+//
+// Lives in shared ownership of the store and of its threads, because a thread
+// that hangs in a dead file system cannot be waited for.
+#pragma once
+
+#include <atomic>
+#include <memory>
+#include <optional>
+#include <span>
+#include <string>
+#include <vector>
+
+#include "common/Mutex.h"
+#include "linux/StoreDatabase.h"
+#include "linux/StoreQueue.h"
+#include "linux/StoreRetention.h"
+#include "platform/Clock.h"
+
+namespace halyard::linux_ {
+
+struct StoreOptions {
+    std::filesystem::path path; // of telemetry.db
+    StoreLimits limits;
+    StoreQueue::Marks marks;
+    // Called from any thread that uses the store, never twice with the same value.
+    StoreQueue::PressureHandler onPressure;
+
+    // A group is committed when it has this many rows, or this long after the
+    // first of fewer came.
+    std::size_t groupRows = 1024;
+    std::chrono::nanoseconds groupDelay = std::chrono::milliseconds(50);
+    std::chrono::milliseconds busyTimeout{1000};
+    std::chrono::nanoseconds firstRetry = std::chrono::milliseconds(100);
+    std::chrono::nanoseconds lastRetry = std::chrono::seconds(5);
+    // When one operation counts as hanging, by the clock, and how often to look.
+    std::chrono::nanoseconds stuckAfter = std::chrono::seconds(10);
+    std::chrono::nanoseconds watchPeriod = std::chrono::seconds(1);
+    // How often the age of rows is looked at.
+    std::chrono::nanoseconds agePeriod = std::chrono::minutes(1);
+    // How long the end of the store may take.
+    std::chrono::nanoseconds closeLimit = std::chrono::seconds(10);
+    const char* vfs = nullptr; // SQLite's default
+};
+
+struct StoreStatus {
+    bool open = false;
+    bool failing = false;
+    StoreDatabase::RowCounts rows{}; // stored, by table
+    std::uint64_t commits = 0;
+    std::size_t queuedRows = 0;
+    std::size_t queuedBytes = 0;
+    StoreLosses lost{};
+    std::uint64_t fileBytes = 0;
+    std::uint64_t logBytes = 0;
+};
+
+class StoreWriter {
+public:
+    // Borrows `clock`.
+    StoreWriter(StoreOptions options, const platform::Clock& clock);
+
+    // False when there is no store to be had. Before run().
+    [[nodiscard]] bool open();
+    // The writer's thread, until the queue is stopped and empty.
+    void run();
+    // Looks whether run() hangs. Any thread.
+    void watch();
+
+    StoreQueue& queue() { return queue_; }
+    const StoreOptions& options() const { return options_; }
+    void setLimits(StoreLimits limits) HY_EXCLUDES(mutex_);
+    StoreStatus status() const HY_EXCLUDES(mutex_);
+    double now() const { return platform::secondsSince1970(clock_.wallTime()); }
+    // What a payload that is not built yet is taken to weigh.
+    std::size_t expectedPayloadBytes() const { return expectedPayload_.load(); }
+
+private:
+    struct Episode {
+        StoreLoss reason;
+        platform::SteadyTime began;
+        StoreLosses lostBefore;
+    };
+
+    [[nodiscard]] StoreDatabase::Opened openDatabase();
+    [[nodiscard]] StoreDatabase::Opened replaceDamaged();
+    void carryOver(const std::filesystem::path& aside);
+    void closeDatabase();
+    [[nodiscard]] int reopenIfNeeded();
+    void writeTaken();
+    void writeGroup(std::span<StoreItem> group);
+    void maintain();
+    [[nodiscard]] int attempt(std::span<StoreItem> group);
+    [[nodiscard]] int writeRows(std::span<StoreItem> group);
+    [[nodiscard]] int insert(StoreRow& row);
+    void noteSizes() HY_EXCLUDES(mutex_);
+    void settle(std::span<StoreItem> group);
+    void giveUp(std::span<StoreItem> group, StoreLoss reason);
+    [[nodiscard]] bool isAgeDue() const;
+    StoreLoss lossOf(int code) const;
+
+    void beginEpisode(StoreLoss reason, const std::string& text) HY_EXCLUDES(mutex_);
+    void endEpisode() HY_EXCLUDES(mutex_);
+    StoreLimits limits() const HY_EXCLUDES(mutex_);
+
+    const StoreOptions options_;
+    const platform::Clock& clock_;
+    StoreQueue queue_;
+    StoreDatabase database_;
+    StoreRetention retention_;
+    std::vector<StoreItem> taken_;
+    std::uint64_t rejected_ = 0; // rows of the running attempt
+    bool trimMore_ = false;
+    // Set once stop() has found that rows cannot be written: no more attempts.
+    std::optional<StoreLoss> surrendered_;
+    platform::SteadyTime agedAt_{};
+    std::atomic<bool> limitsChanged_{false};
+    std::atomic<std::int64_t> busySince_{0}; // steady time, 0 while not busy
+    std::atomic<std::size_t> expectedPayload_{1024};
+
+    mutable Mutex mutex_;
+    StoreLimits limits_ HY_GUARDED_BY(mutex_);
+    std::optional<Episode> episode_ HY_GUARDED_BY(mutex_);
+    StoreStatus status_ HY_GUARDED_BY(mutex_);
+};
+
+} // namespace halyard::linux_
