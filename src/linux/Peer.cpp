@@ -91,15 +91,15 @@ Peer peerOfSocket(int socket) {
     return peer;
 }
 
-Access accessOf(const Peer& peer, const AccessLists& lists, std::uint32_t ownUid) {
+PeerRights rightsOf(const Peer& peer, const Access& lists, std::uint32_t ownUid) {
     if (peer.uid == 0 || peer.uid == ownUid) {
-        return Access::Administrator;
+        return PeerRights::Administrator;
     }
     if (namesUser(lists.adminUsers, peer.uid)) {
-        return Access::Administrator;
+        return PeerRights::Administrator;
     }
-    return namesUser(lists.users, peer.uid) || namesGroupOf(lists.groups, peer) ? Access::Client
-                                                                                : Access::Refused;
+    return namesUser(lists.users, peer.uid) || namesGroupOf(lists.groups, peer) ? PeerRights::Client
+                                                                                : PeerRights::None;
 }
 
 } // namespace halyard::linux_

@@ -5,6 +5,8 @@
 #include <string>
 #include <vector>
 
+#include "linux/Settings.h"
+
 namespace halyard::linux_ {
 
 struct Peer {
@@ -17,8 +19,8 @@ struct Peer {
     std::string description() const;
 };
 
-enum class Access {
-    Refused,
+enum class PeerRights {
+    None,
     Client,
     Administrator, // May also stop the service and use the admin methods.
 };
@@ -26,14 +28,7 @@ enum class Access {
 // The kernel's record of who connected `socket`.
 Peer peerOfSocket(int socket);
 
-// Users and groups by name or number. Names that do not exist match nobody.
-struct AccessLists {
-    std::vector<std::string> users;
-    std::vector<std::string> groups;
-    std::vector<std::string> adminUsers;
-};
-
 // The daemon's own uid and root may do everything.
-Access accessOf(const Peer& peer, const AccessLists& lists, std::uint32_t ownUid);
+PeerRights rightsOf(const Peer& peer, const Access& lists, std::uint32_t ownUid);
 
 } // namespace halyard::linux_

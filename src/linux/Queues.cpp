@@ -107,17 +107,21 @@ std::vector<std::shared_ptr<PooledSerialQueue>> Queues::busyRelayQueues() {
     return busy;
 }
 
-void Queues::drain(std::function<void()> done) {
+void Queues::onServiceQueue(platform::Task task) {
     std::shared_ptr<PooledSerialQueue> service;
     {
         const MutexLock lock(mutex_);
         service = serviceQueue_.lock();
     }
-    if (service == nullptr) {
-        drainRelayQueues(std::move(done));
-        return;
+    if (service != nullptr) {
+        service->async(std::move(task));
+    } else {
+        task(); // It has gone, and with it what it had to do.
     }
-    service->async([this, done = std::move(done)] { drainRelayQueues(done); });
+}
+
+void Queues::drain(std::function<void()> done) {
+    onServiceQueue([this, done = std::move(done)] { drainRelayQueues(done); });
 }
 
 void Queues::drainRelayQueues(std::function<void()> done) {

@@ -39,6 +39,9 @@ public:
     // the delayed background tasks, which do not wait for their moment any more.
     void drain(std::function<void()> done);
 
+    // Runs a task behind what the service queue has to do now.
+    void onServiceQueue(platform::Task task) HY_EXCLUDES(mutex_);
+
     std::size_t delayedTasks() const { return delayedCount_.load(); }
     void stop();
 

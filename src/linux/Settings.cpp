@@ -325,7 +325,7 @@ void SettingsReader::readMaxBytes(const toml::node& node, const std::string& nam
     }
     if (!bytes) {
         fail(node, fmt::format("{} must be a size such as \"256MiB\" or a number of bytes", name));
-    } else if (*bytes < StoreLimits::kLeastBytes) {
+    } else if (*bytes < StoreSettings::kLeastBytes) {
         fail(node, fmt::format("{} must be at least 256KiB", name));
     } else {
         settings().store.maxBytes = *bytes;

@@ -45,13 +45,13 @@ struct Access {
     bool operator==(const Access&) const = default;
 };
 
-struct StoreLimits {
+struct StoreSettings {
     static constexpr std::uint64_t kLeastBytes = 256 * kKiB;
 
     std::uint64_t maxBytes = 256 * kMiB;
     std::chrono::seconds maxAge = std::chrono::hours(7 * 24);
 
-    bool operator==(const StoreLimits&) const = default;
+    bool operator==(const StoreSettings&) const = default;
 };
 
 struct Settings {
@@ -62,7 +62,7 @@ struct Settings {
     Switches deviceProperties;
     std::vector<std::string> wantedEvents{"com.kestrel.halyard.*"}; // shell patterns
     Access access;
-    StoreLimits store;
+    StoreSettings store;
     LogLevel logLevel = LogLevel::Info;
     std::vector<DriverChannel> driverChannels;
 

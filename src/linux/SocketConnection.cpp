@@ -82,8 +82,8 @@ private:
 };
 
 SocketConnection::SocketConnection(asio::local::stream_protocol::socket socket, Peer peer,
-                                   Access access, ListenerShared& shared)
-    : socket_(std::move(socket)), peer_(std::move(peer)), access_(access), shared_(shared) {}
+                                   PeerRights rights, ListenerShared& shared)
+    : socket_(std::move(socket)), peer_(std::move(peer)), rights_(rights), shared_(shared) {}
 
 SocketConnection::~SocketConnection() = default;
 
@@ -218,7 +218,7 @@ bool SocketConnection::takeFrame(std::string_view frame,
         refuseCall(*call, std::move(call->error));
         return true;
     }
-    if (needsAdministrator(*call->method) && access_ != Access::Administrator) {
+    if (needsAdministrator(*call->method) && rights_ != PeerRights::Administrator) {
         refuseCall(*call, Error{std::string(kIpcErrorDomain),
                                 static_cast<std::int64_t>(IpcErrorCode::NotAllowed),
                                 fmt::format("{} is not allowed for uid {}",

@@ -30,13 +30,14 @@
 
 namespace halyard::linux_ {
 
+// Written on the io_context's thread, read on any.
 struct ListenerCounters {
-    std::uint64_t accepted = 0;
-    std::uint64_t refused = 0;
-    std::uint64_t broken = 0; // closed for what the peer sent or left lying
-    std::uint64_t requests = 0;
-    std::uint64_t badRequests = 0; // answered with an IPC error
-    std::uint64_t bytesRead = 0;
+    std::atomic<std::uint64_t> accepted{0};
+    std::atomic<std::uint64_t> refused{0};
+    std::atomic<std::uint64_t> broken{0}; // closed for what the peer sent or left lying
+    std::atomic<std::uint64_t> requests{0};
+    std::atomic<std::uint64_t> badRequests{0}; // answered with an IPC error
+    std::atomic<std::uint64_t> bytesRead{0};
 };
 
 class SocketConnection;
@@ -63,7 +64,7 @@ public:
     // More unsent bytes than this, and the peer is not read from.
     static constexpr std::size_t kUnsentPause = 64 * 1024;
 
-    SocketConnection(asio::local::stream_protocol::socket socket, Peer peer, Access access,
+    SocketConnection(asio::local::stream_protocol::socket socket, Peer peer, PeerRights rights,
                      ListenerShared& shared);
     ~SocketConnection() override;
 
@@ -100,7 +101,7 @@ private:
 
     asio::local::stream_protocol::socket socket_;
     const Peer peer_;
-    const Access access_;
+    const PeerRights rights_;
     ListenerShared& shared_;
 
     std::shared_ptr<platform::ExportedObject> exported_;

@@ -138,14 +138,14 @@ void SocketListener::acceptFailed(const asio::error_code& error) {
 
 void SocketListener::accepted(asio::local::stream_protocol::socket socket) {
     const Peer peer = peerOfSocket(socket.native_handle());
-    const Access access = authorizer_(peer);
-    if (access == Access::Refused) {
+    const PeerRights rights = authorizer_(peer);
+    if (rights == PeerRights::None) {
         refuse(peer);
         return;
     }
     refusedUid_.reset();
     ++shared_.counters.accepted;
-    auto connection = std::make_shared<SocketConnection>(std::move(socket), peer, access, shared_);
+    auto connection = std::make_shared<SocketConnection>(std::move(socket), peer, rights, shared_);
     shared_.connections.insert(connection);
     if (delegate_ == nullptr || !delegate_->shouldAcceptNewConnection(connection)) {
         connection->close();

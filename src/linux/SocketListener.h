@@ -24,7 +24,7 @@ namespace halyard::linux_ {
 
 class SocketListener final : public platform::Listener {
 public:
-    using Authorizer = std::function<Access(const Peer&)>;
+    using Authorizer = std::function<PeerRights(const Peer&)>;
 
     // Takes over a listening socket. Borrows `context` and `pressure`.
     SocketListener(asio::io_context& context, Pressure& pressure, int listeningSocket,
@@ -39,7 +39,7 @@ public:
     void stopAccepting();
     void closeAllConnections();
 
-    ListenerCounters counters() const { return shared_.counters; }
+    const ListenerCounters& counters() const { return shared_.counters; }
 
 private:
     void accept();

@@ -59,7 +59,7 @@ protected:
         const auto listening = listenAt(path_);
         EXPECT_EQ(listening.error, "");
         listener_ = std::make_unique<SocketListener>(context_, pressure_, listening.fd,
-                                                     [this](const Peer&) { return access_; });
+                                                     [this](const Peer&) { return rights_; });
         listener_->setDelegate(&delegate_);
         asio::post(context_, [this] { context_.stop(); });
         listener_->resume(); // Arms the acceptor.
@@ -146,7 +146,7 @@ protected:
     asio::io_context context_;
     Pressure pressure_;
     Delegate delegate_;
-    Access access_ = Access::Administrator;
+    PeerRights rights_ = PeerRights::Administrator;
     std::unique_ptr<SocketListener> listener_;
     std::vector<int> clients_;
 };
@@ -215,7 +215,7 @@ TEST_F(SocketListenerTest, AnUnknownMethodIsAnsweredAndTheConnectionLivesOn) {
 }
 
 TEST_F(SocketListenerTest, OrdinaryPeersMayNotAdminister) {
-    access_ = Access::Client;
+    rights_ = PeerRights::Client;
     const int client = connect();
     for (const Method method : {Method::KillService, Method::AdminFlush, Method::AdminStatus,
                                 Method::AdminPostNotification}) {
@@ -226,7 +226,7 @@ TEST_F(SocketListenerTest, OrdinaryPeersMayNotAdminister) {
 }
 
 TEST_F(SocketListenerTest, ARefusedPeerIsClosedAndLoggedOnceAnEpisode) {
-    access_ = Access::Refused;
+    rights_ = PeerRights::None;
     EXPECT_EQ(receive(connect()), "closed");
     EXPECT_EQ(receive(connect()), "closed");
 
@@ -353,19 +353,19 @@ TEST_F(SocketListenerTest, AFileInTheWayIsLeftAlone) {
     EXPECT_TRUE(std::filesystem::exists(other));
 }
 
-TEST(AccessOf, KnowsItsOwnUidAndRoot) {
-    EXPECT_EQ(accessOf({1, 1000, 1000, {}}, {}, 1000), Access::Administrator);
-    EXPECT_EQ(accessOf({1, 0, 0, {}}, {}, 1000), Access::Administrator);
-    EXPECT_EQ(accessOf({1, 1001, 1001, {}}, {}, 1000), Access::Refused);
+TEST(RightsOf, KnowsItsOwnUidAndRoot) {
+    EXPECT_EQ(rightsOf({1, 1000, 1000, {}}, {}, 1000), PeerRights::Administrator);
+    EXPECT_EQ(rightsOf({1, 0, 0, {}}, {}, 1000), PeerRights::Administrator);
+    EXPECT_EQ(rightsOf({1, 1001, 1001, {}}, {}, 1000), PeerRights::None);
 }
 
-TEST(AccessOf, FollowsTheLists) {
-    const AccessLists lists{{"1001"}, {"29"}, {"1003"}};
-    EXPECT_EQ(accessOf({1, 1001, 1001, {}}, lists, 0), Access::Client);
-    EXPECT_EQ(accessOf({1, 1002, 1002, {29}}, lists, 0), Access::Client);
-    EXPECT_EQ(accessOf({1, 1002, 29, {}}, lists, 0), Access::Client);
-    EXPECT_EQ(accessOf({1, 1003, 1003, {}}, lists, 0), Access::Administrator);
-    EXPECT_EQ(accessOf({1, 1004, 1004, {30}}, lists, 0), Access::Refused);
+TEST(RightsOf, FollowsTheLists) {
+    const Access lists{{"1001"}, {"29"}, {"1003"}};
+    EXPECT_EQ(rightsOf({1, 1001, 1001, {}}, lists, 0), PeerRights::Client);
+    EXPECT_EQ(rightsOf({1, 1002, 1002, {29}}, lists, 0), PeerRights::Client);
+    EXPECT_EQ(rightsOf({1, 1002, 29, {}}, lists, 0), PeerRights::Client);
+    EXPECT_EQ(rightsOf({1, 1003, 1003, {}}, lists, 0), PeerRights::Administrator);
+    EXPECT_EQ(rightsOf({1, 1004, 1004, {30}}, lists, 0), PeerRights::None);
 }
 
 TEST(PeerOfSocket, TellsWhoConnected) {

@@ -1,0 +1,245 @@
+#include "linux/LinuxPlatform.h"
+
+#include <array>
+#include <asio/post.hpp>
+#include <csignal>
+#include <cstdlib>
+#include <systemd/sd-daemon.h>
+#include <unistd.h>
+#include <utility>
+
+#include "linux/PreferenceNotifications.h"
+#include "platform/Log.h"
+
+namespace halyard::linux_ {
+namespace {
+
+constexpr const char* kSocketName = "reporting";
+constexpr const char* kSocketFile = "reporting.sock";
+constexpr const char* kStoreFile = "telemetry.db";
+// Sessions may wait nine seconds for their back ends, the store ten for a disk.
+constexpr std::chrono::seconds kShutdownLimit{25};
+
+StoreOptions storeOptions(const std::filesystem::path& directory, Pressure& pressure) {
+    StoreOptions options;
+    options.path = directory / kStoreFile;
+    options.onPressure = [&pressure](bool on) { pressure.set(Pressure::Store, on); };
+    return options;
+}
+
+Dictionary describe(const ListenerCounters& counters) {
+    return Dictionary{{"accepted", counters.accepted.load()},
+                      {"refused", counters.refused.load()},
+                      {"broken", counters.broken.load()},
+                      {"requests", counters.requests.load()},
+                      {"bad_requests", counters.badRequests.load()},
+                      {"bytes_read", counters.bytesRead.load()}};
+}
+
+// In the order of StoreTable and StoreLoss.
+constexpr std::array<const char*, kStoreTables> kTableNames = {
+    "upload_session", "upload_message", "analytics_event", "energy_event", "metric", "incident"};
+constexpr std::array<const char*, kStoreLosses> kLossNames = {
+    "no_store", "disk_full", "read_only", "locked", "io_error", "stuck", "rejected"};
+
+template <std::size_t Size>
+Dictionary named(const std::array<const char*, Size>& names,
+                 const std::array<std::uint64_t, Size>& counts) {
+    Dictionary result;
+    for (std::size_t i = 0; i < Size; ++i) {
+        result.set(names[i], counts[i]);
+    }
+    return result;
+}
+
+Dictionary describe(const StoreStatus& store) {
+    return Dictionary{{"open", store.open},
+                      {"failing", store.failing},
+                      {"rows", named(kTableNames, store.rows)},
+                      {"lost", named(kLossNames, store.lost)},
+                      {"commits", store.commits},
+                      {"queued_rows", store.queuedRows},
+                      {"queued_bytes", store.queuedBytes},
+                      {"file_bytes", store.fileBytes},
+                      {"log_bytes", store.logBytes}};
+}
+
+} // namespace
+
+LinuxPlatform::LinuxPlatform(Directories directories, platform::TraceMarks& traceMarks)
+    : directories_(std::move(directories)), stopSignals_(context_, SIGTERM, SIGINT),
+      reloadSignals_(context_, SIGHUP), watchdog_(context_), shutdownLimit_(context_),
+      log_(LogWriter::defaultOutput()), configuration_(directories_.configuration),
+      ownProcess_([this] {
+          // The service was asked to die at once; what it accepted need not.
+          (void)store_->close();
+          log_.flush();
+      }),
+      startTime_(clock_.steadyTime()) {
+    std::signal(SIGPIPE, SIG_IGN);
+    platform_.log = &log_;
+    platform_.clock = &clock_;
+    platform::install(&platform_);
+    (void)configuration_.reload();
+    log_.setLevel(configuration_.settings()->logLevel);
+
+    store_ = std::make_unique<Store>(storeOptions(directories_.state, pressure_), clock_);
+    relayReporting_ = std::make_unique<StoreRelayReporting>(*store_, random_);
+    analytics_ = std::make_unique<StoreAnalyticsService>(*store_);
+    energyLedger_ = std::make_unique<StoreEnergyLedger>(*store_);
+    metrics_ = std::make_unique<StoreMetricService>(*store_);
+    incidents_ = std::make_unique<IncidentFolder>(
+        clock_,
+        IncidentFolder::Options{
+            directories_.state / "incidents", "/proc", [this] { return log_.recentLines(); },
+            [this](const Dictionary& signature, std::string_view report, platform::WallTime) {
+                (void)store_->addIncident(signature, report);
+            }});
+    queues_ = std::make_unique<Queues>(context_, pressure_);
+    applySettings(*configuration_.settings());
+
+    platform_.random = &random_;
+    platform_.queues = queues_.get();
+    platform_.conditions = &conditions_;
+    platform_.traceMarks = &traceMarks;
+    platform_.preferences = &configuration_;
+    platform_.featureFlags = &configuration_;
+    platform_.deviceProperties = &configuration_;
+    platform_.notifications = &notifications_;
+    platform_.processTable = &processTable_;
+    platform_.ownProcess = &ownProcess_;
+    platform_.relayReporting = relayReporting_.get();
+    platform_.analytics = analytics_.get();
+    platform_.energyLedger = energyLedger_.get();
+    platform_.metrics = metrics_.get();
+    platform_.incidentReporter = incidents_.get();
+    platform_.operations = this;
+}
+
+LinuxPlatform::~LinuxPlatform() {
+    configurationWatch_.reset();
+    queues_->stop();
+    incidents_.reset();
+    listener_.reset();
+    if (!store_->close()) {
+        log_.flush();
+        std::_Exit(EXIT_SUCCESS); // A disk that hangs: nothing more can be saved.
+    }
+}
+
+void LinuxPlatform::applySettings(const Settings& settings) {
+    log_.setLevel(settings.logLevel);
+    analytics_->setWanted(settings.wantedEvents);
+    store_->setLimits({settings.store.maxBytes, settings.store.maxAge});
+}
+
+PeerRights LinuxPlatform::rightsOfPeer(const Peer& peer) const {
+    return rightsOf(peer, configuration_.settings()->access, ::getuid());
+}
+
+std::optional<std::string> LinuxPlatform::open(platform::ListenerDelegate* delegate) {
+    ListeningSocket listening{inheritedSocket(kSocketName), {}};
+    if (listening.fd < 0) {
+        listening = listenAt((directories_.runtime / kSocketFile).string());
+    }
+    if (listening.fd < 0) {
+        return listening.error;
+    }
+    listener_ = std::make_unique<SocketListener>(
+        context_, pressure_, listening.fd, [this](const Peer& peer) { return rightsOfPeer(peer); });
+    listener_->setDelegate(delegate);
+    watchStopSignals();
+    watchReloadSignal();
+    watchConfiguration();
+    return std::nullopt;
+}
+
+void LinuxPlatform::watchStopSignals() {
+    stopSignals_.async_wait([this](const asio::error_code& error, int) {
+        if (!error) {
+            beginShutdown();
+            watchStopSignals();
+        }
+    });
+}
+
+void LinuxPlatform::watchReloadSignal() {
+    reloadSignals_.async_wait([this](const asio::error_code& error, int) {
+        if (!error) {
+            (void)configuration_.reload();
+            watchReloadSignal();
+        }
+    });
+}
+
+void LinuxPlatform::watchConfiguration() {
+    configuration_.observe(
+        [this](const Settings&, const Settings& after) { applySettings(after); });
+    announceChangedPreferences(configuration_, notifications_);
+    configurationWatch_ = std::make_unique<ConfigurationWatch>(
+        context_, std::filesystem::absolute(directories_.configuration), Configuration::kFileName,
+        [this] { (void)configuration_.reload(); });
+}
+
+// The service queue answers the manager's watchdog: it is what must not hang.
+void LinuxPlatform::armWatchdog() {
+    std::uint64_t period = 0;
+    if (::sd_watchdog_enabled(0, &period) <= 0) {
+        return;
+    }
+    watchdog_.expires_after(std::chrono::microseconds(period / 2));
+    watchdog_.async_wait([this](const asio::error_code& error) {
+        if (!error) {
+            queues_->onServiceQueue([] { ::sd_notify(0, "WATCHDOG=1"); });
+            armWatchdog();
+        }
+    });
+}
+
+void LinuxPlatform::serve() {
+    armWatchdog();
+    ::sd_notify(0, "READY=1");
+    listener_->resume();
+}
+
+void LinuxPlatform::beginShutdown() {
+    if (std::exchange(stopping_, true)) {
+        return;
+    }
+    ::sd_notify(0, "STOPPING=1");
+    listener_->stopAccepting();
+    listener_->closeAllConnections(); // Their sessions stop as with any lost one.
+    flush([this] { asio::post(context_, [this] { finishShutdown(true); }); });
+    shutdownLimit_.expires_after(kShutdownLimit);
+    shutdownLimit_.async_wait([this](const asio::error_code& error) {
+        if (!error) {
+            finishShutdown(false);
+        }
+    });
+}
+
+void LinuxPlatform::finishShutdown(bool inTime) {
+    if (!inTime) {
+        HY_LOG_ERROR(HYReportingPlatformCategory, "stopping with work left undone");
+    }
+    context_.stop();
+}
+
+void LinuxPlatform::flush(std::function<void()> done) {
+    queues_->drain([this, done = std::move(done)] { store_->flush(done); });
+}
+
+Dictionary LinuxPlatform::status() const {
+    const StoreStatus store = store_->status();
+    const std::chrono::duration<double> uptime = clock_.steadyTime() - startTime_;
+    return Dictionary{{"version", HALYARD_VERSION},
+                      {"pid", ownProcess_.pid()},
+                      {"uptime_sec", uptime.count()},
+                      {"under_pressure", pressure_.isOn()},
+                      {"delayed_messages", queues_->delayedTasks()},
+                      {"log_lines_dropped", log_.droppedLines()},
+                      {"listener", describe(listener_->counters())},
+                      {"store", describe(store)}};
+}
+
+} // namespace halyard::linux_

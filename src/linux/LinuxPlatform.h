@@ -1,0 +1,95 @@
+// The platform made of the real adapters, and what runs them: the socket, the
+// signals, the store, the configuration file.
+//
+// Made and served by main on its thread, which becomes the delivery thread of
+// the connections.
+#pragma once
+
+#include <asio/io_context.hpp>
+#include <asio/signal_set.hpp>
+#include <asio/steady_timer.hpp>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "linux/Configuration.h"
+#include "linux/ConfigurationWatch.h"
+#include "linux/Directories.h"
+#include "linux/IncidentFolder.h"
+#include "linux/LinuxFacts.h"
+#include "linux/LogWriter.h"
+#include "linux/NotificationCenter.h"
+#include "linux/Pressure.h"
+#include "linux/ProcProcessTable.h"
+#include "linux/Queues.h"
+#include "linux/SocketListener.h"
+#include "linux/Store.h"
+#include "linux/StoreEventServices.h"
+#include "linux/StoreRelayReporting.h"
+#include "platform/Operations.h"
+#include "platform/Platform.h"
+#include "platform/TraceMarks.h"
+
+namespace halyard::linux_ {
+
+class LinuxPlatform final : private platform::Operations {
+public:
+    // Borrows `traceMarks`. Requires directories that exist.
+    LinuxPlatform(Directories directories, platform::TraceMarks& traceMarks);
+    ~LinuxPlatform() override;
+
+    const platform::Platform& platform() const { return platform_; }
+
+    // Opens the socket, inherited or made; the text says why there is none.
+    // Requires that the platform is installed.
+    [[nodiscard]] std::optional<std::string> open(platform::ListenerDelegate* delegate);
+    // Serves until SIGTERM or SIGINT, then ends every connection, delivers and
+    // commits what was accepted.
+    void serve();
+
+private:
+    void flush(std::function<void()> done) override;
+    Dictionary status() const override;
+
+    void applySettings(const Settings& settings);
+    void watchStopSignals();
+    void watchReloadSignal();
+    void watchConfiguration();
+    void armWatchdog();
+    void beginShutdown();
+    void finishShutdown(bool inTime);
+    PeerRights rightsOfPeer(const Peer& peer) const;
+
+    const Directories directories_;
+    asio::io_context context_;
+    asio::signal_set stopSignals_;
+    asio::signal_set reloadSignals_;
+    asio::steady_timer watchdog_;
+    asio::steady_timer shutdownLimit_;
+
+    SystemClock clock_;
+    SystemRandom random_;
+    SystemConditions conditions_;
+    LogWriter log_;
+    Pressure pressure_;
+    Configuration configuration_;
+    NotificationCenter notifications_;
+    ProcProcessTable processTable_;
+    ProcOwnProcess ownProcess_;
+    std::unique_ptr<Store> store_;
+    std::unique_ptr<StoreRelayReporting> relayReporting_;
+    std::unique_ptr<StoreAnalyticsService> analytics_;
+    std::unique_ptr<StoreEnergyLedger> energyLedger_;
+    std::unique_ptr<StoreMetricService> metrics_;
+    std::unique_ptr<IncidentFolder> incidents_;
+    std::unique_ptr<Queues> queues_;
+    std::unique_ptr<ConfigurationWatch> configurationWatch_;
+    std::unique_ptr<SocketListener> listener_;
+    platform::Platform platform_;
+    platform::SteadyTime startTime_;
+    bool stopping_ = false;
+};
+
+} // namespace halyard::linux_
