@@ -1,6 +1,7 @@
 #include "common/Value.h"
 
 #include <algorithm>
+#include <array>
 #include <cassert>
 #include <charconv>
 #include <cmath>
@@ -398,9 +399,11 @@ void DictionaryBlock::rebuildOrder() {
 void DictionaryBlock::removeDuplicatesAndNone() {
     rebuildOrder();
     if (order.empty()) {
+        std::array<std::string_view, Dictionary::kIndexedAbove> keys;
         for (std::size_t i = 0; i < entries.size(); ++i) {
+            keys[i] = entries[i].key.text();
             for (std::size_t j = 0; j < i; ++j) {
-                if (entries[j].key == entries[i].key) {
+                if (keys[j] == keys[i]) {
                     entries[j].value = Value(); // The later one wins.
                 }
             }
