@@ -12,12 +12,39 @@ void FrameScanner::reset() {
 
 FrameScanner::Outcome FrameScanner::scan(std::string_view stream) {
     while (pending_ > 0) {
+        skipPlain(stream);
+        if (pending_ == 0) {
+            break;
+        }
         const Outcome outcome = step(stream.substr(position_));
         if (outcome != Outcome::Complete) {
             return outcome;
         }
     }
     return Outcome::Complete;
+}
+
+void FrameScanner::skipPlain(std::string_view stream) {
+    std::size_t at = position_;
+    std::uint32_t pending = pending_;
+    while (depth_ > 0) {
+        std::uint32_t left = remaining_[depth_ - 1];
+        for (; left > 0 && at < stream.size(); --left, --pending) {
+            const std::size_t length = kPlainLengths[static_cast<unsigned char>(stream[at])];
+            if (length == 0 || stream.size() - at < length ||
+                at + length + (pending - 1) > kMaxFrameBytes) {
+                break;
+            }
+            at += length;
+        }
+        remaining_[depth_ - 1] = left;
+        if (left > 0) {
+            break;
+        }
+        --depth_;
+    }
+    position_ = at;
+    pending_ = pending;
 }
 
 FrameScanner::Outcome FrameScanner::step(std::string_view rest) {
@@ -67,7 +94,7 @@ void FrameScanner::take(bool opens, std::uint32_t children) {
         elements_ += children;
     }
     while (depth_ > 0 && remaining_[depth_ - 1] == 0) {
-        --depth_;
+        --depth_; // The next object belongs to what is around it.
     }
 }
 

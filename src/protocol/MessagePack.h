@@ -3,6 +3,7 @@
 #pragma once
 
 #include <array>
+#include <bit>
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
@@ -117,13 +118,32 @@ inline constexpr auto kFormats = [] {
     return formats;
 }();
 
+// The bytes an object takes when its first byte alone tells (most do: small
+// integers, short text, reals), and 0 for containers and all others.
+inline constexpr auto kPlainLengths = [] {
+    std::array<std::uint8_t, 256> lengths{};
+    for (unsigned byte = 0; byte < lengths.size(); ++byte) {
+        const Format format = kFormats[byte];
+        if (format.family != Family::Invalid && !isContainer(format.family) &&
+            format.lengthBytes == 0) {
+            lengths[byte] = static_cast<std::uint8_t>(1 + format.size);
+        }
+    }
+    return lengths;
+}();
+
 template <class Unsigned> Unsigned loadBig(const char* from) noexcept {
     Unsigned value = 0;
-    for (std::size_t i = 0; i < sizeof(Unsigned); ++i) { // One load and a swap, once compiled.
-        value = static_cast<Unsigned>(value << 7U << 1U) |
-                static_cast<Unsigned>(static_cast<unsigned char>(from[i]));
+    std::memcpy(&value, from, sizeof(value));
+    if constexpr (std::endian::native == std::endian::big || sizeof(value) == 1) {
+        return value;
+    } else if constexpr (sizeof(value) == 2) {
+        return __builtin_bswap16(value);
+    } else if constexpr (sizeof(value) == 4) {
+        return __builtin_bswap32(value);
+    } else {
+        return __builtin_bswap64(value);
     }
-    return value;
 }
 
 // Requires that `bytes` is 0, 1, 2, 4 or 8.
@@ -177,8 +197,10 @@ public:
         if (format.family == Family::Invalid || left < head) {
             return invalid();
         }
-        const Token token{format.family, format.size + loadBig(at_ + 1, format.lengthBytes),
-                          at_ + head};
+        Token token{format.family, format.size, at_ + head};
+        if (format.lengthBytes != 0) {
+            token.size += loadBig(at_ + 1, format.lengthBytes);
+        }
         const std::size_t needed = isContainer(token.family) ? token.children() : token.size;
         if (left - head < needed) {
             return invalid();

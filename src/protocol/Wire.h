@@ -49,6 +49,8 @@ public:
     void reset();
 
 private:
+    // Passes the objects that need no second look, as far as they go.
+    void skipPlain(std::string_view stream);
     // Complete: one more object has been passed.
     Outcome step(std::string_view rest);
     void take(bool opens, std::uint32_t children);
