@@ -5,7 +5,6 @@
 #pragma once
 
 #include <fmt/core.h>
-#include <source_location>
 #include <string>
 
 #include "common/Description.h"
@@ -20,12 +19,19 @@ template <> struct fmt::formatter<halyard::Value> {
 
 namespace halyard::platform {
 
+// Where a line stands in the sources.
+struct LogPlace {
+    const char* file;
+    int line;
+    const char* function;
+};
+
 [[nodiscard]] bool logEnabled(LogLevel level);
-void logFormatted(LogLevel level, LogCategory category, const std::source_location& where,
+void logFormatted(LogLevel level, LogCategory category, const LogPlace& where,
                   fmt::string_view format, fmt::format_args arguments);
 
 template <class... Arguments>
-void log(LogLevel level, LogCategory category, const std::source_location& where,
+void log(LogLevel level, LogCategory category, const LogPlace& where,
          fmt::format_string<Arguments...> format, Arguments&&... arguments) {
     logFormatted(level, category, where, format, fmt::make_format_args(arguments...));
 }
@@ -35,7 +41,7 @@ void log(LogLevel level, LogCategory category, const std::source_location& where
 #define HY_LOG(level, category, ...)                                                               \
     do {                                                                                           \
         if (::halyard::platform::logEnabled(level)) {                                              \
-            ::halyard::platform::log(level, category, std::source_location::current(),             \
+            ::halyard::platform::log(level, category, {__FILE__, __LINE__, __func__},              \
                                      __VA_ARGS__);                                                 \
         }                                                                                          \
     } while (false)

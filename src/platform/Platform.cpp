@@ -43,11 +43,11 @@ bool logEnabled(LogLevel level) {
     return installed != nullptr && installed->log->isEnabled(level);
 }
 
-void logFormatted(LogLevel level, LogCategory category, const std::source_location& where,
+void logFormatted(LogLevel level, LogCategory category, const LogPlace& where,
                   fmt::string_view format, fmt::format_args arguments) {
     const std::string text = fmt::vformat(format, arguments);
-    installed->log->write({level, category, baseName(where.file_name()),
-                           static_cast<int>(where.line()), where.function_name(), text});
+    installed->log->write(
+        {level, category, baseName(where.file), where.line, where.function, text});
 }
 
 } // namespace halyard::platform
