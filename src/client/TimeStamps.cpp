@@ -92,8 +92,11 @@ Stamps writeMissingStamps(char* out, StampSet present, const Clock& clock) noexc
     const std::int64_t boot = clock.bootNanoseconds();
     Stamps stamps;
     if ((present & kTimestamp) == 0) {
+        // In two parts: as nanoseconds, today's dates have more digits than a double.
+        const std::int64_t real = clock.realNanoseconds();
         const double seconds =
-            static_cast<double>(clock.realNanoseconds()) / double{kNanosecondsPerSecond};
+            static_cast<double>(real / kNanosecondsPerSecond) +
+            static_cast<double>(real % kNanosecondsPerSecond) / double{kNanosecondsPerSecond};
         out = writeEntry(out, kKeys[0], kFloat64, std::bit_cast<std::uint64_t>(seconds));
         ++stamps.entries;
     }

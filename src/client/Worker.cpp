@@ -47,6 +47,9 @@ void Worker::step() {
     const bool more = connection_.isOpen() && pump();
     cutIfNeeded();
     client_.announceReleased();
+    if (closingSeen_ && isDelivered()) {
+        return; // Nothing to wait for.
+    }
     wait(more);
     if (connection_.isOpen() && answersReady_) {
         readAnswers();
@@ -340,6 +343,10 @@ void Worker::readAnswers() {
 
 // ---- The end --------------------------------------------------------------------
 
+bool Worker::isDelivered() const {
+    return connection_.isOpen() && queueIsRead() && outbox_.allWritten() && replies_.empty();
+}
+
 bool Worker::finished() {
     if (!client_.isClosing()) {
         return false;
@@ -350,7 +357,7 @@ bool Worker::finished() {
     if (noDaemon_ || steady_clock::now() >= client_.closingDeadline()) {
         return true;
     }
-    if (!queueIsRead() || client_.ring().releasedTo() != cursor_ || !outbox_.allWritten()) {
+    if (!queueIsRead() || !outbox_.allWritten()) {
         return false;
     }
     if (!connection_.isOpen()) {
@@ -360,7 +367,7 @@ bool Worker::finished() {
         destroyAbandoned();
         sayGoodbye();
     }
-    return outbox_.allWritten() && replies_.empty();
+    return isDelivered();
 }
 
 void Worker::giveUpRest() {

@@ -41,6 +41,7 @@ private:
 
     void step();
     bool finished();
+    bool isDelivered() const;
     void giveUpRest();
 
     // Connection

@@ -1,0 +1,25 @@
+/* The program of docs/client.md: reports one session of playback. Built as C11
+ * against the shared library, and run by the tests. */
+#include <halyard/halyard.h>
+
+int main(int argc, char **argv) {
+    halyard_client *client = halyard_client_create(argc > 1 ? argv[1] : NULL);
+    halyard_session *session = halyard_session_create(client, 0);
+    halyard_dictionary *facts = halyard_dictionary_create(0);
+
+    halyard_dictionary_set_string(facts, "HostApplicationDisplayID", "org.example.player");
+    halyard_session_set_service_type(session, HALYARD_SERVICE_LONG_FORM_AUDIO);
+    halyard_session_set_configuration(session, facts);
+    halyard_session_start(session, NULL, NULL);
+
+    halyard_dictionary_clear(facts);
+    halyard_dictionary_set_uint(facts, "sample_rate", 48000);
+    halyard_dictionary_set_string(facts, "route", "speaker");
+    halyard_session_send(session, facts, HALYARD_CATEGORY_PLAYBACK, HALYARD_TYPE_START);
+    /* ... play ... */
+    halyard_session_stop(session, NULL, NULL);
+
+    halyard_dictionary_destroy(facts);
+    halyard_session_destroy(session);
+    return halyard_client_destroy(client, 1000) == HALYARD_OK ? 0 : 1;
+}
