@@ -31,7 +31,8 @@ FOLDERS = {
 }
 # Files that see more than their folder does.
 EXTRA = {"service/main.cpp": {"linux", "client"}}
-# A unit test (X_test.cpp, and what several of them share) also sees the fakes.
+# A unit test (X_test.cpp, and what several of them share) also sees the fakes;
+# nothing but tests sees what they share.
 TEST_FILES = ("_test.cpp", "Fixture.h", "TestSupport.h")
 TEST_EXTRA = {"testing"}
 # Programs beside the daemon are clients of it.
@@ -102,6 +103,8 @@ class File:
                 return None if self.folder is None else f'write "{name}" from src/ on'
             if first not in self.sees:
                 return f"{self.folder or 'tools'} does not see {first}"
+            if name.endswith(TEST_FILES) and not self.is_test:
+                return f"{name} is for tests"
             return None
         if not self.is_core or self.is_test:
             return None
@@ -154,6 +157,8 @@ ALLOWED = {
     "src/common/A.cpp": '#include "common/A.h"\n#include <vector>\n#include <fmt/core.h>\n',
     "src/session/A.cpp": '#include "sinks/B.h"\n#include "protocol/Wire.h"\n// calls now() never\n',
     "src/session/A_test.cpp": '#include "testing/Fake.h"\n#include <gtest/gtest.h>\n',
+    "src/sinks/SinkFixture.h": '#include "testing/Fake.h"\n#include <gtest/gtest.h>\n',
+    "src/sinks/A_test.cpp": '#include "sinks/SinkFixture.h"\n',
     "src/service/main.cpp": '#include "linux/Server.h"\n#include "client/Mark.h"\n'
                             "#include <unistd.h>\n",
     "src/linux/A.cpp": '#include "platform/Clock.h"\n#include <asio.hpp>\n#include <thread>\n'
@@ -173,6 +178,7 @@ FORBIDDEN = {
     "src/session/B.cpp": "auto t = Clock::now();\n",
     "src/session/B_test.cpp": "std::this_thread::sleep_for(1s);\n",
     "src/session/C_test.cpp": '#include "linux/Server.h"\n',
+    "src/session/D.cpp": '#include "sinks/SinkFixture.h"\n',
     "src/drivers/A.cpp": "#include <thread>\n",
     "src/drivers/B.cpp": "#include <sqlite3.h>\n",
     "src/service/A.cpp": '#include "linux/Server.h"\n',
