@@ -1,5 +1,7 @@
 #include "service/ServiceFixture.h"
 
+#include <thread>
+
 namespace halyard {
 namespace {
 
@@ -90,6 +92,22 @@ TEST_F(HYReportingServiceDelegateTest, OfTwoClientsWithOneIDTheFirstWins) {
 TEST_F(HYReportingServiceDelegateTest, AFailedLookupIsAnError) {
     EXPECT_EQ(service_->findReportingSessionForID(-7), nullptr);
     EXPECT_TRUE(logged(LogLevel::Error, "failed to find reporting session -7"));
+}
+
+TEST_F(HYReportingServiceDelegateTest, LookupsOfOtherThreadsSeeWholeMaps) {
+    const Peer peer = connect(100);
+    std::thread reader([this] {
+        for (int i = 0; i < 200; ++i) {
+            const auto found = service_->findReportingSessionForID(7);
+            EXPECT_TRUE(found == nullptr || found->reporterID() == 7);
+        }
+    });
+    for (int i = 0; i < 50; ++i) {
+        peer.create(7);
+        connect(200).connection().invalidate();
+        peer.destroy(7);
+    }
+    reader.join();
 }
 
 TEST_F(HYReportingServiceDelegateTest, ListsTheStartedSessionsOfAllClients) {
