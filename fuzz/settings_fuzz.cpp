@@ -1,0 +1,46 @@
+// The configuration file is an operator's, but no text may do more than be
+// refused.
+
+#include <cstdint>
+#include <cstdlib>
+#include <string_view>
+#include <variant>
+
+#include "linux/Settings.h"
+
+using halyard::linux_::ParsedSettings;
+using halyard::linux_::SettingsError;
+
+namespace {
+
+void require(bool holds) {
+    if (!holds) {
+        std::abort();
+    }
+}
+
+void check(const ParsedSettings& parsed) {
+    using namespace halyard::linux_;
+    require(parsed.settings.store.maxBytes >= StoreLimits::kLeastBytes);
+    require(parsed.settings.store.maxAge.count() >= 1);
+    require(parsed.settings.store.maxAge <= kMaxDuration);
+    require(parsed.warnings.size() <= kMaxSettingsWarnings);
+    require(parsed.settings.driverChannels.size() <= kMaxDriverChannels);
+    for (const DriverChannel& channel : parsed.settings.driverChannels) {
+        require(channel.group || channel.subgroup);
+        require(!channel.name.empty() && channel.source.find(':') != std::string::npos);
+    }
+}
+
+} // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
+    const auto result =
+        halyard::linux_::parseSettings({reinterpret_cast<const char*>(data), size}, "fuzz");
+    if (const auto* const error = std::get_if<SettingsError>(&result)) {
+        require(!error->message.empty() && error->file == "fuzz");
+    } else {
+        check(std::get<ParsedSettings>(result));
+    }
+    return 0;
+}
