@@ -21,7 +21,7 @@ void require(bool holds) {
 
 void check(const ParsedSettings& parsed) {
     using namespace halyard::linux_;
-    require(parsed.settings.store.maxBytes >= StoreLimits::kLeastBytes);
+    require(parsed.settings.store.maxBytes >= decltype(Settings::store)::kLeastBytes);
     require(parsed.settings.store.maxAge.count() >= 1);
     require(parsed.settings.store.maxAge <= kMaxDuration);
     require(parsed.warnings.size() <= kMaxSettingsWarnings);
