@@ -20,9 +20,14 @@ constexpr const char* kStoreFile = "telemetry.db";
 // Sessions may wait nine seconds for their back ends, the store ten for a disk.
 constexpr std::chrono::seconds kShutdownLimit{25};
 
+// What waits for the disk is accepted, and accepted means durable within half a
+// second: these rows take a slow machine less than that.
+constexpr StoreQueue::Marks kStoreMarks{12288, 6144, 16 * 1024 * 1024, 8 * 1024 * 1024};
+
 StoreOptions storeOptions(const std::filesystem::path& directory, Pressure& pressure) {
     StoreOptions options;
     options.path = directory / kStoreFile;
+    options.marks = kStoreMarks;
     options.onPressure = [&pressure](bool on) { pressure.set(Pressure::Store, on); };
     return options;
 }
