@@ -235,7 +235,7 @@ void StreamTracker::open(Node& stream) {
         client = found == clients_.end() ? kNobody : found->second;
     }
     const Direction direction = *stream.direction;
-    Session& session = stream.session.emplace();
+    Session& session = stream.session.emplace(Session{});
     session.reporterID = nextReporterID_++;
     session.operationProcess = processName(stream.properties, client);
     if (session.operationProcess.empty()) {
