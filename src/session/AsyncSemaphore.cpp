@@ -8,16 +8,18 @@ void AsyncSemaphore::signal() {
     std::shared_ptr<Waiter> waiter;
     {
         const MutexLock lock(mutex_);
-        waiter = std::exchange(waiter_, nullptr);
+        waiter = std::exchange(waiter_, {}).lock();
         if (waiter == nullptr) {
             ++count_;
             return;
         }
     }
-    if (!waiter->queue->resume([done = waiter->done] { done(true); })) {
-        const MutexLock lock(mutex_);
-        ++count_; // It had just given up.
+    if (waiter->queue->resume([done = waiter->done] { done(true); })) {
+        waiter->done = nullptr; // A queue may hold its timer longer than the wait.
+        return;
     }
+    const MutexLock lock(mutex_);
+    ++count_; // It had just given up.
 }
 
 bool AsyncSemaphore::takeSignalOrEnlist(const std::shared_ptr<platform::SerialQueue>& queue,
@@ -33,8 +35,8 @@ bool AsyncSemaphore::takeSignalOrEnlist(const std::shared_ptr<platform::SerialQu
     queue->suspend(limit, [self = shared_from_this(), waiter] {
         {
             const MutexLock relock(self->mutex_);
-            if (self->waiter_ == waiter) {
-                self->waiter_ = nullptr;
+            if (self->waiter_.lock() == waiter) {
+                self->waiter_.reset();
             }
         }
         waiter->done(false);

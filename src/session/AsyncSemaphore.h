@@ -29,6 +29,8 @@ public:
               Done done) HY_EXCLUDES(mutex_);
 
 private:
+    // Owned by the suspended queue: were it ours, whoever waits for its own
+    // semaphore would keep itself alive.
     struct Waiter {
         std::shared_ptr<platform::SerialQueue> queue;
         Done done;
@@ -39,7 +41,7 @@ private:
 
     Mutex mutex_;
     int count_ HY_GUARDED_BY(mutex_) = 0;
-    std::shared_ptr<Waiter> waiter_ HY_GUARDED_BY(mutex_);
+    std::weak_ptr<Waiter> waiter_ HY_GUARDED_BY(mutex_);
 };
 
 } // namespace halyard

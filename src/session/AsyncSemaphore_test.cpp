@@ -90,6 +90,28 @@ TEST_F(AsyncSemaphoreTest, HoldsNoOtherQueueBack) {
     EXPECT_THAT(happened_, ElementsAre("other"));
 }
 
+TEST_F(AsyncSemaphoreTest, AWaitThatEndsLetsGoOfWhatItHeld) {
+    auto held = std::make_shared<int>();
+    const std::weak_ptr<int> watch = held;
+    queue_->async(
+        [this, held = std::move(held)] { semaphore_->wait(queue_, 9s, [held](bool) {}); });
+    queues_.runUntilIdle();
+    EXPECT_FALSE(watch.expired());
+    semaphore_->signal();
+    queues_.runUntilIdle();
+    EXPECT_TRUE(watch.expired());
+}
+
+TEST_F(AsyncSemaphoreTest, AWaitIsDroppedWithItsQueue) {
+    wait(queue_);
+    const std::weak_ptr<AsyncSemaphore> watch = semaphore_;
+    queues_.clear();
+    EXPECT_EQ(watch.use_count(), 1) << "only the fixture is left";
+    semaphore_->signal();
+    wait(queues_.makeSerialQueue("next", platform::QueuePriority::Utility));
+    EXPECT_THAT(happened_, ElementsAre("signalled", "next"));
+}
+
 // A queue whose limit has run out, though its timeout has not yet been told.
 class GivenUpQueue final : public platform::SerialQueue {
 public:
