@@ -2,10 +2,10 @@
  * against the shared library, and run by the tests. */
 #include <halyard/halyard.h>
 
-int main(int argc, char **argv) {
-    halyard_client *client = halyard_client_create(argc > 1 ? argv[1] : NULL);
-    halyard_session *session = halyard_session_create(client, 0);
-    halyard_dictionary *facts = halyard_dictionary_create(0);
+int main(int argc, char** argv) {
+    halyard_client* client = halyard_client_create(argc > 1 ? argv[1] : NULL);
+    halyard_session* session = halyard_session_create(client, 0);
+    halyard_dictionary* facts = halyard_dictionary_create(0);
 
     halyard_dictionary_set_string(facts, "HostApplicationDisplayID", "org.example.player");
     halyard_session_set_service_type(session, HALYARD_SERVICE_LONG_FORM_AUDIO);
