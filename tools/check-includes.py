@@ -33,7 +33,7 @@ FOLDERS = {
 EXTRA = {"service/main.cpp": {"linux", "client"}}
 # A unit test (X_test.cpp, and what several of them share) also sees the fakes;
 # nothing but tests sees what they share.
-TEST_FILES = ("_test.cpp", "Fixture.h", "TestSupport.h")
+TEST_FILES = ("_test.cpp", "Fixture.h", "TestSupport.h", "Testing.h")
 TEST_EXTRA = {"testing"}
 # Programs beside the daemon are clients of it.
 TOOLS = {"common", "protocol", "client"}
