@@ -174,7 +174,9 @@ Rows Daemon::rows() const {
     }
     sqlite3_busy_timeout(database.get(), 5000);
     return {.uploads = countRows(database.get(), "SELECT count(*) FROM upload_message"),
-            .analytics = countRows(database.get(), "SELECT count(*) FROM analytics_event")};
+            .analytics =
+                countRows(database.get(), "SELECT count(*) FROM analytics_event WHERE name <> "
+                                          "'com.kestrel.halyard.hyreportingclientuptime'")};
 }
 
 void Daemon::stop() {
