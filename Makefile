@@ -4,16 +4,16 @@
 
 # What a program of ours needs to be built and to run.
 BUILD_PACKAGES := g++ cmake ninja-build ccache pkg-config python3 \
-	libasio-dev libmsgpack-cxx-dev libsqlite3-dev libtomlplusplus-dev libsystemd-dev \
-	libfmt-dev rapidjson-dev libprotozero-dev libplist-dev libtracefs-dev \
+	libasio-dev libsqlite3-dev libtomlplusplus-dev libsystemd-dev \
+	libfmt-dev rapidjson-dev libmimalloc-dev libprotozero-dev libplist-dev libtracefs-dev \
 	libtraceevent-dev libpipewire-0.3-dev libspa-0.2-dev
 # What the demonstration plays with.
 RUN_PACKAGES := pipewire pipewire-bin pipewire-pulse libspa-0.2-modules wireplumber \
 	sox espeak-ng sqlite3 procps
-TEST_PACKAGES := libgtest-dev libgmock-dev libbenchmark-dev clang-format python3-msgpack \
+TEST_PACKAGES := libmsgpack-cxx-dev libgtest-dev libgmock-dev libbenchmark-dev clang-format python3-msgpack \
 	neovim
 CHECK_PACKAGES := clang clang-tidy libclang-rt-14-dev
-BENCH_PACKAGES := libbenchmark-dev sqlite3
+BENCH_PACKAGES := libmsgpack-cxx-dev libbenchmark-dev sqlite3
 
 JOBS ?= $(shell nproc)
 TEST_JOBS ?= 2
