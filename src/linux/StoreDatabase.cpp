@@ -45,7 +45,6 @@ constexpr std::array<std::string_view, kStoreTables> kInserts = {
 // file can be given back to the system page by page.
 constexpr const char* kConfiguration = "PRAGMA auto_vacuum = INCREMENTAL;"
                                        "PRAGMA synchronous = FULL;"
-                                       "PRAGMA wal_autocheckpoint = 0;"
                                        "PRAGMA secure_delete = OFF;"
                                        "PRAGMA trusted_schema = OFF;"
                                        "PRAGMA temp_store = MEMORY;";
@@ -104,6 +103,7 @@ StoreDatabase::Opened StoreDatabase::openFile() {
     }
     sqlite3_db_config(database_, SQLITE_DBCONFIG_NO_CKPT_ON_CLOSE, 1, nullptr);
     sqlite3_busy_timeout(database_, static_cast<int>(settings_.busyTimeout.count()));
+    // Takes the place of SQLite's own checkpoints.
     sqlite3_wal_hook(database_, rememberLogPages, &logPages_);
     logPages_ = triedLogPages_ = 0;
     std::int64_t version = 0;

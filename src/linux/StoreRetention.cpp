@@ -9,8 +9,8 @@
 namespace halyard::linux_ {
 namespace {
 
-// No slab is more than this part of a table: a small store keeps most of what
-// it has.
+// For want of room, no slab takes more than this part of a table: a small store
+// keeps most of what it has.
 constexpr std::int64_t kSlabShare = 8;
 // How much longer than allowed the file may be before pages are given back,
 // since moving them costs more than using them again.
@@ -117,7 +117,7 @@ int StoreRetention::trimSize(std::int64_t maxPages, bool& more) {
             return SQLITE_OK;
         }
         std::int64_t deleted = 0;
-        code = deleteSlab(std::numeric_limits<double>::max(), deleted);
+        code = deleteSlab(std::numeric_limits<double>::max(), kSlabShare, deleted);
         if (code != SQLITE_OK || deleted == 0) {
             return code;
         }
@@ -127,7 +127,7 @@ int StoreRetention::trimSize(std::int64_t maxPages, bool& more) {
 int StoreRetention::trimAge(double oldest, bool& more) {
     for (int slab = 0; slab < kSlabsAtOnce; ++slab) {
         std::int64_t deleted = 0;
-        const int code = deleteSlab(oldest, deleted);
+        const int code = deleteSlab(oldest, 1, deleted);
         if (code != SQLITE_OK || deleted == 0) {
             return code;
         }
@@ -149,7 +149,7 @@ int StoreRetention::shrink(std::int64_t maxPages, bool& more) {
     return sqlite3_exec(database_, sql.c_str(), nullptr, nullptr, nullptr);
 }
 
-int StoreRetention::findCut(std::size_t index, Cut& cut) {
+int StoreRetention::findCut(std::size_t index, std::int64_t share, Cut& cut) {
     Table& table = tables_[index];
     if (index == 0) {
         for (StoreStatement* statement : {&table.lowest, &table.timeAt, &table.deleteUpTo}) {
@@ -168,8 +168,7 @@ int StoreRetention::findCut(std::size_t index, Cut& cut) {
     if (code != SQLITE_OK) {
         return code;
     }
-    table.timeAt.bind(1,
-                      low + std::clamp<std::int64_t>((high - low) / kSlabShare, 0, kSlabRows - 1));
+    table.timeAt.bind(1, low + std::clamp<std::int64_t>((high - low) / share, 0, kSlabRows - 1));
     code = table.timeAt.step();
     if (code != SQLITE_ROW) {
         return code == SQLITE_DONE ? SQLITE_OK : code;
@@ -179,12 +178,12 @@ int StoreRetention::findCut(std::size_t index, Cut& cut) {
     return SQLITE_OK;
 }
 
-int StoreRetention::deleteSlab(double latest, std::int64_t& deleted) {
+int StoreRetention::deleteSlab(double latest, std::int64_t share, std::int64_t& deleted) {
     std::array<Cut, kStoreTables> cuts;
     double time = latest;
     bool any = false;
     for (std::size_t i = 0; i < kStoreTables; ++i) {
-        if (const int code = findCut(i, cuts[i]); code != SQLITE_OK) {
+        if (const int code = findCut(i, share, cuts[i]); code != SQLITE_OK) {
             return code;
         }
         any = any || cuts[i].any;

@@ -57,9 +57,10 @@ private:
 
     [[nodiscard]] int prepare(sqlite3* database);
     [[nodiscard]] int pages(StoreStatement& statement, std::int64_t& result);
-    [[nodiscard]] int findCut(std::size_t table, Cut& cut);
-    // Deletes one slab, of rows not younger than `latest`.
-    [[nodiscard]] int deleteSlab(double latest, std::int64_t& deleted);
+    [[nodiscard]] int findCut(std::size_t table, std::int64_t share, Cut& cut);
+    // Deletes one slab, of rows not younger than `latest` and of no more than one
+    // part in `share` of a table.
+    [[nodiscard]] int deleteSlab(double latest, std::int64_t share, std::int64_t& deleted);
     [[nodiscard]] int trimSize(std::int64_t maxPages, bool& more);
     [[nodiscard]] int trimAge(double oldest, bool& more);
     [[nodiscard]] int shrink(std::int64_t maxPages, bool& more);

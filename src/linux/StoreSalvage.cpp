@@ -32,8 +32,8 @@ constexpr std::array<Source, 6> kSources = {
     {{"upload_session", "session_id, session_info, user_info, opened, closed", 6,
       "json_valid(session_info) AND json_valid(user_info)"},
      {"upload_message", "upload_session, session_info, user_info, category, type, payload, time", 8,
-      "json_valid(payload) AND coalesce(json_valid(session_info), 1)"
-      " AND coalesce(json_valid(user_info), 1)"},
+      "json_valid(payload) AND (session_info IS NULL OR json_valid(session_info))"
+      " AND (user_info IS NULL OR json_valid(user_info))"},
      {"analytics_event", "name, payload, time", 4, "json_valid(payload)"},
      {"energy_event", "client, name, payload, time", 5, "json_valid(payload)"},
      {"metric", "metric_id, message, time", 4, "typeof(metric_id) = 'integer'"},
@@ -60,6 +60,16 @@ void removeOldest(const fs::path& path) {
         fs::remove(kept[i], ignored);
         for (const std::string_view companion : kCompanions) {
             fs::remove(kept[i].string() + std::string(companion), ignored);
+        }
+    }
+}
+
+// What reading left beside a file that had no write-ahead log.
+void removeEmptyCompanions(const fs::path& path) {
+    std::error_code error;
+    if (fs::file_size(path.string() + "-wal", error) == 0 && !error) {
+        for (const std::string_view companion : kCompanions) {
+            fs::remove(path.string() + std::string(companion), error);
         }
     }
 }
@@ -177,6 +187,7 @@ StoreSalvage storeCarryOver(const fs::path& damaged, sqlite3* fresh) {
         ++result.holes;
     }
     sqlite3_close(from);
+    removeEmptyCompanions(damaged);
     return result;
 }
 

@@ -2,6 +2,7 @@
 // be waited for, and a reader that is nobody's business but SQLite's.
 #pragma once
 
+#include <atomic>
 #include <condition_variable>
 #include <cstdlib>
 #include <filesystem>
@@ -15,7 +16,6 @@
 #include "linux/Store.h"
 #include "platform/Log.h"
 #include "platform/Platform.h"
-#include "testing/ManualClock.h"
 
 namespace halyard::linux_ {
 
@@ -35,6 +35,23 @@ public:
 
 private:
     std::filesystem::path path_;
+};
+
+// A clock that a test moves while the store's threads read it.
+class SharedClock final : public platform::Clock {
+public:
+    platform::WallTime wallTime() const override {
+        return platform::WallTime(std::chrono::seconds(1'700'000'000) + passed());
+    }
+    platform::SteadyTime steadyTime() const override {
+        return platform::SteadyTime(std::chrono::seconds(1000) + passed());
+    }
+    std::chrono::nanoseconds systemUptime() const override { return passed(); }
+    void advance(std::chrono::nanoseconds by) { passed_ += by.count(); }
+
+private:
+    std::chrono::nanoseconds passed() const { return std::chrono::nanoseconds(passed_.load()); }
+    std::atomic<std::int64_t> passed_{0};
 };
 
 class WaitingLog final : public platform::LogSink {
@@ -76,7 +93,8 @@ private:
 class Reader {
 public:
     explicit Reader(const std::filesystem::path& path) {
-        EXPECT_EQ(sqlite3_open_v2(path.c_str(), &database_, SQLITE_OPEN_READWRITE, nullptr),
+        EXPECT_EQ(sqlite3_open_v2(path.c_str(), &database_,
+                                  SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE, nullptr),
                   SQLITE_OK);
     }
     ~Reader() { sqlite3_close(database_); }
@@ -153,7 +171,7 @@ protected:
     }
 
     TempDirectory directory_;
-    testing::ManualClock clock_;
+    SharedClock clock_;
     WaitingLog log_;
     platform::Platform platform_;
     StoreOptions options_;

@@ -189,13 +189,11 @@ void StoreWriter::writeGroup(std::span<StoreItem> group) {
 }
 
 void StoreWriter::maintain() {
-    const bool limitsChanged = limitsChanged_.exchange(false);
-    if (!limitsChanged && !trimMore_ && !isAgeDue() && database_.isOpen() &&
+    if (!limitsChanged_.load() && !trimMore_ && !isAgeDue() && database_.isOpen() &&
         !database_.hasMoved()) {
         return;
     }
     trimMore_ = false;
-    agedAt_ = {};
     if (const int code = attempt({}); code != SQLITE_OK) {
         beginEpisode(lossOf(code), database_.errorText());
     }
@@ -233,8 +231,8 @@ int StoreWriter::reopenIfNeeded() {
 }
 
 int StoreWriter::writeRows(std::span<StoreItem> group) {
+    const bool ageDue = limitsChanged_.exchange(false) || isAgeDue();
     const StoreLimits bounds = limits();
-    const bool ageDue = isAgeDue();
     rejected_ = 0;
     int code = database_.boundLog(
         bounds.maxBytes + kLogAllowance,
@@ -259,8 +257,8 @@ int StoreWriter::writeRows(std::span<StoreItem> group) {
     code = database_.commit();
     if (code == SQLITE_OK) {
         trimMore_ = more;
-        if (ageDue && !more) {
-            agedAt_ = clock_.steadyTime();
+        if (ageDue) {
+            agedAt_ = more ? platform::SteadyTime() : clock_.steadyTime();
         }
     }
     return code;
