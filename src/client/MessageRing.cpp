@@ -15,7 +15,12 @@ constexpr std::size_t kPrefix = 8;
 constexpr std::size_t kAlignment = 16;
 // Marks the filler at the end of a lap, where the next record did not fit.
 constexpr std::uint32_t kFiller = 0x80000000U;
+// Flags in the tail, above every position.
 constexpr std::uint64_t kSealed = std::uint64_t{1} << 63;
+constexpr std::uint64_t kRewinding = std::uint64_t{1} << 62;
+constexpr std::uint64_t kPosition = kRewinding - 1;
+// The beginning of the ring, which is kept in use and in memory.
+constexpr std::size_t kWarm = 128 * 1024;
 
 constexpr std::size_t rounded(std::size_t bytes) {
     return (bytes + kPrefix + kAlignment - 1) & ~(kAlignment - 1);
@@ -28,6 +33,9 @@ char* map(std::size_t capacity) {
         throw std::bad_alloc();
     }
     ::madvise(memory, capacity, MADV_DONTFORK);
+    // So that writers need not wait for the kernel to find pages; where it is not
+    // supported they do, once.
+    ::madvise(memory, std::min(capacity, kWarm), MADV_POPULATE_WRITE);
     return static_cast<char*>(memory);
 }
 
@@ -44,6 +52,16 @@ std::atomic<std::uint32_t>& MessageRing::lengthAt(std::uint64_t position) const 
     return *reinterpret_cast<std::atomic<std::uint32_t>*>(bytes_ + (position & (capacity_ - 1)));
 }
 
+// Negative when `tail` is out of date.
+std::int64_t MessageRing::usedAt(std::uint64_t tail) const noexcept {
+    std::uint64_t head = head_.load(std::memory_order_acquire);
+    if ((tail & kRewinding) != 0) {
+        // The head is about to be where this lap begins; see rewind().
+        head = tail & kPosition & ~(std::uint64_t{capacity_} - 1);
+    }
+    return static_cast<std::int64_t>((tail & kPosition) - head);
+}
+
 MessageRing::Claim MessageRing::claim(std::size_t bytes, std::size_t limit) noexcept {
     const std::size_t size = rounded(bytes);
     std::uint64_t tail = tail_.load(std::memory_order_relaxed);
@@ -55,14 +73,15 @@ MessageRing::Claim MessageRing::claim(std::size_t bytes, std::size_t limit) noex
         }
         const std::size_t left = capacity_ - (tail & (capacity_ - 1));
         filler = left < size ? left : 0;
-        // Negative when `tail` is out of date; then the exchange fails.
-        used =
-            static_cast<std::int64_t>(tail + filler + size - head_.load(std::memory_order_acquire));
-        if (used > static_cast<std::int64_t>(limit)) {
+        used = usedAt(tail) + static_cast<std::int64_t>(filler + size);
+        // While the lap's beginning stands for the head, the lap must not end.
+        const bool ends = (tail & kRewinding) != 0 && left <= size;
+        if (used > static_cast<std::int64_t>(limit) || ends) {
             return {.outcome = Claim::Outcome::Full};
         }
     } while (!tail_.compare_exchange_weak(tail, tail + filler + size, std::memory_order_seq_cst,
                                           std::memory_order_relaxed));
+    tail &= kPosition;
     if (filler != 0) {
         lengthAt(tail).store(static_cast<std::uint32_t>(filler) | kFiller,
                              std::memory_order_release);
@@ -84,13 +103,12 @@ void MessageRing::seal() noexcept {
 }
 
 std::uint64_t MessageRing::end() const noexcept {
-    return tail_.load() & ~kSealed;
+    return tail_.load() & kPosition;
 }
 
 std::uint64_t MessageRing::used() const noexcept {
-    // The head first: it only grows, so the difference is never negative.
-    const std::uint64_t head = releasedTo();
-    return end() - head;
+    // The tail is read first, so it may be out of date.
+    return static_cast<std::uint64_t>(std::max<std::int64_t>(usedAt(tail_.load()), 0));
 }
 
 bool MessageRing::read(std::uint64_t position, Record& record) const noexcept {
@@ -119,6 +137,22 @@ void MessageRing::release(std::uint64_t position) noexcept {
     if (position != head) {
         clear(head, position);
         head_.store(position, std::memory_order_release);
+    }
+}
+
+// Skips the rest of the lap, as long as no writer has claimed anything of it.
+// Between the two steps the head is behind; the flag tells writers where it is
+// going to be, so that none of them sees a ring that is full of nothing.
+void MessageRing::rewind() noexcept {
+    std::uint64_t end = head_.load(std::memory_order_relaxed);
+    const std::uint64_t offset = end & (capacity_ - 1);
+    if (offset <= std::min(kWarm, capacity_) / 2) {
+        return;
+    }
+    const std::uint64_t nextLap = end - offset + capacity_;
+    if (tail_.compare_exchange_strong(end, nextLap | kRewinding)) {
+        head_.store(nextLap, std::memory_order_release);
+        tail_.fetch_and(~kRewinding);
     }
 }
 

@@ -67,8 +67,14 @@ public:
     [[nodiscard]] bool read(std::uint64_t position, Record& record) const noexcept;
     // Gives the memory before `position` (some record's `next`) back to writers.
     void release(std::uint64_t position) noexcept;
+    // When nothing is queued: goes back to the beginning of the memory if much of
+    // it has been passed, so that a client which never has much queued never uses
+    // more (and its writers find their pages in memory and cache). Moves
+    // releasedTo().
+    void rewind() noexcept;
 
 private:
+    std::int64_t usedAt(std::uint64_t tail) const noexcept;
     std::atomic<std::uint32_t>& lengthAt(std::uint64_t position) const noexcept;
     void clear(std::uint64_t from, std::uint64_t to) noexcept;
 

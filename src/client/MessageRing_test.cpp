@@ -34,6 +34,12 @@ protected:
         return text;
     }
 
+    void rewindIfRead() {
+        if (ring_.used() == 0) {
+            ring_.rewind();
+        }
+    }
+
     MessageRing ring_{kCapacity};
 };
 
@@ -90,6 +96,40 @@ TEST_F(MessageRingTest, SealedRefusesWritersAndStillGivesWhatItHas) {
     EXPECT_EQ(ring_.releasedTo(), ring_.end());
 }
 
+// Its memory is what the process pays for.
+TEST_F(MessageRingTest, RewindsOverWhatItNeedNotUse) {
+    put(std::string(kCapacity / 2 - 16, 'x'));
+    put("more");
+    take();
+    take();
+    ring_.rewind();
+    EXPECT_EQ(ring_.used(), 0U);
+    EXPECT_EQ(ring_.releasedTo() % kCapacity, 0U);
+    put("next");
+    EXPECT_EQ(take(), "next");
+}
+
+TEST_F(MessageRingTest, DoesNotRewindOverAClaim) {
+    put(std::string(kCapacity / 2 - 16, 'x'));
+    put("more");
+    take();
+    take();
+    put("next");
+    ring_.rewind();
+    EXPECT_EQ(take(), "next");
+}
+
+TEST_F(MessageRingTest, StaysSealedWhenItRewinds) {
+    put(std::string(kCapacity / 2 - 16, 'x'));
+    put("more");
+    take();
+    take();
+    ring_.seal();
+    ring_.rewind();
+    EXPECT_EQ(put("late"), Outcome::Sealed);
+    EXPECT_EQ(ring_.used(), 0U);
+}
+
 TEST_F(MessageRingTest, ManyWritersLoseAndMixNothing) {
     constexpr int kWriters = 4;
     constexpr int kEach = 2000;
@@ -115,6 +155,7 @@ TEST_F(MessageRingTest, ManyWritersLoseAndMixNothing) {
             ++taken;
         } else {
             std::this_thread::yield();
+            rewindIfRead();
         }
     }
     for (std::thread& writer : writers) {

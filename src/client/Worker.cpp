@@ -154,6 +154,10 @@ bool Worker::pump() {
         wouldBlock_ = outcome == Connection::Outcome::WouldBlock;
     }
     takeWritten();
+    if (queueIsRead() && outbox_.allWritten()) {
+        client_.ring().rewind();
+        cursor_ = client_.ring().releasedTo();
+    }
     MessageRing::Record next;
     return !wouldBlock_ && !isStalled() && client_.ring().read(cursor_, next);
 }
@@ -269,9 +273,12 @@ void Worker::giveUp(const Record& record, std::int64_t code) {
 
 Worker::Sleep Worker::chooseSleep() const {
     using std::chrono::milliseconds;
-    // Time for more to come, so that a stream of messages is taken in blocks and
-    // its writers need not wake anybody.
+    // Time for more to come, so that a stream of messages is taken in blocks; and
+    // naps for a while after it, so that neither its writers nor those of single
+    // messages now and then have to wake anybody.
     constexpr milliseconds kLinger{10};
+    constexpr milliseconds kNap{50};
+    constexpr milliseconds kNapFor{1000};
     if (!connection_.isOpen()) {
         const auto left = std::chrono::ceil<milliseconds>(nextAttempt_ - steady_clock::now());
         return {client_.cutMark(), std::max(left, milliseconds{0})};
@@ -279,8 +286,8 @@ Worker::Sleep Worker::chooseSleep() const {
     if (wouldBlock_ || isStalled()) {
         return {client_.cutMark(), std::nullopt};
     }
-    if (busy_) {
-        return {client_.queue().capacity() / 4, kLinger};
+    if (busy_ || steady_clock::now() < lastBusy_ + kNapFor) {
+        return {client_.queue().capacity() / 4, busy_ ? kLinger : kNap};
     }
     return {0, std::nullopt};
 }
@@ -324,7 +331,9 @@ void Worker::wait(bool moreToDo) {
             sleep.time = sooner;
         }
     }
-    busy_ = false;
+    if (std::exchange(busy_, false)) {
+        lastBusy_ = steady_clock::now();
+    }
     const int unwritten = outbox_.allWritten() ? 0 : POLLOUT;
     // Poll passes over a descriptor of -1.
     pollfd watched[2] = {{client_.wakeUp().descriptor(), POLLIN, 0},

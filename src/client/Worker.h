@@ -87,7 +87,8 @@ private:
     std::uint64_t cursor_ = 0; // Up to here the queue is in the outbox.
     std::uint32_t nextMessageID_ = 1;
     bool wouldBlock_ = false; // The socket took no more.
-    bool busy_ = false;       // Something was queued lately.
+    bool busy_ = false;       // Something was queued since the last sleep.
+    SteadyTime lastBusy_;
     bool answersReady_ = false;
 
     std::optional<halyard_connection_state> toldState_;
