@@ -18,21 +18,46 @@
 namespace halyard::testing {
 
 class TestPlatform {
+    // Ahead of the fakes, so that it outlives them: what they kept may ask the
+    // platform for its log and its marks while it goes.
+    struct Installation {
+        ~Installation() { platform::install(nullptr); }
+        platform::Platform platform;
+    };
+    Installation installation_;
+
 public:
-    TestPlatform() { platform::install(&platform_); }
-    ~TestPlatform() {
-        queues.clear(); // What still hangs there may log while it goes.
-        platform::install(nullptr);
+    TestPlatform() {
+        installation_.platform = {.clock = &clock,
+                                  .random = &random,
+                                  .queues = &queues,
+                                  .conditions = &conditions,
+                                  .log = &log,
+                                  .traceMarks = &traceMarks,
+                                  .preferences = &preferences,
+                                  .featureFlags = &featureFlags,
+                                  .deviceProperties = &deviceProperties,
+                                  .notifications = &notifications,
+                                  .processTable = &processTable,
+                                  .ownProcess = &ownProcess,
+                                  .relayReporting = &relayReporting,
+                                  .analytics = &analytics,
+                                  .energyLedger = &energyLedger,
+                                  .metrics = &metrics,
+                                  .incidentReporter = &incidentReporter,
+                                  .operations = &operations};
+        platform::install(&installation_.platform);
     }
+    ~TestPlatform() { queues.clear(); }
     TestPlatform(const TestPlatform&) = delete;
     TestPlatform& operator=(const TestPlatform&) = delete;
 
+    RecordingLog log;
+    FakeTraceMarks traceMarks;
     ManualClock clock;
     FakeRandom random;
     ManualQueues queues{clock};
     FakeConditionFactory conditions;
-    RecordingLog log;
-    FakeTraceMarks traceMarks;
     FakePreferences preferences;
     FakeFeatureFlags featureFlags;
     FakeDeviceProperties deviceProperties;
@@ -45,28 +70,6 @@ public:
     FakeMetricService metrics;
     FakeIncidentReporter incidentReporter;
     FakeOperations operations;
-
-private:
-    const platform::Platform platform_{
-        .clock = &clock,
-        .random = &random,
-        .queues = &queues,
-        .conditions = &conditions,
-        .log = &log,
-        .traceMarks = &traceMarks,
-        .preferences = &preferences,
-        .featureFlags = &featureFlags,
-        .deviceProperties = &deviceProperties,
-        .notifications = &notifications,
-        .processTable = &processTable,
-        .ownProcess = &ownProcess,
-        .relayReporting = &relayReporting,
-        .analytics = &analytics,
-        .energyLedger = &energyLedger,
-        .metrics = &metrics,
-        .incidentReporter = &incidentReporter,
-        .operations = &operations,
-    };
 };
 
 } // namespace halyard::testing
