@@ -68,10 +68,11 @@ Configuration::Outcome Configuration::putInForce(Settings settings) {
         const MutexLock lock(mutex_);
         settings_ = after;
     }
-    HY_LOG_INFO(HYReportingPlatformCategory, "configuration of {} is in force", file_.native());
     for (const Observer& observer : observers_) {
         observer(*before, *after);
     }
+    // Last, so that the log's own level holds for it.
+    HY_LOG_INFO(HYReportingPlatformCategory, "configuration of {} is in force", file_.native());
     return Outcome::Changed;
 }
 

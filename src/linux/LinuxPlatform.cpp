@@ -85,8 +85,9 @@ LinuxPlatform::LinuxPlatform(Directories directories, platform::TraceMarks& trac
     platform_.log = &log_;
     platform_.clock = &clock_;
     platform::install(&platform_);
+    configuration_.observe(
+        [this](const Settings&, const Settings& after) { log_.setLevel(after.logLevel); });
     (void)configuration_.reload();
-    log_.setLevel(configuration_.settings()->logLevel);
 
     store_ = std::make_unique<Store>(storeOptions(directories_.state, pressure_), clock_);
     relayReporting_ = std::make_unique<StoreRelayReporting>(*store_, random_);
@@ -133,7 +134,6 @@ LinuxPlatform::~LinuxPlatform() {
 }
 
 void LinuxPlatform::applySettings(const Settings& settings) {
-    log_.setLevel(settings.logLevel);
     analytics_->setWanted(settings.wantedEvents);
     store_->setLimits({settings.store.maxBytes, settings.store.maxAge});
 }

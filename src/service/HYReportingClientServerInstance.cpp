@@ -82,7 +82,10 @@ void HYReportingClientServerInstance::create(Delegate& delegate, std::int64_t re
     session->setRelayReportingEnabled(mayUpload(delegate.activeSessionCount()));
     {
         const MutexLock lock(mapMutex_);
-        std::swap(sessions_[reporterID], session); // A replaced one goes after the lock.
+        std::swap(sessions_[reporterID], session);
+    }
+    if (session != nullptr) {
+        delegate.sessionRetired(*session); // Replaced.
     }
     HY_LOG_DEFAULT(HYReportingClientCategory, "session created for reporter {}", reporterID);
 }
@@ -215,13 +218,13 @@ void HYReportingClientServerInstance::stop(Delegate& delegate, std::int64_t repo
 
 void HYReportingClientServerInstance::destroyReportingSession(std::int64_t reporterID,
                                                               BoolReply reply) {
-    onServiceQueue([reporterID, reply = std::move(reply)](auto& self, Delegate&) {
-        self.destroy(reporterID);
+    onServiceQueue([reporterID, reply = std::move(reply)](auto& self, Delegate& delegate) {
+        self.destroy(delegate, reporterID);
         reply(std::nullopt, true);
     });
 }
 
-void HYReportingClientServerInstance::destroy(std::int64_t reporterID) {
+void HYReportingClientServerInstance::destroy(Delegate& delegate, std::int64_t reporterID) {
     HY_LOG_DEBUG(HYReportingClientCategory, "destroying session for reporter {}", reporterID);
     mark(kDestroyMark);
     if (reporterID == 0) {
@@ -231,6 +234,7 @@ void HYReportingClientServerInstance::destroy(std::int64_t reporterID) {
         if (session->started()) {
             session->stop(); // Stays counted as active: only a stop request uncounts.
         }
+        delegate.sessionRetired(*session);
         const MutexLock lock(mapMutex_);
         sessions_.erase(reporterID);
     }
@@ -288,6 +292,7 @@ void HYReportingClientServerInstance::leave(Delegate& delegate) {
         if (session->started()) {
             session->stop();
         }
+        delegate.sessionRetired(*session);
     }
     {
         const MutexLock lock(mapMutex_);

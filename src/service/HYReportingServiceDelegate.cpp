@@ -164,6 +164,10 @@ std::vector<HYReportingServiceDelegate::Client> HYReportingServiceDelegate::getA
     return clients_;
 }
 
+void HYReportingServiceDelegate::sessionRetired(const HYReportingSession& session) {
+    repeatsOfRetiredSessions_ += session.redundantMessages();
+}
+
 void HYReportingServiceDelegate::removeClient(const HYReportingClientServerInstance& client) {
     const MutexLock lock(monitor_);
     std::erase_if(clients_, [&](const Client& each) { return each.get() == &client; });
@@ -219,17 +223,20 @@ void HYReportingServiceDelegate::stopAllSessions() {
 Dictionary HYReportingServiceDelegate::status() const {
     std::int64_t sessions = 0;
     std::int64_t started = 0;
+    std::uint64_t repeats = repeatsOfRetiredSessions_;
     const auto clients = getAllClients();
     for (const Client& client : clients) {
         for (const Session& session : sessionsOf(*client)) {
             ++sessions;
             started += session->started() ? 1 : 0;
+            repeats += session->redundantMessages();
         }
     }
     return Dictionary{{"connections", clients.size()},
                       {"sessions", sessions},
                       {"sessions_started", started},
-                      {"active_session_count", activeSessionCount_}};
+                      {"active_session_count", activeSessionCount_},
+                      {"repeats_dropped", repeats}};
 }
 
 } // namespace halyard

@@ -40,6 +40,7 @@ public:
     bool isReportingEnabled() const override { return reportingEnabled_; }
     std::vector<Session> getAllActiveReportingSessions() const override;
     Session findReportingSessionForID(std::int64_t reporterID) const override;
+    void sessionRetired(const HYReportingSession& session) override;
     void removeClient(const HYReportingClientServerInstance& client) override;
     void handleEventForIBX(const Dictionary& message, AudioEventCategory category,
                            std::uint16_t type, const Session& session,
@@ -68,6 +69,7 @@ private:
     bool reportingEnabled_ = true;
     const Dictionary defaults_;
     std::int64_t activeSessionCount_ = 0;
+    std::uint64_t repeatsOfRetiredSessions_ = 0;
     std::vector<FeatureRecord> features_;
     // Null but on internal builds.
     std::unique_ptr<HYReportingUtilityIBXStateManager> ibxStateManager_;

@@ -30,6 +30,8 @@ public:
     virtual bool isReportingEnabled() const = 0;
     virtual std::vector<Session> getAllActiveReportingSessions() const = 0;
     virtual Session findReportingSessionForID(std::int64_t reporterID) const = 0;
+    // A session has left its client's map.
+    virtual void sessionRetired(const HYReportingSession& session) = 0;
     virtual void removeClient(const HYReportingClientServerInstance& client) = 0;
     // Offers the message to the issue capture of internal builds.
     virtual void handleEventForIBX(const Dictionary& message, AudioEventCategory category,

@@ -7,6 +7,8 @@
 #include "platform/Log.h"
 #include "platform/Platform.h"
 #include "platform/TraceMarks.h"
+#include "session/SessionEvents.h"
+#include "sinks/HYReportingTallyhubBridge.h"
 
 namespace halyard {
 namespace {
@@ -17,6 +19,7 @@ constexpr std::uint32_t kStopMark = 0x21044830;
 constexpr std::uint32_t kDestroyedMark = 0x21044834;
 constexpr std::uint32_t kMessageMark = 0x21044838;
 
+constexpr AudioEventCategory kSummaryCategory = 0xFFFFFFFF;
 constexpr const char* kHostApplicationKey = "HostApplicationDisplayID";
 constexpr const char* kClientApplicationKey = "VQHostApplicationDisplayID";
 
@@ -123,6 +126,8 @@ void HYReportingSession::stop() {
     }
     HY_LOG_DEBUG(HYReportingSessionCategory, "ending session {}", reporterID_);
     mark(kStopMark);
+    sendVolumeEvents();
+    sendSummaryEvent();
     if (relayReportingEnabled()) {
         stopRelayReporting();
     }
@@ -134,6 +139,40 @@ void HYReportingSession::stop() {
     }
 }
 
+std::vector<Dictionary> HYReportingSession::createVolumeMessages(double minimumPlaytime) const {
+    const MutexLock lock(batchMutex_);
+    return batch_ != nullptr ? createVolumeEvents(batch_->entries(), minimumPlaytime)
+                             : std::vector<Dictionary>();
+}
+
+std::optional<Dictionary> HYReportingSession::createSummaryEventForSession() const {
+    const AudioServiceType type = serviceType();
+    const MutexLock lock(batchMutex_);
+    return batch_ != nullptr ? createSummaryEvent(batch_->entries(), type) : std::nullopt;
+}
+
+void HYReportingSession::sendVolumeEvents() {
+    const auto events =
+        createVolumeMessages(HYReportingUtilityVolumeMinimumPlayingTime(serviceType()));
+    if (events.empty()) {
+        return;
+    }
+    HY_LOG_DEFAULT(HYReportingSessionCategory, "sending volume event for reporter {}", reporterID_);
+    for (const Dictionary& event : events) {
+        sendMessage(event, kAudioEventCategoryVolume, kAudioEventTypeSummary, true, nullptr);
+        HYReportingTallyhubBridge::handleEvent(&event, kAudioEventCategoryVolume,
+                                               kAudioEventTypeSummary, shared_from_this());
+    }
+}
+
+void HYReportingSession::sendSummaryEvent() {
+    if (const auto summary = createSummaryEventForSession()) {
+        HY_LOG_DEFAULT(HYReportingSessionCategory, "sending summary event for reporter {}",
+                       reporterID_);
+        sendMessage(*summary, kSummaryCategory, kAudioEventTypeUnknown, true, nullptr);
+    }
+}
+
 bool HYReportingSession::createMessageIdentifierWithCategory(AudioEventCategory category,
                                                              AudioEventType type,
                                                              const Dictionary& message) {
@@ -142,6 +181,7 @@ bool HYReportingSession::createMessageIdentifierWithCategory(AudioEventCategory 
     }
     const bool redundant = batch_->addUnlessRedundant(category, type, message);
     if (redundant) {
+        redundantMessages_.fetch_add(1, std::memory_order_relaxed);
         HY_LOG_DEBUG(HYReportingSessionCategory, "dropping redundant event");
     }
     return redundant;

@@ -12,6 +12,7 @@
 #include <cstdint>
 #include <functional>
 #include <memory>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -77,6 +78,11 @@ public:
                                   AudioEventType type, AudioServiceType serviceType,
                                   const Dictionary& userInfo, SendReply reply);
 
+    // What the batch amounts to; none while the session is not started.
+    std::vector<Dictionary> createVolumeMessages(double minimumPlaytime) const
+        HY_EXCLUDES(batchMutex_);
+    std::optional<Dictionary> createSummaryEventForSession() const HY_EXCLUDES(batchMutex_);
+
     // Records the message in the batch unless it is redundant; true when it was.
     bool createMessageIdentifierWithCategory(AudioEventCategory category, AudioEventType type,
                                              const Dictionary& message) HY_REQUIRES(batchMutex_);
@@ -99,6 +105,8 @@ public:
     // and returns the one held before.
     TransactionCompleteBlock exchangeTransactionCompleteBlock(TransactionCompleteBlock block);
 
+    // Repeats that were dropped since the session was created.
+    std::uint64_t redundantMessages() const { return redundantMessages_.load(); }
     // The number of the last accepted message of a base identifier; 0 when there
     // is none or the session is not started.
     std::uint32_t messageIdentifierCount(std::string_view base) const HY_EXCLUDES(batchMutex_);
@@ -127,6 +135,9 @@ private:
     std::shared_ptr<platform::RelayReporting> relayReportingSession() const
         HY_EXCLUDES(stateMutex_);
 
+    void sendVolumeEvents();
+    void sendSummaryEvent();
+
     // Queue what follows below.
     void startRelayReporting();
     void stopRelayReporting();
@@ -148,6 +159,7 @@ private:
         std::make_shared<AsyncSemaphore>();
 
     std::atomic<bool> started_{false};
+    std::atomic<std::uint64_t> redundantMessages_{0};
     std::atomic<bool> relayReportingEnabled_{false};
     std::atomic<bool> relayReportingSessionStarted_{false};
 

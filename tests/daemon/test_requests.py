@@ -176,7 +176,8 @@ class Requests(DaemonTest):
             client.notify("sendMessage", {"n": number}, 4, 1, [1])
         client.result("getAllReporters")
         self.assertEqual(self.daemon.terminate(), 0)
-        self.assertEqual(self.daemon.rows("SELECT count(*) FROM upload_message"), [(100,)])
+        self.assertEqual(self.daemon.rows("SELECT count(*) FROM upload_message WHERE category = 4"),
+                         [(100,)])
         self.assertEqual(self.daemon.rows("SELECT count(*) FROM upload_session WHERE closed"),
                          [(1,)])
 

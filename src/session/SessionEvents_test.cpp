@@ -1,0 +1,139 @@
+#include "session/SessionEvents.h"
+
+#include <gtest/gtest.h>
+
+#include "common/Description.h"
+
+namespace halyard {
+namespace {
+
+class SessionEventsTest : public ::testing::Test {
+protected:
+    void add(const Dictionary& message) {
+        EXPECT_FALSE(
+            batch_.addUnlessRedundant(kAudioEventCategoryVolume, kAudioEventTypeSetup, message));
+    }
+    void addVolume(double volume, bool playing, double time) {
+        add(Dictionary{{"VQSessionVolume", volume},
+                       {"VQSessionVolumePlayingState", playing ? 1 : 0},
+                       {"hyreporting_timestamp", time},
+                       {"n", ++messages_}}); // Never a repeat.
+    }
+    std::vector<Dictionary> volumeEvents(double minimum) {
+        return createVolumeEvents(batch_.entries(), minimum);
+    }
+
+    MessageBatch batch_;
+    int messages_ = 0;
+};
+
+TEST_F(SessionEventsTest, AStretchMustLastLongerThanTheMinimum) {
+    addVolume(0.5, true, 10);
+    addVolume(0.5, true, 20);
+    addVolume(0.5, false, 40);
+
+    EXPECT_TRUE(volumeEvents(30).empty());
+    const auto events = volumeEvents(29.9);
+    ASSERT_EQ(events.size(), 1u);
+    EXPECT_EQ(events[0]["play_seconds"], Value(30));
+    EXPECT_EQ(events[0]["VQSessionVolume"], Value(0.5));
+}
+
+TEST_F(SessionEventsTest, AVolumeChangeWhilePlayingEndsOneStretchAndStartsTheNext) {
+    addVolume(0.5, true, 10);
+    addVolume(0.75, true, 14);
+    addVolume(0.75, false, 24);
+
+    const auto events = volumeEvents(0.5);
+    ASSERT_EQ(events.size(), 2u);
+    EXPECT_EQ(events[0]["VQSessionVolume"], Value(0.5));
+    EXPECT_EQ(events[0]["play_seconds"], Value(4));
+    EXPECT_EQ(events[1]["VQSessionVolume"], Value(0.75));
+    EXPECT_EQ(events[1]["play_seconds"], Value(10));
+}
+
+TEST_F(SessionEventsTest, WhatWasNeverSeenIsUnknown) {
+    addVolume(0.5, true, 10);
+    addVolume(0.5, false, 11);
+
+    const Dictionary event = volumeEvents(0.5).at(0);
+    EXPECT_EQ(event["session_selected_format"], Value("Unknown"));
+    EXPECT_EQ(event["active_devices"], Value("Unknown"));
+    EXPECT_EQ(event["VQSessionVolumeOperationProcess"], Value("Unknown"));
+    EXPECT_EQ(event.size(), 7u);
+}
+
+TEST_F(SessionEventsTest, AMessagesOwnContextCountsForTheStretchThatItEnds) {
+    addVolume(0.5, true, 10);
+    add(Dictionary{{"VQSessionVolume", 0.5},
+                   {"VQSessionVolumePlayingState", 0},
+                   {"hyreporting_timestamp", 20},
+                   {"active_devices", List{"headphones"}},
+                   {"session_selected_format", "F32LE"}});
+
+    const Dictionary event = volumeEvents(0.5).at(0);
+    EXPECT_EQ(event["active_devices"], Value(List{"headphones"}));
+    EXPECT_EQ(event["session_selected_format"], Value("F32LE"));
+}
+
+TEST_F(SessionEventsTest, NumbersAreBucketed) {
+    addVolume(0.3, true, 10);
+    addVolume(0.3, false, 13);
+
+    const Dictionary event = volumeEvents(0.5).at(0);
+    EXPECT_EQ(event["VQSessionVolumeBucketed"], Value("0.3125"));
+    EXPECT_EQ(event["play_secondsBucketed"], Value("5")) << "a tie goes to the larger";
+}
+
+TEST_F(SessionEventsTest, SecondsAreSinglePrecision) {
+    addVolume(1, true, 1700000000.1);
+    addVolume(1, false, 1700000002.4);
+
+    const Dictionary event = volumeEvents(0.5).at(0);
+    EXPECT_EQ(event["play_seconds"].kind(), Value::Kind::Float);
+    EXPECT_EQ(describe(event["play_seconds"]), "2.3000002");
+}
+
+TEST_F(SessionEventsTest, VolumesCompareAsNumbers) {
+    addVolume(1, true, 10);
+    add(Dictionary{{"VQSessionVolume", 1},
+                   {"VQSessionVolumePlayingState", true},
+                   {"hyreporting_timestamp", 15}});
+    addVolume(1, false, 20);
+
+    EXPECT_EQ(volumeEvents(0.5).at(0)["play_seconds"], Value(10));
+}
+
+TEST_F(SessionEventsTest, AStretchThatStillPlaysHasNoEvent) {
+    addVolume(0.5, true, 10);
+    addVolume(0.5, true, 1000);
+
+    EXPECT_TRUE(volumeEvents(0.5).empty());
+}
+
+TEST_F(SessionEventsTest, AnEmptyBatchYieldsNothing) {
+    EXPECT_TRUE(volumeEvents(0).empty());
+    EXPECT_FALSE(createSummaryEvent(batch_.entries(), kAudioServiceTypeTest).has_value());
+}
+
+TEST_F(SessionEventsTest, TheSummaryJoinsAllValuesOfEachKey) {
+    add(Dictionary{{"a", 1}, {"hyreporting_timestamp", 1.5}});
+    add(Dictionary{{"a", "two"}, {"b", List{1, 2}}, {"hyreporting_timestamp", 2.25}});
+    add(Dictionary{{"a", 3.0f}});
+
+    const auto summary = createSummaryEvent(batch_.entries(), kAudioServiceTypeLongFormAudio);
+    ASSERT_TRUE(summary.has_value());
+    EXPECT_EQ(*summary, (Dictionary{{"HY_Session_Summary_Event", "7"},
+                                    {"a", "1,two,3"},
+                                    {"hyreporting_timestamp", "1.5,2.25"},
+                                    {"b", "(\n    1,\n    2\n)"}}));
+}
+
+TEST_F(SessionEventsTest, AClientsOwnSummaryKeyIsJoinedBehindTheServiceType) {
+    add(Dictionary{{"HY_Session_Summary_Event", "x"}});
+
+    EXPECT_EQ((*createSummaryEvent(batch_.entries(), 4))["HY_Session_Summary_Event"], Value("4,x"));
+}
+
+} // namespace
+} // namespace halyard

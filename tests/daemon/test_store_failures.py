@@ -1,0 +1,116 @@
+"""A store that cannot write stops no session and no reply; what it could not
+keep is counted and told once."""
+
+import os
+import sqlite3
+import subprocess
+import unittest
+
+from harness import Daemon, DaemonTest
+
+
+def send(client, reporter_id, count, size=2000):
+    for number in range(count):
+        client.notify("sendMessage", {"n": number, "text": "x" * size}, 4, 1, [reporter_id])
+    client.result("getAllReporters")
+
+
+class Locked(DaemonTest):
+    def test_a_locked_store_holds_up_nobody_and_catches_up(self):
+        client = self.connect()
+        client.session(1)
+        client.result("admin.flush")
+        lock = sqlite3.connect(self.daemon.store_path)
+        lock.execute("BEGIN IMMEDIATE")
+        send(client, 1, 100)
+        self.assertIs(client.result("reporterIDValid", 1)["reporterID"], 1)
+        lock.rollback()
+        lock.close()
+        self.daemon.wait_for(lambda: self.daemon.rows(
+            "SELECT count(*) FROM upload_message")[0][0] == 100)
+
+
+class OnTmpfs(unittest.TestCase):
+    """A file system that fills."""
+
+    def setUp(self):
+        if os.geteuid() != 0:
+            self.skipTest("mounting needs root")
+        self.daemon = Daemon()
+        self.addCleanup(self.daemon.remove)
+        self.state = os.path.dirname(self.daemon.store_path)
+        mounted = subprocess.run(["mount", "-t", "tmpfs", "-o", "size=2m", "none", self.state],
+                                 stderr=subprocess.DEVNULL, check=False)
+        if mounted.returncode != 0:
+            self.skipTest("mounting is not allowed here")
+        self.addCleanup(subprocess.run, ["umount", self.state], check=False)
+        self.daemon.run()
+        self.addCleanup(self.daemon.kill)
+
+    def test_a_full_disk_is_counted_and_told_once(self):
+        client = self.daemon.client()
+        self.addCleanup(client.close)
+        client.session(1)
+        send(client, 1, 20000)
+        self.daemon.wait_for(lambda: self.lost(client) > 0)
+        self.assertEqual(client.result("reporterIDValid", 1)["reporterID"], 1)
+        told = [line for line in self.daemon.log().splitlines()
+                if line.startswith("error hyrx") and "Store" in line]
+        self.assertEqual(len(told), 1, told)
+
+        subprocess.run(["mount", "-o", "remount,size=200m", self.state], check=True)
+        self.daemon.wait_for(lambda: client.result("admin.status")["store"]["failing"] is False)
+        stored = client.result("admin.status")["store"]["rows"]["upload_message"]
+        send(client, 1, 10)
+        client.result("admin.flush")
+        self.assertGreaterEqual(
+            client.result("admin.status")["store"]["rows"]["upload_message"], stored + 10)
+
+    @staticmethod
+    def lost(client):
+        return client.result("admin.status")["store"]["lost"]["disk_full"]
+
+
+class NotOpened(unittest.TestCase):
+    def start(self, prepare):
+        daemon = Daemon()
+        self.addCleanup(daemon.remove)
+        prepare(daemon)
+        return daemon.run()
+
+    def test_a_newer_schema_is_left_alone(self):
+        def prepare(daemon):
+            database = sqlite3.connect(daemon.store_path)
+            database.execute("PRAGMA user_version = 99")
+            database.execute("CREATE TABLE theirs(x)")
+            database.commit()
+            database.close()
+
+        daemon = self.start(prepare)
+        client = daemon.client()
+        self.addCleanup(client.close)
+        client.session(1)
+        client.result("sendMessage", {"a": 1}, 4, 1, [1])
+        self.assertIs(client.result("admin.flush"), True)
+        self.assertIn("no backends found", daemon.log())
+        self.assertEqual(daemon.rows("SELECT name FROM sqlite_master"), [("theirs",)])
+
+    def test_a_damaged_file_is_set_aside(self):
+        def prepare(daemon):
+            with open(daemon.store_path, "wb") as file:
+                file.write(b"this is no database" * 1000)
+
+        daemon = self.start(prepare)
+        client = daemon.client()
+        self.addCleanup(client.close)
+        client.session(1)
+        client.result("sendMessage", {"a": 1}, 4, 1, [1])
+        client.result("admin.flush")
+        self.assertEqual(daemon.rows("SELECT count(*) FROM upload_message"), [(1,)])
+        aside = [name for name in os.listdir(os.path.dirname(daemon.store_path))
+                 if name.startswith("telemetry.db.damaged-")]
+        self.assertEqual(len(aside), 1)
+
+
+if __name__ == "__main__":
+    unittest.main()
