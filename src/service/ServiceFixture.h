@@ -78,7 +78,10 @@ private:
 
 class ServiceTest : public ::testing::Test {
 protected:
-    ServiceTest() { restartService(); }
+    explicit ServiceTest(bool internalBuild = false) {
+        platform_.deviceProperties.booleans["InternalBuild"] = internalBuild;
+        restartService();
+    }
 
     // For what the service reads once, at its construction.
     void restartService() {
