@@ -74,8 +74,8 @@ Dictionary describe(const StoreStatus& store) {
 LinuxPlatform::LinuxPlatform(Directories directories, platform::TraceMarks& traceMarks)
     : directories_(std::move(directories)), stopSignals_(context_, SIGTERM, SIGINT),
       reloadSignals_(context_, SIGHUP), watchdog_(context_), shutdownLimit_(context_),
-      log_(LogWriter::defaultOutput()), configuration_(directories_.configuration),
-      ownProcess_([this] {
+      files_(directories_), log_(LogWriter::defaultOutput()),
+      configuration_(directories_.configuration), ownProcess_([this] {
           // The service was asked to die at once; what it accepted need not.
           (void)store_->close();
           log_.flush();
@@ -107,6 +107,7 @@ LinuxPlatform::LinuxPlatform(Directories directories, platform::TraceMarks& trac
     platform_.random = &random_;
     platform_.queues = queues_.get();
     platform_.conditions = &conditions_;
+    platform_.files = &files_;
     platform_.traceMarks = &traceMarks;
     platform_.preferences = &configuration_;
     platform_.featureFlags = &configuration_;

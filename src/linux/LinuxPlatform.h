@@ -19,6 +19,7 @@
 #include "linux/Directories.h"
 #include "linux/IncidentFolder.h"
 #include "linux/LinuxFacts.h"
+#include "linux/LinuxFiles.h"
 #include "linux/LogWriter.h"
 #include "linux/NotificationCenter.h"
 #include "linux/Pressure.h"
@@ -72,6 +73,7 @@ private:
     SystemClock clock_;
     SystemRandom random_;
     SystemConditions conditions_;
+    LinuxFiles files_;
     LogWriter log_;
     Pressure pressure_;
     Configuration configuration_;

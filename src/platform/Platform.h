@@ -15,6 +15,7 @@ class ConditionFactory;
 class DeviceProperties;
 class EnergyLedger;
 class FeatureFlags;
+class Files;
 class IncidentReporter;
 class LogSink;
 class MetricService;
@@ -34,6 +35,7 @@ struct Platform {
     QueueFactory* queues = nullptr;
     ConditionFactory* conditions = nullptr;
     LogSink* log = nullptr;
+    Files* files = nullptr;
     TraceMarks* traceMarks = nullptr;
     Preferences* preferences = nullptr;
     FeatureFlags* featureFlags = nullptr;

@@ -6,6 +6,7 @@
 #include "testing/FakeCondition.h"
 #include "testing/FakeDevice.h"
 #include "testing/FakeEventServices.h"
+#include "testing/FakeFiles.h"
 #include "testing/FakeIncidentReporter.h"
 #include "testing/FakeOperations.h"
 #include "testing/FakeRelayReporting.h"
@@ -33,6 +34,7 @@ public:
                                   .queues = &queues,
                                   .conditions = &conditions,
                                   .log = &log,
+                                  .files = &files,
                                   .traceMarks = &traceMarks,
                                   .preferences = &preferences,
                                   .featureFlags = &featureFlags,
@@ -58,6 +60,7 @@ public:
     FakeRandom random;
     ManualQueues queues{clock};
     FakeConditionFactory conditions;
+    FakeFiles files;
     FakePreferences preferences;
     FakeFeatureFlags featureFlags;
     FakeDeviceProperties deviceProperties;

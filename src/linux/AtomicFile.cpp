@@ -1,0 +1,98 @@
+#include "linux/AtomicFile.h"
+
+#include <atomic>
+#include <cerrno>
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <unistd.h>
+#include <utility>
+
+namespace halyard::linux_ {
+namespace {
+
+constexpr mode_t kMode = 0644;
+
+std::errc lastError() {
+    return static_cast<std::errc>(errno);
+}
+
+// Unique among those who write here, and never followed when it is a link that
+// somebody planted.
+std::filesystem::path temporaryName(const std::filesystem::path& path) {
+    static std::atomic<unsigned> count{0};
+    return path.parent_path() /
+           fmt::format(".{}.{}-{}", path.filename().string(), ::getpid(), count.fetch_add(1));
+}
+
+} // namespace
+
+AtomicFile::AtomicFile(std::filesystem::path path)
+    : path_(std::move(path)), temporary_(temporaryName(path_)) {
+    (void)::unlink(temporary_.c_str()); // Of a process that had our number and was killed.
+    const int fd =
+        ::open(temporary_.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC | O_NOFOLLOW, kMode);
+    if (fd < 0) {
+        failed();
+        return;
+    }
+    stream_ = ::fdopen(fd, "w");
+    if (stream_ == nullptr) {
+        failed();
+        ::close(fd);
+    }
+}
+
+AtomicFile::~AtomicFile() {
+    if (stream_ != nullptr) {
+        (void)std::fclose(stream_);
+        (void)::unlink(temporary_.c_str());
+    }
+}
+
+void AtomicFile::failed() {
+    if (error_ == std::errc{}) {
+        error_ = lastError();
+    }
+}
+
+void AtomicFile::write(std::string_view text) {
+    if (stream_ != nullptr && std::fwrite(text.data(), 1, text.size(), stream_) != text.size()) {
+        failed();
+    }
+}
+
+std::errc AtomicFile::syncDirectory() const {
+    const auto parent = path_.has_parent_path() ? path_.parent_path() : ".";
+    const int fd = ::open(parent.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+    if (fd < 0) {
+        return lastError();
+    }
+    const std::errc result = ::fsync(fd) == 0 ? std::errc{} : lastError();
+    ::close(fd);
+    return result;
+}
+
+std::errc AtomicFile::commit() {
+    if (stream_ == nullptr) {
+        return error_;
+    }
+    if (std::ferror(stream_) != 0 && error_ == std::errc{}) {
+        error_ = std::errc::io_error;
+    }
+    if (std::fflush(stream_) != 0 || ::fsync(::fileno(stream_)) != 0) {
+        failed();
+    }
+    if (std::fclose(std::exchange(stream_, nullptr)) != 0) {
+        failed();
+    }
+    if (error_ == std::errc{} && ::rename(temporary_.c_str(), path_.c_str()) != 0) {
+        failed();
+    }
+    if (error_ != std::errc{}) {
+        (void)::unlink(temporary_.c_str());
+        return error_;
+    }
+    return syncDirectory();
+}
+
+} // namespace halyard::linux_

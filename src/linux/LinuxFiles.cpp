@@ -1,0 +1,67 @@
+#include "linux/LinuxFiles.h"
+
+#include <cerrno>
+#include <sys/stat.h>
+
+#include "linux/AtomicFile.h"
+#include "linux/SmallFile.h"
+
+namespace halyard::linux_ {
+namespace {
+
+namespace fs = std::filesystem;
+
+// None when the directory is there afterwards.
+std::errc makeDirectory(const fs::path& path, mode_t mode) {
+    if (::mkdir(path.c_str(), mode) == 0) {
+        return {};
+    }
+    const auto error = static_cast<std::errc>(errno);
+    std::error_code ignored;
+    return fs::is_directory(path, ignored) ? std::errc{} : error;
+}
+
+} // namespace
+
+Error systemError(std::errc code) {
+    return {"posix", static_cast<std::int64_t>(code), std::make_error_code(code).message()};
+}
+
+std::variant<std::string, Error> LinuxFiles::readFile(std::string_view path,
+                                                      std::size_t most) const {
+    auto result = readSmallFile(directories_.mapped(path), most);
+    if (const auto* const error = std::get_if<std::errc>(&result)) {
+        return systemError(*error);
+    }
+    return std::get<std::string>(std::move(result));
+}
+
+std::string LinuxFiles::currentDirectory() const {
+    std::error_code error;
+    const fs::path path = fs::current_path(error);
+    return error ? "/" : path.string();
+}
+
+MaybeError LinuxFiles::createDirectories(std::string_view path, std::uint32_t mode) {
+    fs::path made;
+    for (const fs::path& part : directories_.mapped(path)) {
+        made /= part;
+        if (part.empty() || part == "/") {
+            continue; // A trailing slash, the root.
+        }
+        const std::errc error = makeDirectory(made, static_cast<mode_t>(mode));
+        if (error != std::errc{}) {
+            return systemError(error);
+        }
+    }
+    return std::nullopt;
+}
+
+MaybeError LinuxFiles::writeFileAtomically(std::string_view path, std::string_view contents) {
+    AtomicFile file(directories_.mapped(path));
+    file.write(contents);
+    const std::errc error = file.commit();
+    return error == std::errc{} ? MaybeError() : systemError(error);
+}
+
+} // namespace halyard::linux_

@@ -1,0 +1,29 @@
+// Files of the real system. Paths below the audio logs' directory, as the
+// service's constants name it, lie below the daemon's logs directory.
+//
+// Any thread.
+#pragma once
+
+#include "linux/Directories.h"
+#include "platform/Files.h"
+
+namespace halyard::linux_ {
+
+class LinuxFiles final : public platform::Files {
+public:
+    explicit LinuxFiles(Directories directories) : directories_(std::move(directories)) {}
+
+    std::variant<std::string, Error> readFile(std::string_view path,
+                                              std::size_t most) const override;
+    std::string currentDirectory() const override;
+    MaybeError createDirectories(std::string_view path, std::uint32_t mode) override;
+    MaybeError writeFileAtomically(std::string_view path, std::string_view contents) override;
+
+private:
+    const Directories directories_;
+};
+
+// The error of a system call, with errno as its code.
+Error systemError(std::errc code);
+
+} // namespace halyard::linux_

@@ -1,0 +1,93 @@
+#include "linux/LinuxFiles.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include "linux/AtomicFile.h"
+#include "linux/SmallFile.h"
+#include "testing/TempTree.h"
+
+namespace halyard::linux_ {
+namespace {
+
+namespace fs = std::filesystem;
+
+class LinuxFilesTest : public ::testing::Test {
+protected:
+    std::string read(std::string_view path, std::size_t most = 100) {
+        const auto result = files_.readFile((tree_ / path).string(), most);
+        const auto* const error = std::get_if<Error>(&result);
+        return error != nullptr ? error->message : std::get<std::string>(result);
+    }
+    std::vector<std::string> names() const {
+        std::vector<std::string> result;
+        for (const auto& entry : fs::directory_iterator(tree_.path())) {
+            result.push_back(entry.path().filename().string());
+        }
+        return result;
+    }
+
+    halyard::testing::TempTree tree_;
+    LinuxFiles files_{Directories{"/c", "/s", "/r", tree_ / "logs"}};
+};
+
+TEST_F(LinuxFilesTest, ReadsWholeFilesUpToABound) {
+    tree_.write("small", "text\n");
+    EXPECT_EQ(read("small", 5), "text\n");
+    EXPECT_EQ(read("small", 4), "File too large");
+    EXPECT_EQ(read("missing"), "No such file or directory");
+    EXPECT_EQ(read(""), "Is a directory");
+}
+
+TEST_F(LinuxFilesTest, MakesDirectoriesWithTheirParents) {
+    const ::mode_t mask = ::umask(0);
+    EXPECT_EQ(files_.createDirectories((tree_ / "a/b/c/").string(), 0777), std::nullopt);
+    ::umask(mask);
+    EXPECT_EQ(fs::status(tree_ / "a/b/c").permissions(), fs::perms::all);
+    EXPECT_EQ(files_.createDirectories((tree_ / "a/b").string(), 0777), std::nullopt);
+    tree_.write("file", "");
+    EXPECT_EQ(files_.createDirectories((tree_ / "file/x").string(), 0777)->message, "File exists");
+}
+
+TEST_F(LinuxFilesTest, TheAudioLogsLieInTheLogsDirectory) {
+    const std::string traces =
+        "/private/var/mobile/Library/Logs/FaultDepot/DiagnosticLogs/Audio/Traces";
+    ASSERT_EQ(files_.createDirectories(traces, 0755), std::nullopt);
+    ASSERT_EQ(files_.writeFileAtomically(traces + "/results", "1"), std::nullopt);
+    EXPECT_EQ(read("logs/Traces/results"), "1");
+}
+
+TEST_F(LinuxFilesTest, WritesReplaceAndLeaveNothingElseBehind) {
+    const std::string path = (tree_ / "file").string();
+    ASSERT_EQ(files_.writeFileAtomically(path, "old, and longer"), std::nullopt);
+    ASSERT_EQ(files_.writeFileAtomically(path, "new"), std::nullopt);
+    EXPECT_EQ(read("file"), "new");
+    EXPECT_THAT(names(), ::testing::ElementsAre("file"));
+}
+
+TEST_F(LinuxFilesTest, FailedWritesTellAndLeaveWhatWasThere) {
+    tree_.write("folder/file", "old");
+    const auto error = files_.writeFileAtomically((tree_ / "folder").string(), "new");
+    ASSERT_TRUE(error.has_value());
+    EXPECT_EQ(error->code, EISDIR);
+    EXPECT_EQ(files_.writeFileAtomically((tree_ / "no/file").string(), "new")->code, ENOENT);
+    EXPECT_EQ(read("folder/file"), "old");
+    EXPECT_THAT(names(), ::testing::ElementsAre("folder"));
+}
+
+TEST_F(LinuxFilesTest, AnAbandonedFileVanishes) {
+    {
+        AtomicFile file(tree_ / "file");
+        file.write("half");
+        EXPECT_THAT(names(), ::testing::SizeIs(1));
+    }
+    EXPECT_THAT(names(), ::testing::IsEmpty());
+}
+
+TEST_F(LinuxFilesTest, TheCurrentDirectoryIsAbsolute) {
+    EXPECT_TRUE(fs::path(files_.currentDirectory()).is_absolute());
+}
+
+} // namespace
+} // namespace halyard::linux_
