@@ -82,7 +82,12 @@ Store::Store(StoreOptions options, const platform::Clock& clock)
 }
 
 Store::~Store() {
-    close();
+    if (watching_.joinable()) {
+        (void)close();
+    }
+    if (writing_.joinable()) {
+        writing_.detach();
+    }
 }
 
 bool Store::close() {
@@ -101,11 +106,11 @@ bool Store::close() {
         }
         ended = ending_->writerEnded;
     }
-    watching_.join();
+    if (watching_.joinable()) {
+        watching_.join();
+    }
     if (ended) {
         writing_.join();
-    } else {
-        writing_.detach();
     }
     return ended;
 }

@@ -65,9 +65,10 @@ public:
     StoreStatus status() const { return writer_->status(); }
 
     // Writes what is waiting, moves the write-ahead log into the file and closes
-    // it. False when that did not end within the limit: the thread is left behind
-    // then, and the process should end without tearing anything down.
-    bool close();
+    // it. False when that did not end within the limit: it goes on then and may be
+    // waited for again, but once this object is destroyed its thread is left
+    // behind, and the process should end without tearing anything down.
+    [[nodiscard]] bool close();
 
 private:
     const std::shared_ptr<StoreEnding> ending_;

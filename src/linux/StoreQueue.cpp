@@ -181,8 +181,9 @@ void StoreQueue::settle(std::size_t rows, std::size_t bytes) {
         heldRows_ -= rows;
         heldBytes_ -= std::min(bytes, heldBytes_);
         noteTightLocked();
-        const auto rest = std::find_if(flushes_.begin(), flushes_.end(),
-                                       [&](const Flush& flush) { return flush.upTo > settled_; });
+        const auto rest =
+            std::find_if(flushes_.begin(), flushes_.end(),
+                         [upTo = settled_](const Flush& flush) { return flush.upTo > upTo; });
         std::move(flushes_.begin(), rest, std::back_inserter(finished));
         flushes_.erase(flushes_.begin(), rest);
         relieved = pressure_;

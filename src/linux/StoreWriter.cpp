@@ -119,6 +119,10 @@ void StoreWriter::carryOver(const std::filesystem::path& aside) {
 }
 
 void StoreWriter::closeDatabase() {
+    if (surrendered_) {
+        HY_LOG_ERROR(HYReportingPlatformCategory, "closing {}, {} rows lost: {}",
+                     options_.path.string(), sum(queue_.levels().lost), nameOf(*surrendered_));
+    }
     retention_.reset();
     if (database_.hasMoved()) {
         database_.abandon(); // What lies at its path is not ours.
