@@ -1,0 +1,177 @@
+#include "tracing/PropertyList.h"
+
+#include <cstdint>
+#include <cstdlib>
+#include <fmt/format.h>
+#include <memory>
+#include <plist/plist.h>
+#include <string>
+
+#include "common/PropertyListText.h"
+
+namespace halyard {
+namespace {
+
+constexpr std::string_view kBinaryMagic = "bplist";
+// Dates count from 2001 in property lists.
+constexpr std::int64_t kSecondsTo2001 = 978'307'200;
+
+struct FreeNode {
+    void operator()(void* node) const { plist_free(node); }
+};
+struct FreeText {
+    void operator()(char* text) const { std::free(text); }
+};
+using Node = std::unique_ptr<void, FreeNode>;
+using Text = std::unique_ptr<char, FreeText>;
+
+Error propertyListError(std::string_view what) {
+    return {std::string(kPropertyListErrorDomain), 1, std::string(what)};
+}
+
+bool beginsXml(std::string_view bytes) {
+    const std::size_t first = bytes.find_first_not_of(" \t\r\n");
+    const std::string_view begin =
+        bytes.substr(first == std::string_view::npos ? bytes.size() : first);
+    return begin.starts_with("<?xml") || begin.starts_with("<!DOCTYPE") ||
+           begin.starts_with("<plist") || begin.starts_with("<!--") ||
+           begin.starts_with("\xEF\xBB\xBF<");
+}
+
+// The library frees its tree by recursion, so depth is settled before it reads.
+// Counts openings in comments, too; nobody nests that deep.
+bool isTooDeepXml(std::string_view bytes) {
+    int depth = 0;
+    for (std::size_t at = bytes.find('<'); at != std::string_view::npos;
+         at = bytes.find('<', at + 1)) {
+        const std::string_view tag = bytes.substr(at + 1, 6);
+        if (tag.starts_with("dict") || tag.starts_with("array")) {
+            if (++depth > kMostPropertyListLevels) {
+                return true;
+            }
+        } else if (tag.starts_with("/dict") || tag.starts_with("/array")) {
+            --depth;
+        }
+    }
+    return false;
+}
+
+std::string dataText(plist_t node) {
+    std::uint64_t length = 0;
+    const char* const bytes = plist_get_data_ptr(node, &length);
+    std::string text = "<";
+    for (std::uint64_t i = 0; i < length; ++i) {
+        fmt::format_to(std::back_inserter(text), "{:02x}", static_cast<unsigned char>(bytes[i]));
+    }
+    return text + '>';
+}
+
+// Throws Error.
+Value valueOf(plist_t node, int level);
+
+Value listOf(plist_t node, int level) {
+    List list;
+    const std::uint32_t size = plist_array_get_size(node);
+    for (std::uint32_t i = 0; i < size; ++i) {
+        list.append(valueOf(plist_array_get_item(node, i), level + 1));
+    }
+    return list;
+}
+
+Value dictionaryOf(plist_t node, int level) {
+    std::vector<Dictionary::Entry> entries;
+    plist_dict_iter cursor = nullptr;
+    plist_dict_new_iter(node, &cursor);
+    const std::unique_ptr<void, decltype(&std::free)> owned(cursor, &std::free);
+    for (;;) {
+        char* key = nullptr;
+        plist_t item = nullptr;
+        plist_dict_next_item(node, cursor, &key, &item);
+        const Text ownedKey(key);
+        if (item == nullptr) {
+            return Dictionary(std::move(entries));
+        }
+        entries.push_back({std::string_view(key), valueOf(item, level + 1)});
+    }
+}
+
+Value dateOf(plist_t node) {
+    std::int32_t seconds = 0;
+    std::int32_t microseconds = 0;
+    plist_get_date_val(node, &seconds, &microseconds);
+    return Date{seconds + kSecondsTo2001, 0};
+}
+
+Value valueOf(plist_t node, int level) {
+    if (level >= kMostPropertyListLevels) {
+        throw propertyListError("too many levels");
+    }
+    std::uint8_t boolean = 0;
+    std::uint64_t integer = 0;
+    double real = 0;
+    switch (plist_get_node_type(node)) {
+    case PLIST_DICT:
+        return dictionaryOf(node, level);
+    case PLIST_ARRAY:
+        return listOf(node, level);
+    case PLIST_STRING: {
+        std::uint64_t length = 0;
+        const char* const text = plist_get_string_ptr(node, &length);
+        return text != nullptr ? Value(std::string_view(text, length)) : Value("");
+    }
+    case PLIST_BOOLEAN:
+        plist_get_bool_val(node, &boolean);
+        return boolean != 0;
+    case PLIST_UINT:
+        plist_get_uint_val(node, &integer);
+        return static_cast<std::int64_t>(integer);
+    case PLIST_REAL:
+        plist_get_real_val(node, &real);
+        return real;
+    case PLIST_DATE:
+        return dateOf(node);
+    case PLIST_DATA:
+        return dataText(node);
+    default:
+        throw propertyListError("a value of unknown type");
+    }
+}
+
+std::variant<Value, Error> parseWithLibrary(std::string_view bytes, bool binary) {
+    plist_t root = nullptr;
+    const auto size = static_cast<std::uint32_t>(bytes.size());
+    if (binary) {
+        plist_from_bin(bytes.data(), size, &root);
+    } else {
+        plist_from_xml(bytes.data(), size, &root);
+    }
+    const Node owned(root);
+    if (root == nullptr) {
+        return propertyListError(binary ? "a damaged binary property list"
+                                        : "a damaged XML property list");
+    }
+    try {
+        return valueOf(root, 0);
+    } catch (const Error& error) {
+        return error;
+    }
+}
+
+} // namespace
+
+std::variant<Value, Error> parsePropertyList(std::string_view bytes) {
+    const bool binary = bytes.starts_with(kBinaryMagic);
+    if (bytes.size() > (binary ? kMostBinaryPropertyListBytes : kMostPropertyListBytes)) {
+        return propertyListError("too large");
+    }
+    if (binary) {
+        return parseWithLibrary(bytes, true);
+    }
+    if (!beginsXml(bytes)) {
+        return parsePropertyListText(bytes);
+    }
+    return isTooDeepXml(bytes) ? propertyListError("too many levels")
+                               : parseWithLibrary(bytes, false);
+}
+
+} // namespace halyard

@@ -1,0 +1,66 @@
+#include "tracing/PropertyList.h"
+
+#include <gtest/gtest.h>
+#include <limits>
+
+#include "common/Description.h"
+#include "common/PropertyListText.h"
+
+namespace halyard {
+namespace {
+
+std::string errorOf(std::string_view bytes) {
+    const auto result = parsePropertyList(bytes);
+    const auto* const error = std::get_if<Error>(&result);
+    return error != nullptr ? error->message : "none";
+}
+
+Value parsedXml(const std::string& body) {
+    const auto result =
+        parsePropertyList("<?xml version=\"1.0\"?><plist version=\"1.0\">" + body + "</plist>");
+    const auto* const error = std::get_if<Error>(&result);
+    EXPECT_EQ(error, nullptr) << error->message;
+    return error == nullptr ? std::get<Value>(result) : Value();
+}
+
+TEST(PropertyListTest, XmlScalarsKeepTheirKinds) {
+    EXPECT_EQ(parsedXml("<string>a &amp; b</string>"), Value("a & b"));
+    EXPECT_EQ(parsedXml("<string/>"), Value(""));
+    EXPECT_EQ(parsedXml("<integer>100</integer>").kind(), Value::Kind::Int);
+    EXPECT_EQ(parsedXml("<integer>-1</integer>"), Value(-1));
+    EXPECT_EQ(parsedXml("<real>0.5</real>"), Value(0.5));
+    EXPECT_EQ(parsedXml("<true/>").kind(), Value::Kind::Bool);
+    EXPECT_EQ(describe(parsedXml("<date>2024-02-29T12:34:56Z</date>")),
+              "2024-02-29 12:34:56 +0000");
+    EXPECT_EQ(parsedXml("<data>D713HCc1rg==</data>"), Value("<0fbd771c2735ae>"));
+}
+
+TEST(PropertyListTest, XmlContainersKeepTheirOrder) {
+    const Value value = parsedXml("<dict><key>b</key><array><string>x</string></array>"
+                                  "<key>a</key><dict/></dict>");
+    EXPECT_EQ(value, Value(Dictionary{{"b", List{Value("x")}}, {"a", Dictionary()}}));
+    EXPECT_EQ(value.dictionary().begin()->key, Value("b"));
+}
+
+TEST(PropertyListTest, AnythingElseIsTakenForText) {
+    EXPECT_EQ(std::get<Value>(parsePropertyList("{ a = 1; }")), Value(Dictionary{{"a", "1"}}));
+    EXPECT_EQ(errorOf(""), "line 1: the text is empty");
+}
+
+TEST(PropertyListTest, DamageIsTold) {
+    EXPECT_EQ(errorOf("<plist><dict>"), "a damaged XML property list");
+    EXPECT_EQ(errorOf("bplist00"), "a damaged binary property list");
+}
+
+TEST(PropertyListTest, DepthAndSizeAreBounded) {
+    std::string deep = "<plist>";
+    for (int i = 0; i <= kMostPropertyListLevels; ++i) {
+        deep += "<array>";
+    }
+    EXPECT_EQ(errorOf(deep), "too many levels");
+    EXPECT_EQ(errorOf(std::string(kMostPropertyListBytes + 1, ' ')), "too large");
+    EXPECT_EQ(errorOf("bplist00" + std::string(kMostBinaryPropertyListBytes, ' ')), "too large");
+}
+
+} // namespace
+} // namespace halyard
