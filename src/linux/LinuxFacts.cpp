@@ -38,6 +38,13 @@ std::chrono::nanoseconds SystemClock::systemUptime() const {
     return std::chrono::seconds(now.tv_sec) + std::chrono::nanoseconds(now.tv_nsec);
 }
 
+std::chrono::seconds SystemClock::utcOffset(platform::WallTime time) const {
+    const std::time_t seconds =
+        std::chrono::floor<std::chrono::seconds>(time).time_since_epoch().count();
+    std::tm local{};
+    return std::chrono::seconds(::localtime_r(&seconds, &local) != nullptr ? local.tm_gmtoff : 0);
+}
+
 std::uint32_t SystemRandom::uniform(std::uint32_t bound) {
     thread_local std::mt19937 engine{std::random_device{}()};
     return std::uniform_int_distribution<std::uint32_t>(0, bound - 1)(engine);

@@ -12,6 +12,7 @@ public:
     platform::WallTime wallTime() const override;
     platform::SteadyTime steadyTime() const override;
     std::chrono::nanoseconds systemUptime() const override;
+    std::chrono::seconds utcOffset(platform::WallTime time) const override;
 };
 
 class SystemRandom final : public platform::Random {

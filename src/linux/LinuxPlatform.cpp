@@ -24,9 +24,15 @@ constexpr std::chrono::seconds kShutdownLimit{25};
 // second: these rows take a slow machine less than that.
 constexpr StoreQueue::Marks kStoreMarks{12288, 6144, 16 * 1024 * 1024, 8 * 1024 * 1024};
 
-StoreOptions storeOptions(const std::filesystem::path& directory, Pressure& pressure) {
+StoreLimits storeLimits(const Settings& settings) {
+    return {settings.store.maxBytes, settings.store.maxAge};
+}
+
+StoreOptions storeOptions(const std::filesystem::path& directory, const Settings& settings,
+                          Pressure& pressure) {
     StoreOptions options;
     options.path = directory / kStoreFile;
+    options.limits = storeLimits(settings);
     options.marks = kStoreMarks;
     options.onPressure = [&pressure](bool on) { pressure.set(Pressure::Store, on); };
     return options;
@@ -89,7 +95,8 @@ LinuxPlatform::LinuxPlatform(Directories directories, platform::TraceMarks& trac
         [this](const Settings&, const Settings& after) { log_.setLevel(after.logLevel); });
     (void)configuration_.reload();
 
-    store_ = std::make_unique<Store>(storeOptions(directories_.state, pressure_), clock_);
+    store_ = std::make_unique<Store>(
+        storeOptions(directories_.state, *configuration_.settings(), pressure_), clock_);
     relayReporting_ = std::make_unique<StoreRelayReporting>(*store_, random_);
     analytics_ = std::make_unique<StoreAnalyticsService>(*store_);
     energyLedger_ = std::make_unique<StoreEnergyLedger>(*store_);
@@ -136,7 +143,7 @@ LinuxPlatform::~LinuxPlatform() {
 
 void LinuxPlatform::applySettings(const Settings& settings) {
     analytics_->setWanted(settings.wantedEvents);
-    store_->setLimits({settings.store.maxBytes, settings.store.maxAge});
+    store_->setLimits(storeLimits(settings));
 }
 
 PeerRights LinuxPlatform::rightsOfPeer(const Peer& peer) const {

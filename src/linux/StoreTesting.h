@@ -47,6 +47,9 @@ public:
         return platform::SteadyTime(std::chrono::seconds(1000) + passed());
     }
     std::chrono::nanoseconds systemUptime() const override { return passed(); }
+    std::chrono::seconds utcOffset(platform::WallTime) const override {
+        return std::chrono::seconds(0);
+    }
     void advance(std::chrono::nanoseconds by) { passed_ += by.count(); }
 
 private:

@@ -16,6 +16,8 @@ public:
     virtual SteadyTime steadyTime() const = 0;
     // Since boot, time asleep included.
     virtual std::chrono::nanoseconds systemUptime() const = 0;
+    // How far local time is ahead of UTC at `time`.
+    virtual std::chrono::seconds utcOffset(WallTime time) const = 0;
 };
 
 // Seconds since 1970, as messages carry them.

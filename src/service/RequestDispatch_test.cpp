@@ -174,7 +174,8 @@ TEST_F(RequestDispatchTest, TheStatusJoinsTheAdaptersCountersAndTheServices) {
                                                {"connections", 1},
                                                {"sessions", 2},
                                                {"sessions_started", 1},
-                                               {"active_session_count", 1}}));
+                                               {"active_session_count", 1},
+                                               {"repeats_dropped", 0}}));
 }
 
 TEST_F(RequestDispatchTest, TheStatusOfAGoneServiceIsThatOfTheAdapters) {

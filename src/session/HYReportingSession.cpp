@@ -4,10 +4,15 @@
 #include <fmt/format.h>
 #include <utility>
 
+#include "common/Json.h"
+#include "platform/Clock.h"
+#include "platform/Files.h"
+#include "platform/HYReportingUtilityDevice.h"
 #include "platform/Log.h"
 #include "platform/Platform.h"
 #include "platform/TraceMarks.h"
 #include "session/SessionEvents.h"
+#include "session/SummaryFile.h"
 #include "sinks/HYReportingTallyhubBridge.h"
 
 namespace halyard {
@@ -19,6 +24,7 @@ constexpr std::uint32_t kStopMark = 0x21044830;
 constexpr std::uint32_t kDestroyedMark = 0x21044834;
 constexpr std::uint32_t kMessageMark = 0x21044838;
 
+constexpr std::uint32_t kLogsMode = 0777;
 constexpr AudioEventCategory kSummaryCategory = 0xFFFFFFFF;
 constexpr const char* kHostApplicationKey = "HostApplicationDisplayID";
 constexpr const char* kClientApplicationKey = "VQHostApplicationDisplayID";
@@ -127,6 +133,7 @@ void HYReportingSession::stop() {
     HY_LOG_DEBUG(HYReportingSessionCategory, "ending session {}", reporterID_);
     mark(kStopMark);
     sendVolumeEvents();
+    writeSummaryJson();
     sendSummaryEvent();
     if (relayReportingEnabled()) {
         stopRelayReporting();
@@ -162,6 +169,36 @@ void HYReportingSession::sendVolumeEvents() {
         sendMessage(event, kAudioEventCategoryVolume, kAudioEventTypeSummary, true, nullptr);
         HYReportingTallyhubBridge::handleEvent(&event, kAudioEventCategoryVolume,
                                                kAudioEventTypeSummary, shared_from_this());
+    }
+}
+
+void HYReportingSession::writeSummaryJson() const {
+    if (!HYReportingUtilityIsInternalBuild()) {
+        return;
+    }
+    std::string text;
+    {
+        const MutexLock lock(batchMutex_);
+        if (batch_ == nullptr || batch_->empty()) {
+            return;
+        }
+        text = toPrettyJson(summaryFileContents(batch_->entries()));
+    }
+    platform::Files& files = *platform::current().files;
+    if (const auto error = files.createDirectories(HYReportingLogsDirectory, kLogsMode)) {
+        HY_LOG_ERROR(HYReportingSessionCategory, "can't create logging directory at {}: {}",
+                     HYReportingLogsDirectory, error->message);
+    }
+    const platform::Clock& clock = *platform::current().clock;
+    const std::string path =
+        std::string(HYReportingLogsDirectory) + '/' +
+        summaryFileName(clock.wallTime(), clock.utcOffset(clock.wallTime()),
+                        describe(HYReportingUtilityRetrieveAppName(configuration())),
+                        HYReportingUtilityGenerateServiceNameFromServiceType(serviceType()));
+    if (const auto error = files.writeFileAtomically(path, text)) {
+        HY_LOG_ERROR(HYReportingSessionCategory, "jsonOutput writeToURL: {}", error->message);
+    } else {
+        HY_LOG_INFO(HYReportingSessionCategory, "jsonOutput writeToURL: {}", path);
     }
 }
 

@@ -83,6 +83,9 @@ public:
         HY_EXCLUDES(batchMutex_);
     std::optional<Dictionary> createSummaryEventForSession() const HY_EXCLUDES(batchMutex_);
 
+    // On internal builds, writes the batch to a file of its own.
+    void writeSummaryJson() const HY_EXCLUDES(batchMutex_);
+
     // Records the message in the batch unless it is redundant; true when it was.
     bool createMessageIdentifierWithCategory(AudioEventCategory category, AudioEventType type,
                                              const Dictionary& message) HY_REQUIRES(batchMutex_);

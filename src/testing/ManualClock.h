@@ -13,12 +13,16 @@ public:
     platform::SteadyTime steadyTime() const override { return steady_; }
     std::chrono::nanoseconds systemUptime() const override { return steady_.time_since_epoch(); }
 
+    std::chrono::seconds utcOffset(platform::WallTime) const override { return offset; }
+
     void advance(std::chrono::nanoseconds by) {
         wall_ += by;
         steady_ += by;
     }
     // The wall clock alone, as an operator or NTP moves it.
     void setWallTime(platform::WallTime time) { wall_ = time; }
+
+    std::chrono::seconds offset{0};
 
 private:
     platform::WallTime wall_{std::chrono::seconds{1'700'000'000}};
