@@ -1,3 +1,4 @@
+#include "session/SessionEvents.h"
 #include "session/SessionFixture.h"
 
 namespace halyard {
@@ -280,6 +281,35 @@ TEST_F(SessionRelayTest, StopDeliversWhatWasSentThenFlushesAndCloses) {
     EXPECT_FALSE(session->getRelayReportingStartedState());
     EXPECT_TRUE(loggedByRelay(LogLevel::Debug, "entering relayreporting closeRelayReporting"));
     EXPECT_TRUE(loggedByRelay(LogLevel::Debug, "stopping and setting session to nil"));
+}
+
+TEST_F(SessionRelayTest, StopSendsTheVolumesThenTheSummaryThenCloses) {
+    const auto session = startConnectedSession();
+    for (const bool playing : {true, false}) {
+        send(*session, {{HYReportingMessageKeyVolume, 0.5},
+                        {HYReportingMessageKeyPlayingState, playing},
+                        {HYReportingMessageKeyHYTimestamp, playing ? 100 : 110}});
+    }
+    session->stop();
+    run();
+    ASSERT_EQ(upload().messages.size(), 4U);
+    EXPECT_EQ(upload().messages[2].category, kAudioEventCategoryVolume);
+    EXPECT_EQ(upload().messages[2].type, kAudioEventTypeSummary);
+    EXPECT_EQ(upload().messages[3].category, 0xFFFF);
+    EXPECT_EQ(upload().messages[3].type, kAudioEventTypeUnknown);
+    EXPECT_EQ(upload().flushes, 1);
+    EXPECT_TRUE(logged(LogLevel::Default, "sending volume event for reporter 7"));
+    EXPECT_TRUE(logged(LogLevel::Default, "sending summary event for reporter 7"));
+    EXPECT_THAT(platform_.analytics.asked, ElementsAre("com.kestrel.halyard.Volume.Summary",
+                                                       "com.kestrel.longformaudio.Volume.Summary"));
+}
+
+TEST_F(SessionRelayTest, ASessionThatTookNothingHasNoSummary) {
+    const auto session = startConnectedSession();
+    session->stop();
+    run();
+    EXPECT_THAT(upload().messages, IsEmpty());
+    EXPECT_EQ(upload().flushes, 1);
 }
 
 TEST_F(SessionRelayTest, AStopDuringTheOpeningClosesAfterIt) {
