@@ -16,6 +16,7 @@ class DeviceProperties;
 class EnergyLedger;
 class FeatureFlags;
 class Files;
+class HWReport;
 class IncidentReporter;
 class LogSink;
 class MetricService;
@@ -49,6 +50,8 @@ struct Platform {
     MetricService* metrics = nullptr;
     IncidentReporter* incidentReporter = nullptr;
     Operations* operations = nullptr;
+    // Null where the system has no such statistics.
+    HWReport* hwReport = nullptr;
 };
 
 // Replaces what was installed before; null uninstalls. Requires that no other

@@ -108,6 +108,16 @@ HYReportingSession::exchangeTransactionCompleteBlock(TransactionCompleteBlock bl
     return std::exchange(transactionCompleteBlock_, std::move(block));
 }
 
+platform::DriverSnapshotRef HYReportingSession::driverSnapShot() const {
+    const MutexLock lock(stateMutex_);
+    return driverSnapShot_;
+}
+
+void HYReportingSession::setDriverSnapShot(platform::DriverSnapshotRef snapshot) {
+    const MutexLock lock(stateMutex_);
+    driverSnapShot_.swap(snapshot); // The old one goes once the lock is released.
+}
+
 void HYReportingSession::start() {
     HY_LOG_DEBUG(HYReportingSessionCategory, "starting session owned by {}", reporterID_);
     if (started()) {

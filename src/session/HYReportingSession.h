@@ -20,6 +20,7 @@
 #include "common/HYReportingUtility.h"
 #include "common/Mutex.h"
 #include "common/Value.h"
+#include "platform/HWReport.h"
 #include "platform/RelayReporting.h"
 #include "platform/WorkQueue.h"
 #include "session/AsyncSemaphore.h"
@@ -107,6 +108,10 @@ public:
     // Stores the reply of a start request that is held until the session stops,
     // and returns the one held before.
     TransactionCompleteBlock exchangeTransactionCompleteBlock(TransactionCompleteBlock block);
+    // Kept for the driver statistics, which report the change since; null when
+    // there is none. The session itself does not read it.
+    platform::DriverSnapshotRef driverSnapShot() const HY_EXCLUDES(stateMutex_);
+    void setDriverSnapShot(platform::DriverSnapshotRef snapshot) HY_EXCLUDES(stateMutex_);
 
     // Repeats that were dropped since the session was created.
     std::uint64_t redundantMessages() const { return redundantMessages_.load(); }
@@ -171,6 +176,7 @@ private:
     std::string serviceName_ HY_GUARDED_BY(stateMutex_) = "unknown";
     Dictionary configuration_ HY_GUARDED_BY(stateMutex_);
     TransactionCompleteBlock transactionCompleteBlock_ HY_GUARDED_BY(stateMutex_);
+    platform::DriverSnapshotRef driverSnapShot_ HY_GUARDED_BY(stateMutex_);
     std::shared_ptr<platform::SerialQueue> relayReportingQueue_ HY_GUARDED_BY(stateMutex_);
     std::shared_ptr<platform::RelayReporting> relayReportingSession_ HY_GUARDED_BY(stateMutex_);
     Value relayReportingAgentToken_ HY_GUARDED_BY(stateMutex_);

@@ -7,6 +7,7 @@
 #include "testing/FakeDevice.h"
 #include "testing/FakeEventServices.h"
 #include "testing/FakeFiles.h"
+#include "testing/FakeHWReport.h"
 #include "testing/FakeIncidentReporter.h"
 #include "testing/FakeOperations.h"
 #include "testing/FakeRelayReporting.h"
@@ -47,7 +48,8 @@ public:
                                   .energyLedger = &energyLedger,
                                   .metrics = &metrics,
                                   .incidentReporter = &incidentReporter,
-                                  .operations = &operations};
+                                  .operations = &operations,
+                                  .hwReport = &hwReport};
         platform::install(&installation_.platform);
     }
     ~TestPlatform() { queues.clear(); }
@@ -73,6 +75,7 @@ public:
     FakeMetricService metrics;
     FakeIncidentReporter incidentReporter;
     FakeOperations operations;
+    FakeHWReport hwReport;
 };
 
 } // namespace halyard::testing
