@@ -152,6 +152,7 @@ void HYReportingClientServerInstance::start(Delegate& delegate, std::int64_t rep
     delegate.setActiveSessionCount(delegate.activeSessionCount() + 1);
     session->setRelayReportingEnabled(mayUpload(delegate.activeSessionCount()));
     session->start();
+    session->setDriverSnapShot(delegate.getSnapShot());
     if (const auto earlier = session->exchangeTransactionCompleteBlock(reply)) {
         earlier(std::nullopt, true);
     }
@@ -206,6 +207,8 @@ void HYReportingClientServerInstance::stop(Delegate& delegate, std::int64_t repo
     }
     const auto session = findReportingSessionForID(delegate, reporterID, false);
     if (session != nullptr && session->started()) {
+        delegate.sendDriverLogsForSession(session);
+        session->setDriverSnapShot(delegate.getSnapShot());
         session->stop();
         delegate.setActiveSessionCount(delegate.activeSessionCount() - 1);
         if (const auto held = session->exchangeTransactionCompleteBlock(nullptr)) {

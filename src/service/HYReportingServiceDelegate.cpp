@@ -52,6 +52,7 @@ double uptimeSeconds(std::int32_t pid, const std::optional<platform::WallTime>& 
 std::shared_ptr<HYReportingServiceDelegate> HYReportingServiceDelegate::make() {
     std::shared_ptr<HYReportingServiceDelegate> delegate(new HYReportingServiceDelegate);
     delegate->listenForFeatureStateChanges();
+    delegate->driverUtility_ = std::make_unique<HYReportingDriverUtility>();
     if (HYReportingUtilityIsInternalBuild()) {
         delegate->ibxStateManager_ = std::make_unique<HYReportingUtilityIBXStateManager>();
     }
@@ -203,6 +204,14 @@ HYReportingServiceDelegate::getAllActiveReportingSessions() const {
                      [](const Session& session) { return session->started(); });
     }
     return active;
+}
+
+platform::DriverSnapshotRef HYReportingServiceDelegate::getSnapShot() {
+    return driverUtility_->getSnapShot();
+}
+
+void HYReportingServiceDelegate::sendDriverLogsForSession(const Session& session) {
+    driverUtility_->sendDriverLogsForSession(session);
 }
 
 void HYReportingServiceDelegate::handleEventForIBX(const Dictionary& message,

@@ -15,6 +15,7 @@
 
 #include "common/Mutex.h"
 #include "common/Value.h"
+#include "drivers/HYReportingDriverUtility.h"
 #include "platform/Listener.h"
 #include "platform/WorkQueue.h"
 #include "service/FeatureState.h"
@@ -28,7 +29,8 @@ class HYReportingServiceDelegate final
       public HYReportingServiceDelegateProtocol,
       public std::enable_shared_from_this<HYReportingServiceDelegate> {
 public:
-    // Reads the defaults and registers for the feature notifications.
+    // Reads the defaults, registers for the feature notifications and subscribes
+    // to the driver statistics.
     static std::shared_ptr<HYReportingServiceDelegate> make();
 
     bool
@@ -41,6 +43,8 @@ public:
     std::vector<Session> getAllActiveReportingSessions() const override;
     Session findReportingSessionForID(std::int64_t reporterID) const override;
     void sessionRetired(const HYReportingSession& session) override;
+    platform::DriverSnapshotRef getSnapShot() override;
+    void sendDriverLogsForSession(const Session& session) override;
     void removeClient(const HYReportingClientServerInstance& client) override;
     void handleEventForIBX(const Dictionary& message, AudioEventCategory category,
                            std::uint16_t type, const Session& session,
@@ -71,6 +75,7 @@ private:
     std::int64_t activeSessionCount_ = 0;
     std::uint64_t repeatsOfRetiredSessions_ = 0;
     std::vector<FeatureRecord> features_;
+    std::unique_ptr<HYReportingDriverUtility> driverUtility_;
     // Null but on internal builds.
     std::unique_ptr<HYReportingUtilityIBXStateManager> ibxStateManager_;
 

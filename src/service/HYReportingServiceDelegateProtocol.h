@@ -10,6 +10,7 @@
 
 #include "common/HYReportingUtility.h"
 #include "common/Value.h"
+#include "platform/HWReport.h"
 
 namespace halyard {
 
@@ -32,6 +33,10 @@ public:
     virtual Session findReportingSessionForID(std::int64_t reporterID) const = 0;
     // A session has left its client's map.
     virtual void sessionRetired(const HYReportingSession& session) = 0;
+    // The driver statistics as they are now.
+    virtual platform::DriverSnapshotRef getSnapShot() = 0;
+    // Sends what changed since the session's snapshot.
+    virtual void sendDriverLogsForSession(const Session& session) = 0;
     virtual void removeClient(const HYReportingClientServerInstance& client) = 0;
     // Offers the message to the issue capture of internal builds.
     virtual void handleEventForIBX(const Dictionary& message, AudioEventCategory category,

@@ -1,0 +1,77 @@
+// When a client's requests take snapshots of the drivers and report them.
+#include "service/ServiceFixture.h"
+
+namespace halyard {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+class DriverReportsTest : public ServiceTest {
+protected:
+    // The service subscribes once, so the group has to be there before it.
+    DriverReportsTest() {
+        platform_.hwReport.groups["Speaker-(null)"] = {};
+        restartService();
+        platform_.hwReport.calls.clear();
+    }
+    const Peer& client() {
+        if (!client_) {
+            client_.emplace(connect(100));
+        }
+        return *client_;
+    }
+
+private:
+    std::optional<Peer> client_;
+};
+
+TEST_F(DriverReportsTest, TheServiceSubscribesAtItsConstruction) {
+    restartService();
+    EXPECT_EQ(platform_.hwReport.calls.at(0), "list KestrelZR4QLX-(null)");
+    EXPECT_EQ(platform_.hwReport.calls.at(2), "subscribe Speaker-(null)");
+}
+
+TEST_F(DriverReportsTest, AStartTakesASnapshotOfTheDriversAndSendsNothing) {
+    client().create(7);
+    EXPECT_EQ(session(7)->driverSnapShot(), nullptr);
+    client().start(7);
+    ASSERT_NE(session(7)->driverSnapShot(), nullptr);
+    EXPECT_EQ(session(7)->driverSnapShot()->count("Speaker-(null)"), 1U);
+    EXPECT_THAT(platform_.hwReport.calls, ElementsAre("sample Speaker-(null)"));
+    EXPECT_THAT(session(7)->nestedAggregatedPayloadData(), IsEmpty());
+}
+
+TEST_F(DriverReportsTest, AStopReportsTheDriversThenTakesASnapshot) {
+    client().createAndStart(7);
+    const auto atStart = session(7)->driverSnapShot();
+    platform_.hwReport.calls.clear();
+    client().stop(7);
+    EXPECT_THAT(
+        platform_.hwReport.calls,
+        ElementsAre("sample Speaker-(null)", "delta Speaker-(null) 1 2", "sample Speaker-(null)"));
+    EXPECT_NE(session(7)->driverSnapShot(), atStart);
+}
+
+TEST_F(DriverReportsTest, TheReportReachesTheUploadSessionBeforeItEnds) {
+    client().createAndStart(7);
+    testing::FakeHWReportChannel channel;
+    channel.format = platform::kHWReportFormatSimple;
+    channel.name = "Underruns";
+    channel.value = 3;
+    platform_.hwReport.groups["Speaker-(null)"].delta = {channel};
+    client().stop(7);
+    const auto& messages = platform_.relayReporting.uploads.at(0)->messages;
+    ASSERT_FALSE(messages.empty()); // The summary follows.
+    EXPECT_EQ(messages[0].payload["Simple_Underruns"], Value(3));
+}
+
+TEST_F(DriverReportsTest, ADestroyReportsNoDrivers) {
+    client().createAndStart(7);
+    platform_.hwReport.calls.clear();
+    client().destroy(7);
+    EXPECT_THAT(platform_.hwReport.calls, IsEmpty());
+}
+
+} // namespace
+} // namespace halyard
