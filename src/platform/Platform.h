@@ -14,6 +14,7 @@ class Clock;
 class ConditionFactory;
 class DeviceProperties;
 class EnergyLedger;
+class EventTrace;
 class FeatureFlags;
 class Files;
 class HWReport;
@@ -28,6 +29,7 @@ class ProcessTable;
 class QueueFactory;
 class Random;
 class RelayReportingFramework;
+class ResultsFiles;
 class TraceMarks;
 
 struct Platform {
@@ -38,6 +40,8 @@ struct Platform {
     LogSink* log = nullptr;
     Files* files = nullptr;
     TraceMarks* traceMarks = nullptr;
+    EventTrace* eventTrace = nullptr;
+    ResultsFiles* resultsFiles = nullptr;
     Preferences* preferences = nullptr;
     FeatureFlags* featureFlags = nullptr;
     DeviceProperties* deviceProperties = nullptr;

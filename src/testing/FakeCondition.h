@@ -24,14 +24,18 @@ public:
     bool waitFor(std::chrono::nanoseconds timeout) override {
         assert(locked);
         waits.push_back(timeout);
-        return onWait && onWait();
+        locked = false;
+        const bool woken = onWait && onWait();
+        locked = true;
+        return woken;
     }
     void signal() override {
         assert(locked);
         ++signals;
     }
 
-    // Runs under the lock; false is the deadline.
+    // Runs without the lock, as others do while somebody waits; false is the
+    // deadline.
     std::function<bool()> onWait;
     std::vector<std::chrono::nanoseconds> waits;
     int signals = 0;

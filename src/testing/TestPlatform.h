@@ -6,11 +6,13 @@
 #include "testing/FakeCondition.h"
 #include "testing/FakeDevice.h"
 #include "testing/FakeEventServices.h"
+#include "testing/FakeEventTrace.h"
 #include "testing/FakeFiles.h"
 #include "testing/FakeHWReport.h"
 #include "testing/FakeIncidentReporter.h"
 #include "testing/FakeOperations.h"
 #include "testing/FakeRelayReporting.h"
+#include "testing/FakeResultsFiles.h"
 #include "testing/FakeTraceMarks.h"
 #include "testing/ManualClock.h"
 #include "testing/ManualQueues.h"
@@ -37,6 +39,8 @@ public:
                                   .log = &log,
                                   .files = &files,
                                   .traceMarks = &traceMarks,
+                                  .eventTrace = &eventTrace,
+                                  .resultsFiles = &resultsFiles,
                                   .preferences = &preferences,
                                   .featureFlags = &featureFlags,
                                   .deviceProperties = &deviceProperties,
@@ -63,6 +67,8 @@ public:
     ManualQueues queues{clock};
     FakeConditionFactory conditions;
     FakeFiles files;
+    FakeEventTrace eventTrace;
+    FakeResultsFiles resultsFiles;
     FakePreferences preferences;
     FakeFeatureFlags featureFlags;
     FakeDeviceProperties deviceProperties;
