@@ -54,7 +54,7 @@ class Requests(DaemonTest):
         for reporter_id in range(1, 8):
             client.session(reporter_id)
             client.result("sendMessage", {"id": reporter_id}, 4, 1, [reporter_id])
-        uploaded = self.rows("SELECT session_id FROM upload_session ORDER BY id")
+        uploaded = self.rows("SELECT session_id FROM upload_session ORDER BY session_id")
         self.assertEqual([row[0] for row in uploaded], [1, 2, 3, 4, 5])
 
     def test_a_destroy_leaves_the_count_too_high(self):

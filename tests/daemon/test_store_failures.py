@@ -92,7 +92,7 @@ class NotOpened(unittest.TestCase):
         client.session(1)
         client.result("sendMessage", {"a": 1}, 4, 1, [1])
         self.assertIs(client.result("admin.flush"), True)
-        self.assertIn("no backends found", daemon.log())
+        daemon.wait_for(lambda: "no backends found" in daemon.log())
         self.assertEqual(daemon.rows("SELECT name FROM sqlite_master"), [("theirs",)])
 
     def test_a_damaged_file_is_set_aside(self):
