@@ -108,6 +108,8 @@ LinuxPlatform::LinuxPlatform(Directories directories, platform::TraceMarks& trac
             [this](const Dictionary& signature, std::string_view report, platform::WallTime) {
                 (void)store_->addIncident(signature, report);
             }});
+    hwReport_ = std::make_unique<LinuxHWReport>(clock_, configuration_.settings()->driverChannels,
+                                                LinuxHWReport::Options());
     queues_ = std::make_unique<Queues>(context_, pressure_);
     applySettings(*configuration_.settings());
 
@@ -128,6 +130,7 @@ LinuxPlatform::LinuxPlatform(Directories directories, platform::TraceMarks& trac
     platform_.metrics = metrics_.get();
     platform_.incidentReporter = incidents_.get();
     platform_.operations = this;
+    platform_.hwReport = hwReport_.get();
 }
 
 LinuxPlatform::~LinuxPlatform() {

@@ -20,6 +20,7 @@
 #include "linux/IncidentFolder.h"
 #include "linux/LinuxFacts.h"
 #include "linux/LinuxFiles.h"
+#include "linux/LinuxHWReport.h"
 #include "linux/LogWriter.h"
 #include "linux/NotificationCenter.h"
 #include "linux/Pressure.h"
@@ -86,6 +87,7 @@ private:
     std::unique_ptr<StoreEnergyLedger> energyLedger_;
     std::unique_ptr<StoreMetricService> metrics_;
     std::unique_ptr<IncidentFolder> incidents_;
+    std::unique_ptr<LinuxHWReport> hwReport_;
     std::unique_ptr<Queues> queues_;
     std::unique_ptr<ConfigurationWatch> configurationWatch_;
     std::unique_ptr<SocketListener> listener_;

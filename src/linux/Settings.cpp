@@ -25,13 +25,18 @@ constexpr std::pair<std::string_view, ChannelFormat> kFormats[] = {
 
 template <class T> using Names = std::span<const std::pair<std::string_view, T>>;
 
-// What the sources that have one format only give.
+// The kinds of source that do not give counters, with what they give.
+constexpr std::pair<std::string_view, ChannelFormat> kUsualFormats[] = {
+    {"cpuidle:", ChannelFormat::State},         {"runtime_pm:", ChannelFormat::State},
+    {"cpufreq:", ChannelFormat::State},         {"devfreq:", ChannelFormat::State},
+    {"alsa_states:", ChannelFormat::State},     {"histogram:", ChannelFormat::Histogram},
+    {"tracefs_hist:", ChannelFormat::Histogram}};
+
 ChannelFormat usualFormat(std::string_view source) {
-    if (source.starts_with("histogram:")) {
-        return ChannelFormat::Histogram;
-    }
-    const bool isState = source.starts_with("cpuidle:") || source.starts_with("runtime_pm:");
-    return isState ? ChannelFormat::State : ChannelFormat::Simple;
+    const auto* const at =
+        std::find_if(std::begin(kUsualFormats), std::end(kUsualFormats),
+                     [&](const auto& usual) { return source.starts_with(usual.first); });
+    return at != std::end(kUsualFormats) ? at->second : ChannelFormat::Simple;
 }
 
 bool isSource(std::string_view text) {

@@ -161,6 +161,11 @@ TEST(SettingsTest, AChannelWithoutFormatHasTheUsualOneOfItsSource) {
     EXPECT_EQ(formatOf("field:/x:1:2"), ChannelFormat::Simple);
     EXPECT_EQ(formatOf("cpuidle:/x"), ChannelFormat::State);
     EXPECT_EQ(formatOf("runtime_pm:/x"), ChannelFormat::State);
+    EXPECT_EQ(formatOf("cpufreq:/x"), ChannelFormat::State);
+    EXPECT_EQ(formatOf("devfreq:/x"), ChannelFormat::State);
+    EXPECT_EQ(formatOf("alsa_states:/x"), ChannelFormat::State);
+    EXPECT_EQ(formatOf("alsa_frames:/x"), ChannelFormat::Simple);
+    EXPECT_EQ(formatOf("tracefs_hist:/x"), ChannelFormat::Histogram);
     EXPECT_EQ(formatOf("histogram:/x"), ChannelFormat::Histogram);
 }
 

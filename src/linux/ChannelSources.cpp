@@ -1,0 +1,364 @@
+#include "linux/ChannelSources.h"
+
+#include <algorithm>
+#include <charconv>
+#include <fmt/format.h>
+
+#include "linux/SmallFile.h"
+
+namespace halyard::linux_ {
+namespace {
+
+constexpr std::size_t kMaxInterruptLines = 64;
+
+// One for each thread: nothing of the text outlives the read of a source.
+std::string& scratch() {
+    static thread_local std::string text;
+    return text;
+}
+
+Reading missing(const SampledFile& file, std::errc error) {
+    Reading reading;
+    reading.status = meansAbsent(error) ? ReadStatus::Absent : ReadStatus::Failed;
+    reading.fault =
+        fmt::format("{}: {}", file.path().native(), std::make_error_code(error).message());
+    return reading;
+}
+
+Reading malformed(const SampledFile& file) {
+    Reading reading;
+    reading.fault = fmt::format("{}: not in the expected format", file.path().native());
+    return reading;
+}
+
+Reading simple(std::uint64_t bits) {
+    Reading reading;
+    reading.status = ReadStatus::Read;
+    reading.numbers.push_back(bits);
+    return reading;
+}
+
+// Keeps the shape that there is, if it still fits.
+void settle(ReadingShapeRef& shape, ReadingShape now) {
+    if (shape == nullptr || *shape != now) {
+        shape = std::make_shared<const ReadingShape>(std::move(now));
+    }
+}
+
+// Appends the file's one number to the reading; false when there is none, and
+// then the reading says why.
+bool appendNumber(SampledFile& file, Reading& reading) {
+    std::string& text = scratch();
+    if (const std::errc error = file.read(text); error != std::errc{}) {
+        reading = missing(file, error);
+        return false;
+    }
+    const auto value = parseInteger(text);
+    if (!value || *value < 0) {
+        reading = malformed(file);
+        return false;
+    }
+    reading.numbers.push_back(static_cast<std::uint64_t>(*value));
+    return true;
+}
+
+} // namespace
+
+Reading CounterSource::read(platform::SteadyTime) {
+    std::string& text = scratch();
+    if (const std::errc error = file_.read(text); error != std::errc{}) {
+        return missing(file_, error);
+    }
+    const auto value = parse_(text);
+    return value ? simple(static_cast<std::uint64_t>(*value)) : malformed(file_);
+}
+
+namespace {
+
+// "snd_hda,nvme" holds two actions.
+bool hasAction(std::string_view actions, std::string_view action) {
+    while (!actions.empty()) {
+        const std::size_t comma = std::min(actions.find_first_of(",\n"), actions.size());
+        if (actions.substr(0, comma) == action) {
+            return true;
+        }
+        actions.remove_prefix(std::min(comma + 1, actions.size()));
+    }
+    return false;
+}
+
+} // namespace
+
+InterruptSource::InterruptSource(const std::string& action, SourceRoot& root) {
+    std::error_code ignored;
+    std::filesystem::directory_iterator lines(root.resolve("/sys/kernel/irq"), ignored);
+    for (; lines != std::filesystem::directory_iterator(); lines.increment(ignored)) {
+        const auto actions = readSmallFile(lines->path() / "actions", kMaxSampledFile);
+        const auto* const text = std::get_if<std::string>(&actions);
+        if (text != nullptr && hasAction(*text, action) && counts_.size() < kMaxInterruptLines) {
+            counts_.emplace_back(lines->path() / "per_cpu_count", root.descriptors);
+        }
+    }
+}
+
+Reading InterruptSource::read(platform::SteadyTime) {
+    if (counts_.empty()) {
+        Reading reading;
+        reading.status = ReadStatus::Absent;
+        reading.fault = "no interrupt has this action";
+        return reading;
+    }
+    std::uint64_t sum = 0;
+    std::string& text = scratch();
+    for (SampledFile& file : counts_) {
+        if (const std::errc error = file.read(text); error != std::errc{}) {
+            return missing(file, error);
+        }
+        const auto count = parsePerCpuCount(text);
+        if (!count) {
+            return malformed(file);
+        }
+        sum += *count;
+    }
+    return simple(sum);
+}
+
+namespace {
+
+// The directories "state0", "state1", ... in that order.
+std::vector<std::filesystem::path> stateDirectories(const std::filesystem::path& parent) {
+    constexpr std::string_view kPrefix = "state";
+    std::vector<std::pair<unsigned, std::filesystem::path>> found;
+    std::error_code ignored;
+    std::filesystem::directory_iterator entries(parent, ignored);
+    for (; entries != std::filesystem::directory_iterator(); entries.increment(ignored)) {
+        const std::string name = entries->path().filename().native();
+        unsigned number = 0;
+        const char* const end = name.data() + name.size();
+        if (name.starts_with(kPrefix) &&
+            std::from_chars(name.data() + kPrefix.size(), end, number).ptr == end &&
+            found.size() < kMaxSourceStates) {
+            found.emplace_back(number, entries->path());
+        }
+    }
+    std::sort(found.begin(), found.end());
+    std::vector<std::filesystem::path> paths;
+    for (auto& [number, path] : found) {
+        paths.push_back(std::move(path));
+    }
+    return paths;
+}
+
+std::string firstLine(const std::filesystem::path& path, std::string otherwise) {
+    const auto read = readSmallFile(path, kMaxSampledFile);
+    const auto* const text = std::get_if<std::string>(&read);
+    return text != nullptr ? text->substr(0, text->find('\n')) : std::move(otherwise);
+}
+
+} // namespace
+
+bool CpuIdleSource::findStates() {
+    ReadingShape shape;
+    for (const auto& state : stateDirectories(directory_)) {
+        shape.states.push_back(firstLine(state / "name", state.filename().native()));
+        states_.push_back({SampledFile(state / "time", root_.descriptors),
+                           SampledFile(state / "usage", root_.descriptors)});
+    }
+    settle(shape_, std::move(shape));
+    return !states_.empty();
+}
+
+Reading CpuIdleSource::read(platform::SteadyTime) {
+    Reading reading;
+    if (states_.empty() && !findStates()) {
+        reading.status = ReadStatus::Absent;
+        reading.fault = fmt::format("{}: no idle states", directory_.native());
+        return reading;
+    }
+    for (State& state : states_) {
+        if (!appendNumber(state.time, reading) || !appendNumber(state.usage, reading)) {
+            states_.clear(); // Others may be there next time.
+            return reading;
+        }
+    }
+    reading.status = ReadStatus::Read;
+    reading.shape = shape_;
+    return reading;
+}
+
+RuntimePowerSource::RuntimePowerSource(const std::filesystem::path& directory, SourceRoot& root)
+    : active_((directory.filename() == "power" ? directory : directory / "power") /
+                  "runtime_active_time",
+              root.descriptors),
+      suspended_(active_.path().parent_path() / "runtime_suspended_time", root.descriptors),
+      shape_(std::make_shared<const ReadingShape>(ReadingShape{{"active", "suspended"}, {}})) {}
+
+Reading RuntimePowerSource::read(platform::SteadyTime) {
+    Reading reading;
+    for (SampledFile* file : {&active_, &suspended_}) {
+        if (!appendNumber(*file, reading)) {
+            return reading;
+        }
+        reading.numbers.push_back(0);
+    }
+    reading.status = ReadStatus::Read;
+    reading.shape = shape_;
+    return reading;
+}
+
+// The table of transitions is left out when it is too large for its file, and by
+// kernels that keep none.
+void StateTableSource::addTransitions(SourceStates& states) {
+    std::string& text = scratch();
+    if (!transitions_ || transitions_->read(text) != std::errc{}) {
+        return;
+    }
+    const auto table = parseTransitionTable(text);
+    if (!table) {
+        return;
+    }
+    for (SourceState& state : states) {
+        for (const SourceState& row : *table) {
+            if (row.name == state.name) {
+                state.transitions = row.transitions;
+            }
+        }
+    }
+}
+
+Reading StateTableSource::read(platform::SteadyTime) {
+    std::string& text = scratch();
+    if (const std::errc error = file_.read(text); error != std::errc{}) {
+        return missing(file_, error);
+    }
+    auto states = parse_(text);
+    if (!states) {
+        return malformed(file_);
+    }
+    addTransitions(*states);
+    Reading reading;
+    ReadingShape shape;
+    for (SourceState& state : *states) {
+        reading.numbers.push_back(state.residency);
+        reading.numbers.push_back(state.transitions);
+        shape.states.push_back(std::move(state.name));
+    }
+    settle(shape_, std::move(shape));
+    reading.shape = shape_;
+    reading.status = ReadStatus::Read;
+    return reading;
+}
+
+Reading BucketSource::read(platform::SteadyTime) {
+    std::string& text = scratch();
+    if (const std::errc error = file_.read(text); error != std::errc{}) {
+        return missing(file_, error);
+    }
+    const auto buckets = parse_(text);
+    if (!buckets) {
+        return malformed(file_);
+    }
+    Reading reading;
+    ReadingShape shape;
+    for (const SourceBucket& bucket : *buckets) {
+        reading.numbers.push_back(bucket.hits);
+        shape.bounds.emplace_back(bucket.lower, bucket.upper);
+    }
+    settle(shape_, std::move(shape));
+    reading.shape = shape_;
+    reading.status = ReadStatus::Read;
+    return reading;
+}
+
+namespace {
+
+constexpr const char* kPcmStates[] = {"CLOSED", "OPEN",     "SETUP",  "PREPARED",  "RUNNING",
+                                      "XRUN",   "DRAINING", "PAUSED", "SUSPENDED", "DISCONNECTED"};
+
+ReadingShapeRef pcmShape() {
+    static const auto shape = std::make_shared<const ReadingShape>(
+        ReadingShape{{std::begin(kPcmStates), std::end(kPcmStates)}, {}});
+    return shape;
+}
+
+// Where a state's residency stands in a reading; none for one that ALSA does not
+// have.
+std::optional<std::size_t> placeOf(const std::string& state) {
+    const auto* const at = std::find(std::begin(kPcmStates), std::end(kPcmStates), state);
+    return at != std::end(kPcmStates)
+               ? std::optional(2 * static_cast<std::size_t>(at - std::begin(kPcmStates)))
+               : std::nullopt;
+}
+
+std::uint64_t microseconds(std::chrono::nanoseconds time) {
+    return static_cast<std::uint64_t>(
+        std::chrono::duration_cast<std::chrono::microseconds>(time).count());
+}
+
+} // namespace
+
+PcmSource::PcmSource(SampledFile status, What what)
+    : file_(std::move(status)), what_(what), shape_(pcmShape()),
+      residencies_(2 * std::size(kPcmStates), 0) {}
+
+void PcmSource::addResidency(const PcmStatus& status, bool restarted, platform::SteadyTime now) {
+    const auto before = placeOf(last_->state);
+    const auto after = placeOf(status.state);
+    const bool entered = restarted || status.state != last_->state;
+    std::chrono::nanoseconds elapsed = std::max(now - lastTime_, std::chrono::nanoseconds(0));
+    if (after && entered) {
+        ++residencies_[*after + 1];
+        if (status.state == "RUNNING" && status.triggered && status.stamped) {
+            const auto running = std::clamp(*status.stamped - *status.triggered,
+                                            std::chrono::nanoseconds(0), elapsed);
+            residencies_[*after] += microseconds(running);
+            elapsed -= running;
+        }
+    }
+    if (before) {
+        residencies_[*before] += microseconds(elapsed);
+    }
+}
+
+void PcmSource::advance(const PcmStatus& status, platform::SteadyTime now) {
+    const bool restarted = status.state == "RUNNING" && status.owner == last_->owner &&
+                           last_->triggered && status.triggered != last_->triggered;
+    restarts_ += restarted ? 1 : 0;
+    xruns_ += status.state == "XRUN" && last_->state != "XRUN" ? 1 : 0;
+    addResidency(status, restarted, now);
+}
+
+Reading PcmSource::read(platform::SteadyTime now) {
+    std::string& text = scratch();
+    if (const std::errc error = file_.read(text); error != std::errc{}) {
+        last_.reset();
+        return missing(file_, error);
+    }
+    auto status = parsePcmStatus(text);
+    if (!status) {
+        last_.reset();
+        return malformed(file_);
+    }
+    if (last_) {
+        advance(*status, now);
+    }
+    last_ = std::move(*status);
+    lastTime_ = now;
+    switch (what_) {
+    case What::Frames:
+        return simple(static_cast<std::uint64_t>(last_->frames.value_or(0)));
+    case What::Xruns:
+        return simple(xruns_);
+    case What::Restarts:
+        return simple(restarts_);
+    case What::States:
+        break;
+    }
+    Reading reading;
+    reading.status = ReadStatus::Read;
+    reading.shape = shape_;
+    reading.numbers = residencies_;
+    return reading;
+}
+
+} // namespace halyard::linux_

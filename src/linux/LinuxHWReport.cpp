@@ -1,0 +1,197 @@
+#include "linux/LinuxHWReport.h"
+
+#include <algorithm>
+#include <fmt/format.h>
+#include <tuple>
+
+#include "linux/BuiltInChannels.h"
+#include "platform/Log.h"
+
+namespace halyard::linux_ {
+namespace {
+
+const platform::HWReportError kInvalid{static_cast<std::int64_t>(std::errc::invalid_argument)};
+
+constexpr const char* kFormatNames[] = {"simple", "state", "histogram"};
+
+const char* nameOf(ChannelFormat format) {
+    return kFormatNames[static_cast<std::size_t>(format)];
+}
+
+auto identity(const DriverChannel& names) {
+    return std::tie(names.group, names.subgroup, names.driver, names.name);
+}
+
+bool isIn(const DriverChannel& names, const std::optional<std::string>& group,
+          const std::optional<std::string>& subGroup) {
+    return (!group || names.group == group) && (!subGroup || names.subgroup == subGroup);
+}
+
+std::string describe(const DriverChannel& names) {
+    return fmt::format("{}-{} \"{}\"", names.group.value_or("(null)"),
+                       names.subgroup.value_or("(null)"), names.name);
+}
+
+// A source keeps the root it resolves its paths in.
+std::shared_ptr<ChannelSource> withRoot(std::unique_ptr<ChannelSource> source,
+                                        const std::shared_ptr<SourceRoot>& root) {
+    struct Both {
+        std::shared_ptr<SourceRoot> root;
+        std::unique_ptr<ChannelSource> source;
+    };
+    const auto both = std::make_shared<Both>(Both{root, std::move(source)});
+    return {both, both->source.get()};
+}
+
+} // namespace
+
+LinuxHWReport::LinuxHWReport(const platform::Clock& clock,
+                             const std::vector<DriverChannel>& configured, Options options)
+    : clock_(clock), guarded_(options.patience) {
+    root_->path = std::move(options.root);
+    for (const DriverChannel& channel : builtInChannels(*root_)) {
+        add(channel, false);
+    }
+    for (const DriverChannel& channel : configured) {
+        add(channel, true);
+    }
+}
+
+void LinuxHWReport::add(const DriverChannel& names, bool configured) {
+    auto made = makeChannelSource(names.source, *root_);
+    auto* const source = std::get_if<std::unique_ptr<ChannelSource>>(&made);
+    std::string fault;
+    if (source == nullptr) {
+        fault = std::get<std::string>(made);
+    } else if ((*source)->format() != names.format) {
+        fault = fmt::format("gives the format {}, not {}", nameOf((*source)->format()),
+                            nameOf(names.format));
+    }
+    if (!fault.empty()) {
+        HY_LOG_ERROR(HYReportingPlatformCategory,
+                     "driver channel {} is left out: its source \"{}\" {}", describe(names),
+                     names.source, fault);
+        leftOut_.push_back(names);
+        return;
+    }
+    Channel channel;
+    channel.facts =
+        std::make_shared<const ChannelFacts>(ChannelFacts{names, (*source)->residencyPerSecond()});
+    channel.source = withRoot(std::move(*source), root_);
+    channel.configured = configured;
+    const auto same = std::find_if(channels_.begin(), channels_.end(), [&](const Channel& each) {
+        return identity(each.facts->names) == identity(names);
+    });
+    if (same != channels_.end()) {
+        *same = std::move(channel);
+    } else {
+        channels_.push_back(std::move(channel));
+    }
+}
+
+platform::HWReportResult<platform::HWReportChannelsRef>
+LinuxHWReport::copyChannelsInGroup(const std::optional<std::string>& group,
+                                   const std::optional<std::string>& subGroup) {
+    auto list = std::make_shared<ChannelList>();
+    for (std::size_t place = 0; place < channels_.size(); ++place) {
+        if (isIn(channels_[place].facts->names, group, subGroup)) {
+            list->channels.push_back(channels_[place].facts);
+            list->places.push_back(place);
+        }
+    }
+    const bool complete =
+        std::none_of(leftOut_.begin(), leftOut_.end(),
+                     [&](const DriverChannel& names) { return isIn(names, group, subGroup); });
+    return {list, complete ? std::nullopt : std::optional(kInvalid)};
+}
+
+std::int64_t LinuxHWReport::getChannelCount(const platform::HWReportChannels& channels) const {
+    const auto* const list = dynamic_cast<const ChannelList*>(&channels);
+    return list != nullptr ? static_cast<std::int64_t>(list->channels.size()) : 0;
+}
+
+platform::HWReportSubscribed
+LinuxHWReport::createSubscription(const platform::HWReportChannels& channels) {
+    const auto* const list = dynamic_cast<const ChannelList*>(&channels);
+    if (list == nullptr) {
+        return {};
+    }
+    Subscription& subscription = subscriptions_.emplace_back();
+    subscription.list = std::make_shared<ChannelList>(*list);
+    return {&subscription, subscription.list};
+}
+
+// In the order in which they stand in the list.
+std::vector<Reading> LinuxHWReport::readConfigured(const ChannelList& list,
+                                                   platform::SteadyTime now) {
+    std::vector<std::shared_ptr<ChannelSource>> sources;
+    for (const std::size_t place : list.places) {
+        if (channels_[place].configured) {
+            sources.push_back(channels_[place].source);
+        }
+    }
+    return sources.empty() ? std::vector<Reading>() : guarded_.read(sources, now);
+}
+
+void LinuxHWReport::noteFailure(Channel& channel, const Reading& reading) {
+    const bool failing = reading.status != ReadStatus::Read;
+    if (failing == channel.failing) {
+        return;
+    }
+    channel.failing = failing;
+    if (failing) {
+        HY_LOG_DEFAULT(HYReportingPlatformCategory, "driver channel {} cannot be read: {}",
+                       describe(channel.facts->names), reading.fault);
+    } else {
+        HY_LOG_DEFAULT(HYReportingPlatformCategory, "driver channel {} can be read again",
+                       describe(channel.facts->names));
+    }
+}
+
+platform::HWReportResult<platform::HWReportSamplesRef>
+LinuxHWReport::createSamples(platform::HWReportSubscription* subscription,
+                             const platform::HWReportChannels* channels) {
+    const auto* const own = dynamic_cast<const Subscription*>(subscription);
+    if (own == nullptr || own->list.get() != channels) {
+        return {nullptr, kInvalid};
+    }
+    const platform::SteadyTime now = clock_.steadyTime();
+    const auto configured = readConfigured(*own->list, now);
+    auto samples = std::make_shared<SampleSet>(own->list, now);
+    std::size_t next = 0;
+    for (const std::size_t place : own->list->places) {
+        Channel& channel = channels_[place];
+        if (channel.configured) {
+            noteFailure(channel, configured[next]);
+            samples->add(configured[next++]);
+        } else {
+            samples->add(channel.source->read(now));
+        }
+    }
+    return {samples, std::nullopt};
+}
+
+platform::HWReportResult<platform::HWReportSamplesRef>
+LinuxHWReport::createSamplesDelta(const platform::HWReportSamples* previous,
+                                  const platform::HWReportSamples& current) {
+    const auto* const after = dynamic_cast<const SampleSet*>(&current);
+    const auto* const before = dynamic_cast<const SampleSet*>(previous);
+    if (after == nullptr ||
+        (previous != nullptr && (before == nullptr || before->list() != after->list()))) {
+        return {nullptr, kInvalid};
+    }
+    if (before == nullptr) {
+        return {std::make_shared<SampleSet>(after->list(), clock_.steadyTime()), std::nullopt};
+    }
+    return {after->since(*before), std::nullopt};
+}
+
+void LinuxHWReport::iterate(
+    const platform::HWReportSamples& samples,
+    const std::function<int(const platform::HWReportChannel&)>& callback) const {
+    if (const auto* const set = dynamic_cast<const SampleSet*>(&samples)) {
+        set->iterate(callback);
+    }
+}
+
+} // namespace halyard::linux_

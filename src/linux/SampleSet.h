@@ -1,0 +1,73 @@
+// What the channels of a subscription said at one moment, or how that changed
+// between two, and the rules of the change.
+//
+// Sessions keep sets for as long as they run, so a set is two flat arrays; what
+// its numbers stand for is shared with the sources and other sets. Unchanging;
+// any thread.
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "linux/ChannelSource.h"
+#include "linux/Settings.h"
+#include "platform/HWReport.h"
+
+namespace halyard::linux_ {
+
+// What is known of a channel beside its numbers.
+struct ChannelFacts {
+    DriverChannel names;
+    std::uint64_t residencyPerSecond = 1;
+};
+using ChannelFactsRef = std::shared_ptr<const ChannelFacts>;
+
+// The channels of a listing, or of a subscription.
+struct ChannelList final : platform::HWReportChannels {
+    std::vector<ChannelFactsRef> channels;
+    std::vector<std::size_t> places; // of the same channels in the library
+};
+using ChannelListRef = std::shared_ptr<const ChannelList>;
+
+class SampleSet final : public platform::HWReportSamples {
+public:
+    SampleSet(ChannelListRef list, platform::SteadyTime time)
+        : list_(std::move(list)), time_(time) {
+        entries_.reserve(list_->channels.size());
+    }
+
+    // The next channel's. Requires fewer calls than channels.
+    void add(const Reading& reading);
+    // The change from `before` to this set. Requires sets of one subscription.
+    std::shared_ptr<const SampleSet> since(const SampleSet& before) const;
+    // Of a channel that could be read; the caller stops it by other than 0.
+    void iterate(const std::function<int(const platform::HWReportChannel&)>& callback) const;
+
+    const ChannelListRef& list() const { return list_; }
+    // In bytes, contents included.
+    std::size_t footprint() const;
+
+private:
+    friend class SampledChannel;
+    struct Entry {
+        ReadingShapeRef shape;
+        std::uint32_t first = 0; // of its numbers
+        std::uint32_t count = 0;
+        ReadStatus status = ReadStatus::Failed;
+    };
+
+    Reading change(std::size_t index, const SampleSet& before) const;
+    const std::uint64_t* numbers(const Entry& entry) const { return numbers_.data() + entry.first; }
+
+    ChannelListRef list_;
+    platform::SteadyTime time_;
+    std::optional<std::chrono::nanoseconds> elapsed_; // of a change
+    std::vector<Entry> entries_;
+    std::vector<std::uint64_t> numbers_;
+};
+
+} // namespace halyard::linux_

@@ -1,0 +1,126 @@
+#include "linux/SampledFile.h"
+
+#include <cerrno>
+#include <fcntl.h>
+#include <linux/magic.h>
+#include <sys/stat.h>
+#include <sys/vfs.h>
+#include <unistd.h>
+#include <utility>
+
+namespace halyard::linux_ {
+namespace {
+
+constexpr std::size_t kFirstRead = 4096;
+
+std::errc lastError() {
+    return static_cast<std::errc>(errno);
+}
+
+} // namespace
+
+SampledFile::SampledFile(std::filesystem::path path, DescriptorBudget& budget)
+    : path_(std::move(path)), budget_(&budget) {}
+
+SampledFile::SampledFile(SampledFile&& other) noexcept
+    : path_(std::move(other.path_)), budget_(other.budget_),
+      descriptor_(std::exchange(other.descriptor_, -1)), ofKernel_(other.ofKernel_),
+      oneRead_(other.oneRead_) {}
+
+SampledFile::~SampledFile() {
+    close();
+}
+
+void SampledFile::close() {
+    if (descriptor_ >= 0) {
+        ::close(descriptor_);
+        descriptor_ = -1;
+        budget_->fetch_add(1);
+    }
+}
+
+std::errc SampledFile::open() {
+    const int descriptor = ::open(path_.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
+    if (descriptor < 0) {
+        return lastError();
+    }
+    struct stat facts {};
+    if (::fstat(descriptor, &facts) != 0 || !S_ISREG(facts.st_mode)) {
+        ::close(descriptor);
+        return S_ISDIR(facts.st_mode) ? std::errc::is_a_directory : std::errc::invalid_argument;
+    }
+    struct statfs system {};
+    if (::fstatfs(descriptor, &system) == 0) {
+        const auto type = static_cast<unsigned long>(system.f_type);
+        oneRead_ = type == SYSFS_MAGIC;
+        ofKernel_ =
+            oneRead_ || type == PROC_SUPER_MAGIC || type == TRACEFS_MAGIC || type == DEBUGFS_MAGIC;
+    }
+    descriptor_ = descriptor;
+    budget_->fetch_sub(1);
+    return std::errc{};
+}
+
+// Scripts write a new file and move it over the old one, which stays readable
+// through us, unchanged for ever.
+bool SampledFile::isStillTheFile() const {
+    if (ofKernel_) {
+        return true;
+    }
+    struct stat opened {};
+    struct stat named {};
+    return ::fstat(descriptor_, &opened) == 0 && ::stat(path_.c_str(), &named) == 0 &&
+           opened.st_dev == named.st_dev && opened.st_ino == named.st_ino;
+}
+
+std::errc SampledFile::readOpen(std::string& text) const {
+    text.resize(kFirstRead);
+    std::size_t have = 0;
+    for (;;) {
+        if (have == text.size()) {
+            if (have > kMaxSampledFile) {
+                return std::errc::file_too_large;
+            }
+            text.resize(have * 4);
+        }
+        const ssize_t got =
+            ::pread(descriptor_, text.data() + have, text.size() - have, static_cast<off_t>(have));
+        if (got < 0 && errno == EINTR) {
+            continue;
+        }
+        if (got < 0) {
+            return lastError();
+        }
+        have += static_cast<std::size_t>(got);
+        if (got == 0 || (oneRead_ && have < text.size())) {
+            break;
+        }
+    }
+    text.resize(have);
+    return have > kMaxSampledFile ? std::errc::file_too_large : std::errc{};
+}
+
+std::errc SampledFile::read(std::string& text) {
+    text.clear();
+    if (descriptor_ >= 0) {
+        if (isStillTheFile() && readOpen(text) == std::errc{}) {
+            return std::errc{};
+        }
+        close();
+    }
+    std::errc error = open();
+    if (error != std::errc{}) {
+        text.clear();
+        return error;
+    }
+    error = readOpen(text);
+    if (error != std::errc{} || budget_->load() < 0) {
+        close();
+    }
+    if (error != std::errc{}) {
+        text.clear();
+    }
+    return error;
+}
+
+} // namespace halyard::linux_

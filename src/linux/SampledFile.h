@@ -1,0 +1,56 @@
+// A small text file that is read again and again: it stays open between reads,
+// because opening costs three times what reading does.
+//
+// Never waits for a file that is none (a pipe, a device), reads at most
+// kMaxSampledFile bytes, and finds the file again when it was replaced or when
+// its device has gone and come back. A driver whose read blocks does block here:
+// see GuardedReader.
+//
+// Not thread-safe.
+#pragma once
+
+#include <atomic>
+#include <cstddef>
+#include <filesystem>
+#include <string>
+#include <system_error>
+
+namespace halyard::linux_ {
+
+inline constexpr std::size_t kMaxSampledFile = 64 * 1024;
+
+// How many more files may stay open; the rest is opened for each read.
+using DescriptorBudget = std::atomic<int>;
+
+class SampledFile {
+public:
+    // Borrows the budget. Opens nothing yet.
+    SampledFile(std::filesystem::path path, DescriptorBudget& budget);
+    SampledFile(SampledFile&& other) noexcept;
+    SampledFile& operator=(SampledFile&&) = delete;
+    ~SampledFile();
+
+    // The whole of the file as it is now, in `text`; or why not.
+    [[nodiscard]] std::errc read(std::string& text);
+    const std::filesystem::path& path() const { return path_; }
+
+private:
+    [[nodiscard]] std::errc open();
+    void close();
+    bool isStillTheFile() const;
+    [[nodiscard]] std::errc readOpen(std::string& text) const;
+
+    std::filesystem::path path_;
+    DescriptorBudget* budget_;
+    int descriptor_ = -1;
+    bool ofKernel_ = false; // Its path leads to it for as long as it is there,
+    bool oneRead_ = false;  // and one read yields all of it.
+};
+
+// Nothing is there, or no longer: the device is missing, not broken.
+inline bool meansAbsent(std::errc error) {
+    return error == std::errc::no_such_file_or_directory || error == std::errc::no_such_device ||
+           error == std::errc::no_such_device_or_address || error == std::errc::not_a_directory;
+}
+
+} // namespace halyard::linux_
