@@ -1,0 +1,208 @@
+#include "linux/TracefsEventTrace.h"
+
+#include <atomic>
+#include <cerrno>
+#include <chrono>
+#include <condition_variable>
+#include <mutex>
+#include <system_error>
+#include <thread>
+#include <unistd.h>
+#include <utility>
+
+#include "linux/MarkLibraries.h"
+#include "linux/TraceDelivery.h"
+#include "linux/TraceInstance.h"
+#include "linux/TraceReader.h"
+#include "platform/Log.h"
+
+namespace halyard::linux_ {
+namespace {
+
+constexpr std::chrono::milliseconds kDrainPeriod{10};
+constexpr int kDrainsPerSearch = 50; // for libraries of clients that are new
+
+class TracefsSession final : public platform::EventTraceSession {
+public:
+    explicit TracefsSession(const TracefsEventTrace::Options& options)
+        : options_(options), instance_(options_.tracefs), reader_(instance_, options_.tracefs) {}
+
+    ~TracefsSession() override {
+        delivery_->close();
+        requestStop();
+        if (drainer_.joinable()) {
+            drainer_.join();
+        }
+    }
+
+    void setCompletionHandler(std::function<void()> handler) override {
+        delivery_->setCompletion(std::move(handler));
+    }
+    void setWallTimesEnabled(bool enabled) override { reader_.setWallTimes(enabled); }
+    int addEventsRange(std::uint32_t first, std::uint32_t last, EventHandler handler) override {
+        if (first > last) {
+            return EINVAL;
+        }
+        first_ = first;
+        last_ = last;
+        delivery_->setHandler(std::move(handler));
+        return 0;
+    }
+    int start(std::shared_ptr<platform::SerialQueue> queue) override;
+    void end() override;
+
+    // The clock counts nanoseconds.
+    std::uint64_t nanoseconds(std::uint64_t timestamp) const override { return timestamp; }
+    std::uint64_t eventsLost() const override { return lost_.load(); }
+    std::string clockName() const override { return "CLOCK_MONOTONIC"; }
+
+private:
+    TraceInstance::Failure open();
+    TraceInstance::Failure probeNewLibraries();
+    void requestStop();
+    bool waitForStop();
+    void drain();
+    void deliver(std::vector<trace_point> points);
+    void finish();
+
+    const TracefsEventTrace::Options options_;
+    const std::shared_ptr<TraceDelivery> delivery_ = std::make_shared<TraceDelivery>();
+    std::uint32_t first_ = 0;
+    std::uint32_t last_ = UINT32_MAX;
+    TraceInstance instance_;
+    TraceReader reader_; // before its instance goes, its files are closed
+    MarkLibraries libraries_;
+    bool probeFailureLogged_ = false;
+    std::uint64_t delivered_ = 0;
+    std::uint64_t refused_ = 0;
+    std::atomic<std::uint64_t> lost_{0};
+
+    std::mutex stopMutex_;
+    std::condition_variable stopChanged_;
+    bool stopRequested_ = false; // under stopMutex_
+    std::thread drainer_;
+};
+
+TraceInstance::Failure TracefsSession::open() {
+    TraceInstance::Failure failure = instance_.create();
+    if (failure.error == std::errc{}) {
+        failure = probeNewLibraries();
+    }
+    if (failure.error == std::errc{}) {
+        failure = {reader_.open(), "per_cpu/cpu*/trace_pipe_raw"};
+    }
+    return failure.error == std::errc{} ? instance_.record() : failure;
+}
+
+TraceInstance::Failure TracefsSession::probeNewLibraries() {
+    std::vector<std::int32_t> pids{::getpid()};
+    if (options_.clients) {
+        const auto clients = options_.clients();
+        pids.insert(pids.end(), clients.begin(), clients.end());
+    }
+    TraceInstance::Failure first;
+    for (const MarkLibraries::Library& library : libraries_.newLibrariesOf(pids)) {
+        TraceInstance::Failure failure = instance_.probe(library, first_, last_);
+        if (failure.error != std::errc{} && first.error == std::errc{}) {
+            first = std::move(failure);
+        }
+    }
+    return first;
+}
+
+int TracefsSession::start(std::shared_ptr<platform::SerialQueue> queue) {
+    delivery_->setQueue(std::move(queue));
+    TraceInstance::Failure failure = open();
+    if (failure.error == std::errc{}) {
+        try {
+            drainer_ = std::thread([this] { drain(); });
+            return 0;
+        } catch (const std::system_error& error) {
+            failure = {static_cast<std::errc>(error.code().value()), "a thread"};
+        }
+    }
+    instance_.disable();
+    HY_LOG_ERROR(HYReportingTraceCategory,
+                 "no kernel event trace: {}: {}; it needs tracefs at {} and the right to write "
+                 "there (root, or CAP_DAC_OVERRIDE and, for clients of other users, "
+                 "CAP_SYS_PTRACE); see docs/tracing.md",
+                 failure.step, std::make_error_code(failure.error).message(),
+                 options_.tracefs.string());
+    return static_cast<int>(failure.error);
+}
+
+void TracefsSession::end() {
+    if (drainer_.joinable()) {
+        requestStop(); // Its thread completes.
+    } else {
+        delivery_->complete();
+    }
+}
+
+void TracefsSession::requestStop() {
+    const std::lock_guard lock(stopMutex_);
+    stopRequested_ = true;
+    stopChanged_.notify_one();
+}
+
+bool TracefsSession::waitForStop() {
+    std::unique_lock lock(stopMutex_);
+    return stopChanged_.wait_for(lock, kDrainPeriod, [this] { return stopRequested_; });
+}
+
+void TracefsSession::drain() {
+    for (int drains = 1; !waitForStop(); ++drains) {
+        deliver(reader_.read(false));
+        if (drains % kDrainsPerSearch == 0) {
+            const TraceInstance::Failure failure = probeNewLibraries();
+            if (failure.error != std::errc{} && !std::exchange(probeFailureLogged_, true)) {
+                HY_LOG_ERROR(HYReportingTraceCategory, "a client's library is not traced: {}: {}",
+                             failure.step, std::make_error_code(failure.error).message());
+            }
+        }
+    }
+    finish();
+}
+
+void TracefsSession::deliver(std::vector<trace_point> points) {
+    const std::uint64_t room = options_.mostEvents - delivered_;
+    if (points.size() > room) {
+        refused_ += points.size() - room;
+        points.resize(room);
+    }
+    delivered_ += points.size();
+    if (!points.empty()) {
+        delivery_->deliver(std::move(points));
+    }
+}
+
+void TracefsSession::finish() {
+    instance_.disable();
+    // A read may stop before the buffers are empty.
+    for (auto points = reader_.read(true); !points.empty(); points = reader_.read(true)) {
+        deliver(std::move(points));
+    }
+    lost_.store(instance_.eventsLost() + refused_);
+    if (lost_.load() > 0) {
+        HY_LOG_ERROR(HYReportingTraceCategory,
+                     "{} trace events lost: {} by the kernel, {} beyond "
+                     "the {} that are kept",
+                     lost_.load(), lost_.load() - refused_, refused_, options_.mostEvents);
+    }
+    delivery_->complete();
+}
+
+} // namespace
+
+TracefsEventTrace::TracefsEventTrace(Options options) : options_(std::move(options)) {
+    if (const std::size_t removed = removeTraceLeftovers(options_.tracefs); removed > 0) {
+        HY_LOG_DEFAULT(HYReportingTraceCategory,
+                       "removed {} trace instances and probes of daemons that are gone", removed);
+    }
+}
+
+std::unique_ptr<platform::EventTraceSession> TracefsEventTrace::createSession() {
+    return std::make_unique<TracefsSession>(options_);
+}
+
+} // namespace halyard::linux_
