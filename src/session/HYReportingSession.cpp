@@ -11,7 +11,6 @@
 #include "platform/Log.h"
 #include "platform/Platform.h"
 #include "platform/TraceMarks.h"
-#include "session/SessionEvents.h"
 #include "session/SummaryFile.h"
 #include "sinks/HYReportingTallyhubBridge.h"
 
@@ -125,8 +124,11 @@ void HYReportingSession::start() {
         return;
     }
     {
+        const MessageBatch::Options options{
+            .keepsMessages = HYReportingUtilityIsInternalBuild(),
+            .minimumPlaytime = HYReportingUtilityVolumeMinimumPlayingTime(serviceType())};
         const MutexLock lock(batchMutex_);
-        batch_ = std::make_unique<MessageBatch>();
+        batch_ = std::make_unique<MessageBatch>(options);
         started_.store(true);
     }
     mark(kStartMark);
@@ -156,21 +158,19 @@ void HYReportingSession::stop() {
     }
 }
 
-std::vector<Dictionary> HYReportingSession::createVolumeMessages(double minimumPlaytime) const {
+std::vector<Dictionary> HYReportingSession::createVolumeMessages() const {
     const MutexLock lock(batchMutex_);
-    return batch_ != nullptr ? createVolumeEvents(batch_->entries(), minimumPlaytime)
-                             : std::vector<Dictionary>();
+    return batch_ != nullptr ? batch_->volumeEvents() : std::vector<Dictionary>();
 }
 
-std::optional<Dictionary> HYReportingSession::createSummaryEventForSession() const {
+std::optional<Dictionary> HYReportingSession::createSummaryEventForSession() {
     const AudioServiceType type = serviceType();
     const MutexLock lock(batchMutex_);
-    return batch_ != nullptr ? createSummaryEvent(batch_->entries(), type) : std::nullopt;
+    return batch_ != nullptr ? batch_->takeSummary(type) : std::nullopt;
 }
 
 void HYReportingSession::sendVolumeEvents() {
-    const auto events =
-        createVolumeMessages(HYReportingUtilityVolumeMinimumPlayingTime(serviceType()));
+    const auto events = createVolumeMessages();
     if (events.empty()) {
         return;
     }

@@ -79,10 +79,10 @@ public:
                                   AudioEventType type, AudioServiceType serviceType,
                                   const Dictionary& userInfo, SendReply reply);
 
-    // What the batch amounts to; none while the session is not started.
-    std::vector<Dictionary> createVolumeMessages(double minimumPlaytime) const
-        HY_EXCLUDES(batchMutex_);
-    std::optional<Dictionary> createSummaryEventForSession() const HY_EXCLUDES(batchMutex_);
+    // What the accepted messages amount to; none while the session is not
+    // started. The summary is handed over: asked again it starts anew.
+    std::vector<Dictionary> createVolumeMessages() const HY_EXCLUDES(batchMutex_);
+    std::optional<Dictionary> createSummaryEventForSession() HY_EXCLUDES(batchMutex_);
 
     // On internal builds, writes the batch to a file of its own.
     void writeSummaryJson() const HY_EXCLUDES(batchMutex_);
@@ -122,7 +122,8 @@ public:
         std::string identifier;
         Dictionary message;
     };
-    // A copy, empty when the session is not started.
+    // A copy. Empty when the session is not started, and where no file will be
+    // made of it (see MessageBatch).
     std::vector<BatchedMessage> nestedAggregatedPayloadData() const HY_EXCLUDES(batchMutex_);
 
 private:

@@ -55,13 +55,17 @@ bool MessageBatch::addUnlessRedundant(AudioEventCategory category, AudioEventTyp
         kind = kinds_.emplace(std::move(base), Kind{}).first;
     } else {
         const bool isError = category == kAudioEventCategoryError || type == kAudioEventTypeError;
-        if (!isError && equalButForTimeStamps(message, entries_[kind->second.last].message)) {
+        if (!isError && equalButForTimeStamps(message, kind->second.last)) {
             return true;
         }
     }
     kind->second.count += 1;
-    kind->second.last = entries_.size();
-    entries_.push_back({&kind->first, kind->second.count, message});
+    kind->second.last = message;
+    if (keepsMessages_) {
+        entries_.push_back({&kind->first, kind->second.count, message});
+    }
+    volumes_.take(message);
+    summary_.take(message);
     return false;
 }
 

@@ -1,11 +1,16 @@
-// The accepted messages of a running session, in the order of acceptance, and
-// the rule that keeps repeats out.
+// The messages that a running session accepts, and the rule that keeps repeats
+// out.
 //
 // Each message bears the identifier Category_Type_N, N counting from 1 for each
 // "Category_Type". A message is redundant when it equals the message accepted
 // last under the same "Category_Type" in everything but its time stamps. That
-// one is found through an index, so that the cost of a message does not grow
-// with the batch; the identifier's text is built only where somebody reads it.
+// one is kept with its kind, so that the cost of a message does not grow with
+// the batch.
+//
+// What the session derives from its messages when it stops is followed as they
+// come. The messages themselves are kept only where somebody will read them, in
+// the file of internal builds: a session of a million messages is otherwise a
+// few texts.
 //
 // Not thread-safe: the session locks it.
 #pragma once
@@ -18,41 +23,59 @@
 
 #include "common/HYReportingUtility.h"
 #include "common/Value.h"
+#include "session/SessionEvents.h"
 
 namespace halyard {
 
 class MessageBatch {
 public:
+    struct Options {
+        bool keepsMessages = true;
+        double minimumPlaytime = 0.5; // seconds; see VolumeStretches
+    };
     struct Entry {
         const std::string* base; // "Category_Type"; owned by the batch
         std::uint32_t count;
         Dictionary message;
 
+        // Built only where somebody reads it.
         std::string identifier() const { return *base + '_' + std::to_string(count); }
     };
 
-    MessageBatch() = default;
+    MessageBatch() : MessageBatch(Options{}) {}
+    explicit MessageBatch(Options options)
+        : keepsMessages_(options.keepsMessages), volumes_(options.minimumPlaytime) {}
     MessageBatch(const MessageBatch&) = delete; // entries point into kinds_
     MessageBatch& operator=(const MessageBatch&) = delete;
 
-    // Appends the message unless it is redundant. True when it was.
+    // Accepts the message unless it is redundant. True when it was.
     [[nodiscard]] bool addUnlessRedundant(AudioEventCategory category, AudioEventType type,
                                           const Dictionary& message);
 
-    const std::vector<Entry>& entries() const { return entries_; }
-    bool empty() const { return entries_.empty(); }
+    bool empty() const { return summary_.empty(); }
     // 0 for a base identifier that has not been seen.
     std::uint32_t countFor(std::string_view base) const;
+    // In the order of acceptance; empty unless the batch keeps messages.
+    const std::vector<Entry>& entries() const { return entries_; }
+
+    const std::vector<Dictionary>& volumeEvents() const { return volumes_.events(); }
+    // Hands the summary over: asked again it starts anew.
+    std::optional<Dictionary> takeSummary(AudioServiceType serviceType) {
+        return summary_.finish(serviceType);
+    }
 
 private:
     struct Kind {
         std::uint32_t count = 0;
-        std::size_t last = 0; // index of the newest entry of this kind
+        Dictionary last; // the newest accepted message
     };
 
-    std::vector<Entry> entries_;
+    const bool keepsMessages_;
     // Bounded by the names that categories and types can have (a few thousand).
     std::map<std::string, Kind, std::less<>> kinds_;
+    std::vector<Entry> entries_;
+    VolumeStretches volumes_;
+    SummaryTexts summary_;
 };
 
 // Whether two messages are equal but for "processuptime_ms", "systemuptime_sec"

@@ -1,6 +1,7 @@
-#include "session/SessionEvents.h"
+#include "session/MessageBatch.h"
 
 #include <gtest/gtest.h>
+#include <memory>
 
 #include "common/Description.h"
 
@@ -9,22 +10,26 @@ namespace {
 
 class SessionEventsTest : public ::testing::Test {
 protected:
-    void add(const Dictionary& message) {
-        EXPECT_FALSE(
-            batch_.addUnlessRedundant(kAudioEventCategoryVolume, kAudioEventTypeSetup, message));
-    }
+    void add(const Dictionary& message) { messages_.push_back(message); }
     void addVolume(double volume, bool playing, double time) {
         add(Dictionary{{"VQSessionVolume", volume},
                        {"VQSessionVolumePlayingState", playing ? 1 : 0},
                        {"hyreporting_timestamp", time},
-                       {"n", ++messages_}}); // Never a repeat.
+                       {"n", messages_.size()}}); // Never a repeat.
     }
-    std::vector<Dictionary> volumeEvents(double minimum) {
-        return createVolumeEvents(batch_.entries(), minimum);
+    std::unique_ptr<MessageBatch> batch(double minimum = 0.5) {
+        auto result = std::make_unique<MessageBatch>(
+            MessageBatch::Options{.keepsMessages = false, .minimumPlaytime = minimum});
+        for (const Dictionary& message : messages_) {
+            EXPECT_FALSE(result->addUnlessRedundant(kAudioEventCategoryVolume, kAudioEventTypeSetup,
+                                                    message));
+        }
+        return result;
     }
+    std::vector<Dictionary> volumeEvents(double minimum) { return batch(minimum)->volumeEvents(); }
+    std::optional<Dictionary> summary(AudioServiceType type) { return batch()->takeSummary(type); }
 
-    MessageBatch batch_;
-    int messages_ = 0;
+    std::vector<Dictionary> messages_;
 };
 
 TEST_F(SessionEventsTest, AStretchMustLastLongerThanTheMinimum) {
@@ -113,7 +118,7 @@ TEST_F(SessionEventsTest, AStretchThatStillPlaysHasNoEvent) {
 
 TEST_F(SessionEventsTest, AnEmptyBatchYieldsNothing) {
     EXPECT_TRUE(volumeEvents(0).empty());
-    EXPECT_FALSE(createSummaryEvent(batch_.entries(), kAudioServiceTypeTest).has_value());
+    EXPECT_FALSE(summary(kAudioServiceTypeTest).has_value());
 }
 
 TEST_F(SessionEventsTest, TheSummaryJoinsAllValuesOfEachKey) {
@@ -121,18 +126,38 @@ TEST_F(SessionEventsTest, TheSummaryJoinsAllValuesOfEachKey) {
     add(Dictionary{{"a", "two"}, {"b", List{1, 2}}, {"hyreporting_timestamp", 2.25}});
     add(Dictionary{{"a", 3.0f}});
 
-    const auto summary = createSummaryEvent(batch_.entries(), kAudioServiceTypeLongFormAudio);
-    ASSERT_TRUE(summary.has_value());
-    EXPECT_EQ(*summary, (Dictionary{{"HY_Session_Summary_Event", "7"},
-                                    {"a", "1,two,3"},
-                                    {"hyreporting_timestamp", "1.5,2.25"},
-                                    {"b", "(\n    1,\n    2\n)"}}));
+    const auto event = summary(kAudioServiceTypeLongFormAudio);
+    ASSERT_TRUE(event.has_value());
+    EXPECT_EQ(*event, (Dictionary{{"HY_Session_Summary_Event", "7"},
+                                  {"a", "1,two,3"},
+                                  {"hyreporting_timestamp", "1.5,2.25"},
+                                  {"b", "(\n    1,\n    2\n)"}}));
+}
+
+TEST_F(SessionEventsTest, AnEmptyTextIsAValueLikeAnyOther) {
+    add(Dictionary{{"a", ""}});
+    add(Dictionary{{"a", "x"}});
+    add(Dictionary{{"a", ""}});
+
+    EXPECT_EQ((*summary(4))["a"], Value(",x,"));
+}
+
+TEST_F(SessionEventsTest, KeysMayComeInAnyOrderAndNumber) {
+    add(Dictionary{{"a", 1}, {"b", 2}, {"c", 3}});
+    add(Dictionary{{"c", 4}, {"a", 5}});
+    add(Dictionary{{"b", 6}, {"d", 7}, {"a", 8}});
+
+    EXPECT_EQ(*summary(4), (Dictionary{{"HY_Session_Summary_Event", "4"},
+                                       {"a", "1,5,8"},
+                                       {"b", "2,6"},
+                                       {"c", "3,4"},
+                                       {"d", "7"}}));
 }
 
 TEST_F(SessionEventsTest, AClientsOwnSummaryKeyIsJoinedBehindTheServiceType) {
     add(Dictionary{{"HY_Session_Summary_Event", "x"}});
 
-    EXPECT_EQ((*createSummaryEvent(batch_.entries(), 4))["HY_Session_Summary_Event"], Value("4,x"));
+    EXPECT_EQ((*summary(4))["HY_Session_Summary_Event"], Value("4,x"));
 }
 
 } // namespace

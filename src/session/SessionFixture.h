@@ -14,6 +14,9 @@ namespace halyard {
 
 class SessionTest : public ::testing::Test {
 protected:
+    // Internal builds keep the batch, which these tests look at.
+    SessionTest() { platform_.deviceProperties.booleans["InternalBuild"] = true; }
+
     static constexpr std::int64_t kReporterID = 7;
     static constexpr std::int32_t kOwner = 100;
 

@@ -16,8 +16,6 @@ using ::testing::SizeIs;
 
 class SessionStopTest : public SessionTest {
 protected:
-    SessionStopTest() { platform_.deviceProperties.booleans["InternalBuild"] = true; }
-
     static void sendVolume(HYReportingSession& session, double volume, bool playing, double time) {
         session.sendMessage(Dictionary{{"VQSessionVolume", volume},
                                        {"VQSessionVolumePlayingState", playing},
