@@ -1,6 +1,6 @@
 # The real daemon over its real socket, used by clients that nobody here wrote.
 
-foreach(name requests bad_input neovim endurance sinks configuration store_failures)
+foreach(name requests bad_input neovim endurance drivers sinks configuration store_failures)
   add_test(NAME daemon.${name}
     COMMAND ${HALYARD_PYTHON} ${CMAKE_CURRENT_SOURCE_DIR}/daemon/test_${name}.py)
   set_tests_properties(daemon.${name} PROPERTIES LABELS daemon TIMEOUT 600

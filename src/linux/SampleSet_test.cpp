@@ -1,0 +1,182 @@
+#include "linux/SampleSet.h"
+
+#include <gmock/gmock.h>
+#include <limits>
+
+namespace halyard::linux_ {
+namespace {
+
+using namespace std::chrono_literals;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+constexpr std::int64_t kMin = std::numeric_limits<std::int64_t>::min();
+constexpr std::int64_t kMax = std::numeric_limits<std::int64_t>::max();
+
+// Two sets of one channel, ten seconds apart.
+class SampleSetTest : public ::testing::Test {
+protected:
+    void channelOf(ChannelFormat format) {
+        DriverChannel names;
+        names.group = "Speaker";
+        names.name = "n";
+        names.format = format;
+        auto list = std::make_shared<ChannelList>();
+        list->channels.push_back(
+            std::make_shared<const ChannelFacts>(ChannelFacts{names, 1'000'000}));
+        list->places.push_back(0);
+        list_ = list;
+    }
+    static Reading reading(std::vector<std::uint64_t> numbers, ReadingShape shape = {}) {
+        Reading result;
+        result.status = ReadStatus::Read;
+        result.numbers = std::move(numbers);
+        if (shape != ReadingShape()) {
+            result.shape = std::make_shared<const ReadingShape>(std::move(shape));
+        }
+        return result;
+    }
+    static Reading missing(ReadStatus status) {
+        Reading result;
+        result.status = status;
+        return result;
+    }
+    // What the delta says of the channel, as text.
+    std::vector<std::string> delta(const Reading& before, const Reading& after) {
+        SampleSet first(list_, platform::SteadyTime(100s));
+        SampleSet second(list_, platform::SteadyTime(110s));
+        first.add(before);
+        second.add(after);
+        std::vector<std::string> result;
+        second.since(first)->iterate([&](const platform::HWReportChannel& channel) {
+            result.push_back(describe(channel));
+            return 0;
+        });
+        return result;
+    }
+    std::vector<std::string> counter(std::int64_t before, std::int64_t after) {
+        channelOf(ChannelFormat::Simple);
+        return delta(reading({static_cast<std::uint64_t>(before)}),
+                     reading({static_cast<std::uint64_t>(after)}));
+    }
+    static std::string describe(const platform::HWReportChannel& channel) {
+        std::string text;
+        switch (channel.getFormat()) {
+        case platform::kHWReportFormatSimple:
+            return std::to_string(channel.simpleGetIntegerValue());
+        case platform::kHWReportFormatState:
+            for (int i = 0; i < channel.stateGetCount(); ++i) {
+                text += std::string(*channel.stateGetNameForIndex(i)) + "=" +
+                        std::to_string(channel.stateGetResidency(i)) + "/" +
+                        std::to_string(channel.stateGetInTransitions(i)) + "/" +
+                        std::to_string(channel.stateGetDutyCycle(i)) + " ";
+            }
+            return text;
+        default:
+            for (int i = 0; i < channel.histogramGetBucketCount(); ++i) {
+                std::int64_t lower = 0;
+                std::int64_t upper = 0;
+                EXPECT_EQ(channel.histogramGetBucketBounds(i, lower, upper), 0);
+                text += std::to_string(lower) + "-" + std::to_string(upper) + ":" +
+                        std::to_string(channel.histogramGetBucketHits(i)) + " ";
+            }
+            return text + "min " + std::to_string(channel.histogramGetMinValue()) + " max " +
+                   std::to_string(channel.histogramGetMaxValue());
+        }
+    }
+
+    ChannelListRef list_;
+};
+
+TEST_F(SampleSetTest, CountersSubtract) {
+    EXPECT_THAT(counter(5, 12), ElementsAre("7"));
+    EXPECT_THAT(counter(5, 5), ElementsAre("0"));
+    EXPECT_THAT(counter(-5, -3), ElementsAre("2"));
+}
+
+TEST_F(SampleSetTest, ACounterThatWentBackBeganAnew) {
+    EXPECT_THAT(counter(100, 3), ElementsAre("3"));
+}
+
+TEST_F(SampleSetTest, AChangeThatNoNumberHoldsIsTheLargest) {
+    EXPECT_THAT(counter(kMin, kMax), ElementsAre(std::to_string(kMax)));
+}
+
+TEST_F(SampleSetTest, ResidenciesSubtractAndTheirShareIsOfTheTimeBetween) {
+    channelOf(ChannelFormat::State);
+    const ReadingShape shape{{"on", "off"}, {}};
+    EXPECT_THAT(
+        delta(reading({1'000'000, 3, 500, 2}, shape), reading({3'500'000, 5, 500, 3}, shape)),
+        ElementsAre("on=2500000/2/0.250000 off=0/1/0.000000 "));
+}
+
+TEST_F(SampleSetTest, NoShareIsMoreThanAll) {
+    channelOf(ChannelFormat::State);
+    const ReadingShape shape{{"on"}, {}};
+    EXPECT_THAT(delta(reading({0, 0}, shape), reading({99'000'000, 1}, shape)),
+                ElementsAre("on=99000000/1/1.000000 "));
+}
+
+TEST_F(SampleSetTest, StatesOfAReloadedDriverBeganAnew) {
+    channelOf(ChannelFormat::State);
+    const ReadingShape shape{{"on", "off"}, {}};
+    EXPECT_THAT(delta(reading({10, 9, 10, 9}, shape), reading({20, 1, 20, 10}, shape)),
+                ElementsAre("on=20/1/0.000002 off=20/10/0.000002 "));
+}
+
+TEST_F(SampleSetTest, StatesAreFoundByNameWhenTheListChanged) {
+    channelOf(ChannelFormat::State);
+    EXPECT_THAT(
+        delta(reading({10, 1, 20, 2}, {{"a", "b"}, {}}), reading({25, 3, 7, 1}, {{"b", "c"}, {}})),
+        ElementsAre("b=5/1/0.000001 c=7/1/0.000001 "));
+}
+
+TEST_F(SampleSetTest, HitsSubtractAndTheEndsAreThoseOfTheInterval) {
+    channelOf(ChannelFormat::Histogram);
+    const ReadingShape shape{{}, {{0, 10}, {10, 20}, {20, 30}}};
+    EXPECT_THAT(delta(reading({5, 1, 0}, shape), reading({5, 3, 4}, shape)),
+                ElementsAre("0-10:0 10-20:2 20-30:4 min 10 max 30"));
+    EXPECT_THAT(delta(reading({5, 1, 0}, shape), reading({5, 1, 0}, shape)),
+                ElementsAre("0-10:0 10-20:0 20-30:0 min 0 max 0"));
+}
+
+TEST_F(SampleSetTest, BucketsAreFoundByBoundsWhenTheListChanged) {
+    channelOf(ChannelFormat::Histogram);
+    EXPECT_THAT(delta(reading({5}, {{}, {{10, 20}}}), reading({2, 6}, {{}, {{0, 10}, {10, 20}}})),
+                ElementsAre("0-10:2 10-20:1 min 0 max 20"));
+}
+
+TEST_F(SampleSetTest, WhatCameMeanwhileBeganAtZero) {
+    channelOf(ChannelFormat::Simple);
+    EXPECT_THAT(delta(missing(ReadStatus::Absent), reading({7})), ElementsAre("7"));
+}
+
+TEST_F(SampleSetTest, WhatCouldNotBeReadIsNotReported) {
+    channelOf(ChannelFormat::Simple);
+    EXPECT_THAT(delta(missing(ReadStatus::Failed), reading({7})), IsEmpty());
+    EXPECT_THAT(delta(reading({7}), missing(ReadStatus::Failed)), IsEmpty());
+    EXPECT_THAT(delta(reading({7}), missing(ReadStatus::Absent)), IsEmpty());
+}
+
+TEST_F(SampleSetTest, AskingPastTheEndIsHarmless) {
+    channelOf(ChannelFormat::State);
+    SampleSet set(list_, platform::SteadyTime(100s));
+    set.add(reading({1, 2}, {{"on"}, {}}));
+    set.iterate([](const platform::HWReportChannel& channel) {
+        for (const int index : {-1, 1, 1000}) {
+            std::int64_t lower = 5;
+            std::int64_t upper = 6;
+            EXPECT_EQ(channel.stateGetNameForIndex(index), std::nullopt);
+            EXPECT_EQ(channel.stateGetResidency(index), 0U);
+            EXPECT_EQ(channel.stateGetInTransitions(index), 0U);
+            EXPECT_NE(channel.histogramGetBucketBounds(index, lower, upper), 0);
+            EXPECT_EQ(lower, 5);
+        }
+        EXPECT_EQ(channel.simpleGetIntegerValue(), 0);
+        EXPECT_EQ(channel.stateGetDutyCycle(0), 0); // No interval, no share.
+        return 0;
+    });
+}
+
+} // namespace
+} // namespace halyard::linux_
