@@ -54,7 +54,7 @@ TEST(BuiltInChannelsTest, ASystemWithoutDevicesHasNone) {
     EXPECT_THAT(builtIn(tree.path()), IsEmpty());
 }
 
-TEST(BuiltInChannelsTest, EveryBuiltInSourceIsUnderstoodAndRead) {
+TEST(BuiltInChannelsTest, EveryBuiltInSourceIsUnderstood) {
     for (const char* path : {kDevice, "/"}) {
         SourceRoot root{path};
         for (const auto& channel : builtInChannels(root)) {
@@ -62,9 +62,16 @@ TEST(BuiltInChannelsTest, EveryBuiltInSourceIsUnderstoodAndRead) {
             auto* const source = std::get_if<std::unique_ptr<ChannelSource>>(&made);
             ASSERT_NE(source, nullptr) << channel.source;
             EXPECT_EQ((*source)->format(), channel.format) << channel.source;
-            const Reading reading = (*source)->read({});
-            EXPECT_EQ(reading.status, ReadStatus::Read) << channel.source << reading.fault;
         }
+    }
+}
+
+TEST(BuiltInChannelsTest, EveryChannelOfTheDeviceIsRead) {
+    SourceRoot root{kDevice};
+    for (const auto& channel : builtInChannels(root)) {
+        auto made = makeChannelSource(channel.source, root);
+        const Reading reading = std::get<std::unique_ptr<ChannelSource>>(made)->read({});
+        EXPECT_EQ(reading.status, ReadStatus::Read) << channel.source << reading.fault;
     }
 }
 
