@@ -1,0 +1,65 @@
+// Statistics files are written by drivers and by operators' scripts: whatever
+// stands in them, a reader takes it or leaves it.
+
+#include <cstdint>
+#include <cstdlib>
+#include <string_view>
+#include <variant>
+
+#include "linux/ChannelSource.h"
+#include "linux/SourceText.h"
+
+using namespace halyard::linux_;
+
+namespace {
+
+void require(bool holds) {
+    if (!holds) {
+        std::abort();
+    }
+}
+
+void checkStates(const std::optional<SourceStates>& states) {
+    require(!states || (!states->empty() && states->size() <= kMaxSourceStates));
+    if (states) {
+        for (const SourceState& state : *states) {
+            require(!state.name.empty() && state.name.find('\n') == std::string::npos);
+        }
+    }
+}
+
+void checkBuckets(const std::optional<SourceBuckets>& buckets) {
+    require(!buckets || buckets->size() <= kMaxSourceBuckets);
+}
+
+// Nothing is opened by making a source, but for the interrupts, which are looked
+// for where there are none.
+void checkSource(std::string_view text) {
+    SourceRoot root{"/nonexistent"};
+    const auto made = makeChannelSource(text, root);
+    const auto* const fault = std::get_if<std::string>(&made);
+    require(fault == nullptr || !fault->empty());
+}
+
+} // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
+    const std::string_view text(reinterpret_cast<const char*>(data), size);
+    (void)parseInteger(text);
+    (void)parsePressure(text, "some");
+    (void)parsePerCpuCount(text);
+    for (const char* row : {"1", "2", "HI", "cpu"}) {
+        for (const std::size_t column : {1U, 2U, 9U}) {
+            (void)parseField(text, {row, column});
+        }
+    }
+    checkStates(parseTimeInState(text));
+    checkStates(parseTransitionTable(text));
+    checkStates(parseTransitionStatistics(text));
+    checkBuckets(parseBuckets(text));
+    checkBuckets(parseTraceHistogram(text));
+    const auto status = parsePcmStatus(text);
+    require(!status || !status->state.empty());
+    checkSource(text);
+    return 0;
+}
