@@ -24,6 +24,7 @@ class MetricService;
 class Notifications;
 class Operations;
 class OwnProcess;
+class PerformanceTraces;
 class Preferences;
 class ProcessTable;
 class QueueFactory;
@@ -42,6 +43,7 @@ struct Platform {
     TraceMarks* traceMarks = nullptr;
     EventTrace* eventTrace = nullptr;
     ResultsFiles* resultsFiles = nullptr;
+    PerformanceTraces* performanceTraces = nullptr;
     Preferences* preferences = nullptr;
     FeatureFlags* featureFlags = nullptr;
     DeviceProperties* deviceProperties = nullptr;

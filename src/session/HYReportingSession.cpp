@@ -13,6 +13,7 @@
 #include "platform/TraceMarks.h"
 #include "session/SummaryFile.h"
 #include "sinks/HYReportingTallyhubBridge.h"
+#include "tracing/TraceRunner.h"
 
 namespace halyard {
 namespace {
@@ -135,6 +136,7 @@ void HYReportingSession::start() {
     if (relayReportingEnabled()) {
         startRelayReporting();
     }
+    startTracing();
 }
 
 void HYReportingSession::stop() {
@@ -150,6 +152,7 @@ void HYReportingSession::stop() {
     if (relayReportingEnabled()) {
         stopRelayReporting();
     }
+    stopTracing();
     std::unique_ptr<MessageBatch> finished; // Freed after the lock.
     {
         const MutexLock lock(batchMutex_);

@@ -21,13 +21,18 @@
 #include "common/Mutex.h"
 #include "common/Value.h"
 #include "platform/HWReport.h"
+#include "platform/PerformanceTrace.h"
 #include "platform/RelayReporting.h"
+#include "platform/Semaphore.h"
 #include "platform/WorkQueue.h"
 #include "session/AsyncSemaphore.h"
 #include "session/MessageBatch.h"
 #include "sinks/SessionFacts.h"
 
 namespace halyard {
+
+class TraceRunner;
+struct TraceParams;
 
 // Keys that clients may put into messages; the session treats them like any other.
 inline constexpr const char* HYReportingSessionBlacklistFieldsKey = "_comparison_field_blacklist";
@@ -37,7 +42,18 @@ inline constexpr const char* HYReportingSessionThrottleSecondsKey = "_throttle_s
 // integer part counts.
 inline constexpr const char* HYReportingRelayReportingTimeOut = "9.0";
 
+// Configuration keys of performance traces, and the kinds of trace there are.
+inline constexpr const char* HYReportingTraceType = "HYReportingTraceType";
+inline constexpr const char* HYReportingTraceTypeEvtap = "evtap";
+inline constexpr const char* HYReportingTraceTypeArtrace = "artrace";
+inline constexpr const char* HYReportingLoomisPlistFilePath = "HYReportingLoomisPlistFilePath";
+// Declared for those who configure traces; the session reads none of them.
+inline constexpr const char* HYReportingPerfProcesses = "HYReportingPerfProcesses";
+inline constexpr const char* HYReportingDelayPerfEndSnapShot = "HYReportingPerfEndDelay";
+inline constexpr const char* HYReportingTestName = "HYReportingTestName";
+
 class HYReportingSession final : public SessionFacts,
+                                 public platform::PerformanceTraceDelegate,
                                  public std::enable_shared_from_this<HYReportingSession> {
 public:
     using SendReply = std::function<void(const MaybeError&)>;
@@ -126,6 +142,19 @@ public:
     // made of it (see MessageBatch).
     std::vector<BatchedMessage> nestedAggregatedPayloadData() const HY_EXCLUDES(batchMutex_);
 
+    // Reads the trace parameter file and makes the runner of its traces; null is
+    // logged and refused.
+    void setupTracing(const std::string* fileName) HY_EXCLUDES(stateMutex_);
+    std::optional<std::string> tracingFileName() const HY_EXCLUDES(stateMutex_);
+    bool startedTracing() const { return startedTracing_.load(); }
+    // Where the last performance trace lies; empty before.
+    std::string getPSTraceFileURL() const HY_EXCLUDES(stateMutex_);
+
+    void performanceTraceDidStart(const MaybeError& error) override HY_EXCLUDES(stateMutex_);
+    void performanceTraceDidStop(const MaybeError& error) override HY_EXCLUDES(stateMutex_);
+    void performanceTraceDidComplete(std::string_view traceURL, std::string_view token,
+                                     const MaybeError& error) override HY_EXCLUDES(stateMutex_);
+
 private:
     struct Opening;
     struct Delivery {
@@ -162,6 +191,16 @@ private:
     // On a thread of the upload framework.
     void backendsFound(const std::optional<List>& backends);
 
+    // The trace of a session of type test, from start to stop. Stopping blocks
+    // until the trace is complete.
+    bool tracesPerformance() const;
+    void startTracing();
+    void startPerformanceTrace() HY_EXCLUDES(stateMutex_);
+    void stopTracing();
+    std::shared_ptr<platform::PerformanceTraceSession> traceSession() const
+        HY_EXCLUDES(stateMutex_);
+    void dropTraceSession() HY_EXCLUDES(stateMutex_);
+
     const std::int64_t reporterID_;
     const std::vector<std::int32_t> processIdentifiers_;
     const std::shared_ptr<AsyncSemaphore> relayreportingBackendSemaphore_ =
@@ -172,6 +211,12 @@ private:
     std::atomic<bool> relayReportingEnabled_{false};
     std::atomic<bool> relayReportingSessionStarted_{false};
 
+    std::atomic<bool> startedTracing_{false};
+    platform::Semaphore mTraceDispatchSemaphore_;
+    // On the service queue only.
+    std::unique_ptr<TraceParams> traceParams_;
+    std::unique_ptr<TraceRunner> traceRunner_;
+
     mutable Mutex stateMutex_;
     AudioServiceType serviceType_ HY_GUARDED_BY(stateMutex_) = kAudioServiceTypeUnknown;
     std::string serviceName_ HY_GUARDED_BY(stateMutex_) = "unknown";
@@ -181,6 +226,11 @@ private:
     std::shared_ptr<platform::SerialQueue> relayReportingQueue_ HY_GUARDED_BY(stateMutex_);
     std::shared_ptr<platform::RelayReporting> relayReportingSession_ HY_GUARDED_BY(stateMutex_);
     Value relayReportingAgentToken_ HY_GUARDED_BY(stateMutex_);
+
+    std::optional<std::string> tracingFileName_ HY_GUARDED_BY(stateMutex_);
+    std::optional<platform::PerformanceTraceConfig> traceConfig_ HY_GUARDED_BY(stateMutex_);
+    std::shared_ptr<platform::PerformanceTraceSession> traceSession_ HY_GUARDED_BY(stateMutex_);
+    std::string finalTraceURL_ HY_GUARDED_BY(stateMutex_);
 
     mutable Mutex batchMutex_;
     // Null while the session is not started.

@@ -11,6 +11,7 @@
 #include "testing/FakeHWReport.h"
 #include "testing/FakeIncidentReporter.h"
 #include "testing/FakeOperations.h"
+#include "testing/FakePerformanceTraces.h"
 #include "testing/FakeRelayReporting.h"
 #include "testing/FakeResultsFiles.h"
 #include "testing/FakeTraceMarks.h"
@@ -41,6 +42,7 @@ public:
                                   .traceMarks = &traceMarks,
                                   .eventTrace = &eventTrace,
                                   .resultsFiles = &resultsFiles,
+                                  .performanceTraces = &performanceTraces,
                                   .preferences = &preferences,
                                   .featureFlags = &featureFlags,
                                   .deviceProperties = &deviceProperties,
@@ -69,6 +71,7 @@ public:
     FakeFiles files;
     FakeEventTrace eventTrace;
     FakeResultsFiles resultsFiles;
+    FakePerformanceTraces performanceTraces;
     FakePreferences preferences;
     FakeFeatureFlags featureFlags;
     FakeDeviceProperties deviceProperties;

@@ -80,7 +80,7 @@ void TraceRunner::tearDownTracing(Trace* trace) {
 }
 
 void TraceRunner::tracingCompletionHandler(Trace* trace) {
-    if (trace->flag()) {
+    if (sessions_.contains(trace)) {
         trace->processTracepoints(sessions_[trace].get(), points_[trace]);
         timelines_.push_back(timelineOf(*trace));
         tearDownTracing(trace);
@@ -94,7 +94,8 @@ void TraceRunner::stopTracingandProcessResults() {
         Trace* const trace = each.get();
         HY_LOG_INFO(HYReportingTraceCategory, "Tearing down trace :  {}", trace->name());
         queue_->async([this, trace] {
-            if (trace->flag()) {
+            // One that was stopped before has no session any more.
+            if (trace->flag() && sessions_.contains(trace)) {
                 stopTracing(trace);
             } else {
                 tracingCompletionHandler(trace);

@@ -1,0 +1,180 @@
+#include <gtest/gtest.h>
+
+#include "session/SessionFixture.h"
+
+namespace halyard {
+namespace {
+
+using ::testing::IsEmpty;
+using ::testing::SizeIs;
+
+class SessionTracingTest : public SessionTest {
+protected:
+    SessionTracingTest() {
+        platform_.featureFlags.flags[{"AudioAnalytics", "Tracing"}] = true;
+        // Whoever blocks lets the queues go on.
+        platform_.conditions.onWait = [this] { return platform_.queues.runOne(); };
+        platform_.files.files["/trace.plist"] =
+            "{ Children = ({ Name = audio; TraceType = evtap; Children = ("
+            "{ Name = render; Type = Interval; EvtapCodeBegin = 21040010;"
+            "  EvtapCodeEnd = 21040011; }); }); }";
+        session_ = makeSession();
+        session_->setServiceType(kAudioServiceTypeTest);
+    }
+
+    void configure(const Dictionary& configuration) {
+        session_->updateConfigurationWithContentsOfConfiguration(configuration);
+    }
+    bool loggedByTrace(LogLevel level, std::string_view text) const {
+        return platform_.log.has(level, HYReportingTraceCategory, text);
+    }
+    auto& events() { return platform_.eventTrace.sessions; }
+    auto& performance() { return platform_.performanceTraces.sessions; }
+
+    std::shared_ptr<HYReportingSession> session_;
+};
+
+TEST_F(SessionTracingTest, AParameterFileWithoutAKindRunsTheEventTrace) {
+    configure({{HYReportingLoomisPlistFilePath, "/trace.plist"}});
+    session_->start();
+    EXPECT_TRUE(session_->startedTracing());
+    ASSERT_THAT(events(), SizeIs(1));
+    EXPECT_THAT(performance(), IsEmpty());
+    EXPECT_TRUE(loggedByTrace(LogLevel::Debug, "Got the tracefile /trace.plist, setting up trace"));
+    EXPECT_TRUE(loggedByTrace(LogLevel::Info, "Setting up tracing for test"));
+    events()[0]->deliver(testing::tracePoint(0x21040010, 100));
+    events()[0]->deliver(testing::tracePoint(0x21040011, 350));
+
+    session_->stop();
+    EXPECT_FALSE(session_->startedTracing());
+    ASSERT_THAT(platform_.resultsFiles.files, SizeIs(1));
+    EXPECT_THAT(platform_.resultsFiles.files[0]->values,
+                ::testing::ElementsAre(testing::FakeResultsFiles::NamedValue{"render", 250}));
+    EXPECT_TRUE(platform_.resultsFiles.files[0]->closed);
+}
+
+TEST_F(SessionTracingTest, WithoutAParameterFileItRunsAPerformanceTrace) {
+    session_->start();
+    ASSERT_THAT(performance(), SizeIs(1));
+    EXPECT_EQ(performance()[0]->templateNumber, 1);
+    EXPECT_EQ(performance()[0]->started, 1);
+    EXPECT_TRUE(platform_.log.has(LogLevel::Default, HYReportingPlatformCategory,
+                                  "started performance trace."));
+    EXPECT_TRUE(loggedByTrace(LogLevel::Info, "Performance Trace Started"));
+
+    session_->stop();
+    EXPECT_EQ(performance()[0]->stopped, 1);
+    EXPECT_TRUE(performance()[0]->destroyed);
+    EXPECT_TRUE(performance()[0]->delegate.expired());
+    EXPECT_EQ(session_->getPSTraceFileURL(), "/traces/one.dat");
+    EXPECT_TRUE(loggedByTrace(LogLevel::Info, "Performance Trace Stopped"));
+    EXPECT_TRUE(loggedByTrace(LogLevel::Info, "Performance Trace Completed: /traces/one.dat"));
+}
+
+TEST_F(SessionTracingTest, AClientsEvtapIsNotTheConstant) {
+    configure({{HYReportingTraceType, "evtap"}, {HYReportingLoomisPlistFilePath, "/trace.plist"}});
+    session_->start();
+    EXPECT_THAT(events(), IsEmpty());
+    EXPECT_THAT(performance(), SizeIs(1));
+    EXPECT_EQ(session_->tracingFileName(), std::nullopt);
+}
+
+TEST_F(SessionTracingTest, NotEvenTheConstantsOwnTextMatchesOnceItIsAValue) {
+    configure({{HYReportingTraceType, HYReportingTraceTypeEvtap},
+               {HYReportingLoomisPlistFilePath, "/trace.plist"}});
+    session_->start();
+    EXPECT_THAT(events(), IsEmpty());
+}
+
+TEST_F(SessionTracingTest, OtherServiceTypesNeverTrace) {
+    session_->setServiceType(kAudioServiceTypeLongFormAudio);
+    configure({{HYReportingLoomisPlistFilePath, "/trace.plist"}});
+    session_->start();
+    session_->stop();
+    EXPECT_THAT(events(), IsEmpty());
+    EXPECT_THAT(performance(), IsEmpty());
+}
+
+TEST_F(SessionTracingTest, WithTheFeatureOffNothingTraces) {
+    platform_.featureFlags.flags.clear();
+    session_->start();
+    session_->stop();
+    EXPECT_THAT(performance(), IsEmpty());
+    EXPECT_FALSE(session_->startedTracing());
+}
+
+TEST_F(SessionTracingTest, AStartOfAStartedSessionStartsNoSecondTrace) {
+    session_->start();
+    session_->start();
+    EXPECT_THAT(performance(), SizeIs(1));
+}
+
+TEST_F(SessionTracingTest, AMissingParameterFileTracesNothingButIsStoppedLikeAny) {
+    configure({{HYReportingLoomisPlistFilePath, "/none"}});
+    session_->start();
+    EXPECT_TRUE(session_->startedTracing());
+    session_->stop();
+    EXPECT_TRUE(platform_.resultsFiles.files.at(0)->values.empty());
+}
+
+TEST_F(SessionTracingTest, SetupWithoutAFileNameIsRefused) {
+    session_->setupTracing(nullptr);
+    EXPECT_EQ(session_->tracingFileName(), std::nullopt);
+    EXPECT_TRUE(loggedByTrace(LogLevel::Error, "TracefileName empty. Failed to setup tracing"));
+}
+
+TEST_F(SessionTracingTest, ATraceThatCannotStartDoesNotHoldUpTheStop) {
+    platform_.performanceTraces.startError = Error{"posix", 2, "No such file or directory"};
+    session_->start();
+    EXPECT_TRUE(session_->startedTracing());
+    EXPECT_TRUE(performance()[0]->destroyed);
+    session_->stop();
+    EXPECT_EQ(performance()[0]->stopped, 0);
+    EXPECT_FALSE(session_->started());
+    EXPECT_TRUE(
+        loggedByTrace(LogLevel::Error, "performanceTraceDidStart No such file or directory"));
+    EXPECT_TRUE(
+        loggedByTrace(LogLevel::Error, "performanceTraceDidComplete No such file or directory"));
+    EXPECT_EQ(session_->getPSTraceFileURL(), "");
+}
+
+TEST_F(SessionTracingTest, ATraceThatCannotStopDropsItsSession) {
+    platform_.performanceTraces.stopError = Error{"posix", 5, "Input/output error"};
+    platform_.performanceTraces.completeError = platform_.performanceTraces.stopError;
+    session_->start();
+    session_->stop();
+    EXPECT_TRUE(loggedByTrace(LogLevel::Error, "performanceTraceDidStop Input/output error"));
+    EXPECT_TRUE(performance()[0]->destroyed);
+}
+
+TEST_F(SessionTracingTest, ASessionMayBeTracedAgain) {
+    configure({{HYReportingLoomisPlistFilePath, "/trace.plist"}});
+    for (int i = 0; i < 2; ++i) {
+        session_->start();
+        session_->stop();
+    }
+    EXPECT_THAT(events(), SizeIs(2));
+    EXPECT_THAT(platform_.resultsFiles.files, SizeIs(2));
+}
+
+// The file's name stays, so the stop goes to the runner whatever was started.
+TEST_F(SessionTracingTest, OnceAnEventTraceTheStopAlwaysGoesToItsRunner) {
+    configure({{HYReportingLoomisPlistFilePath, "/trace.plist"}});
+    session_->start();
+    session_->stop();
+    configure({{HYReportingTraceType, "artrace"}});
+    session_->start();
+    session_->stop();
+    ASSERT_THAT(performance(), SizeIs(1));
+    EXPECT_EQ(performance()[0]->stopped, 0);
+    EXPECT_THAT(platform_.resultsFiles.files, SizeIs(2));
+}
+
+TEST_F(SessionTracingTest, ADestroyedSessionGivesItsTracesUp) {
+    session_->start();
+    session_.reset();
+    EXPECT_TRUE(performance()[0]->destroyed);
+}
+
+} // namespace
+} // namespace halyard
