@@ -80,7 +80,8 @@ Dictionary describe(const StoreStatus& store) {
 LinuxPlatform::LinuxPlatform(Directories directories, platform::TraceMarks& traceMarks)
     : directories_(std::move(directories)), stopSignals_(context_, SIGTERM, SIGINT),
       reloadSignals_(context_, SIGHUP), watchdog_(context_), shutdownLimit_(context_),
-      files_(directories_), log_(LogWriter::defaultOutput()),
+      files_(directories_), resultsFiles_(directories_, clock_),
+      performanceTraces_({directories_.logs / "Traces"}), log_(LogWriter::defaultOutput()),
       configuration_(directories_.configuration), ownProcess_([this] {
           // The service was asked to die at once; what it accepted need not.
           (void)store_->close();
@@ -111,12 +112,19 @@ LinuxPlatform::LinuxPlatform(Directories directories, platform::TraceMarks& trac
     hwReport_ = std::make_unique<LinuxHWReport>(clock_, configuration_.settings()->driverChannels,
                                                 LinuxHWReport::Options());
     queues_ = std::make_unique<Queues>(context_, pressure_);
+    eventTrace_ = std::make_unique<TracefsEventTrace>(TracefsEventTrace::Options{
+        kTracefs, [this] {
+            return listener_ ? listener_->connectedProcesses() : std::vector<std::int32_t>();
+        }});
     applySettings(*configuration_.settings());
 
     platform_.random = &random_;
     platform_.queues = queues_.get();
     platform_.conditions = &conditions_;
     platform_.files = &files_;
+    platform_.eventTrace = eventTrace_.get();
+    platform_.resultsFiles = &resultsFiles_;
+    platform_.performanceTraces = &performanceTraces_;
     platform_.traceMarks = &traceMarks;
     platform_.preferences = &configuration_;
     platform_.featureFlags = &configuration_;

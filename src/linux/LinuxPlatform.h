@@ -14,6 +14,7 @@
 #include <string>
 #include <vector>
 
+#include "linux/BenchmarkResultsWriter.h"
 #include "linux/Configuration.h"
 #include "linux/ConfigurationWatch.h"
 #include "linux/Directories.h"
@@ -30,6 +31,8 @@
 #include "linux/Store.h"
 #include "linux/StoreEventServices.h"
 #include "linux/StoreRelayReporting.h"
+#include "linux/TraceCmdRecorder.h"
+#include "linux/TracefsEventTrace.h"
 #include "platform/Operations.h"
 #include "platform/Platform.h"
 #include "platform/TraceMarks.h"
@@ -75,6 +78,9 @@ private:
     SystemRandom random_;
     SystemConditions conditions_;
     LinuxFiles files_;
+    BenchmarkResultsFiles resultsFiles_;
+    TraceCmdRecorder performanceTraces_;
+    std::unique_ptr<TracefsEventTrace> eventTrace_;
     LogWriter log_;
     Pressure pressure_;
     Configuration configuration_;

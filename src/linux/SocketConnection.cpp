@@ -327,6 +327,7 @@ void SocketConnection::end(Ending ending) {
     asio::error_code ignored;
     socket_.close(ignored);
     shared_.connections.erase(self);
+    shared_.processes.remove(peer_.pid);
     if (ending == Ending::Broken && interruptionHandler_) {
         interruptionHandler_();
     }

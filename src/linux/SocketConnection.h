@@ -25,6 +25,7 @@
 #include "linux/Charge.h"
 #include "linux/Peer.h"
 #include "linux/Pressure.h"
+#include "linux/ProcessList.h"
 #include "platform/Listener.h"
 #include "protocol/Wire.h"
 
@@ -53,6 +54,7 @@ struct ListenerShared {
     protocol::CallDecoder decoder;
     std::unordered_set<std::shared_ptr<SocketConnection>> connections;
     ListenerCounters counters;
+    ProcessList processes; // of the connections; any thread
 };
 
 class SocketConnection final : public platform::Connection,

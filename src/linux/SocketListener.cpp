@@ -147,6 +147,7 @@ void SocketListener::accepted(asio::local::stream_protocol::socket socket) {
     ++shared_.counters.accepted;
     auto connection = std::make_shared<SocketConnection>(std::move(socket), peer, rights, shared_);
     shared_.connections.insert(connection);
+    shared_.processes.add(peer.pid);
     if (delegate_ == nullptr || !delegate_->shouldAcceptNewConnection(connection)) {
         connection->close();
     }

@@ -39,6 +39,8 @@ public:
     void stopAccepting();
     void closeAllConnections();
 
+    // Any thread.
+    std::vector<std::int32_t> connectedProcesses() const { return shared_.processes.pids(); }
     const ListenerCounters& counters() const { return shared_.counters; }
 
 private:
