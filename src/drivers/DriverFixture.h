@@ -18,6 +18,9 @@ protected:
     using Group = testing::FakeHWReport::Group;
     using Lines = std::vector<testing::RecordingLog::Line>;
 
+    // Internal builds keep the batch, which these tests look at.
+    DriverTest() { platform_.deviceProperties.booleans["InternalBuild"] = true; }
+
     static testing::RecordingLog::Line line(LogLevel level, std::string text) {
         return {level, std::string(HYReportingDriverUtilityCategory), std::move(text)};
     }

@@ -9,8 +9,9 @@ using ::testing::IsEmpty;
 
 class DriverReportsTest : public ServiceTest {
 protected:
+    // Internal builds keep the batch, which these tests look at.
     // The service subscribes once, so the group has to be there before it.
-    DriverReportsTest() {
+    DriverReportsTest() : ServiceTest(true) {
         platform_.hwReport.groups["Speaker-(null)"] = {};
         restartService();
         platform_.hwReport.calls.clear();

@@ -16,6 +16,9 @@ constexpr const char* kReporting = "com.kestrel.halyard.reporting";
 
 class FeatureStateTest : public ServiceTest {
 protected:
+    // Internal builds keep the batch, which these tests look at.
+    FeatureStateTest() : ServiceTest(true) {}
+
     void setDeviceName(const Value& name) {
         platform_.preferences.values[{"com.kestrel.halyard", "device_name"}] = name;
     }
