@@ -1,0 +1,9 @@
+# Traces of a real program through the real daemon, where the system lets us.
+
+add_executable(traced_work tracing/traced_work.cpp)
+target_link_libraries(traced_work PRIVATE halyard_options halyard Threads::Threads)
+
+add_test(NAME daemon.tracing
+  COMMAND ${HALYARD_PYTHON} ${CMAKE_CURRENT_SOURCE_DIR}/daemon/test_tracing.py)
+set_tests_properties(daemon.tracing PROPERTIES LABELS "daemon;tracing" TIMEOUT 600
+  ENVIRONMENT "HALYARDD=$<TARGET_FILE:halyardd>;TRACED_WORK=$<TARGET_FILE:traced_work>;LIBHALYARD=$<TARGET_FILE:halyard>;PYTHONDONTWRITEBYTECODE=1")

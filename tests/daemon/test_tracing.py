@@ -1,0 +1,166 @@
+"""Kernel event traces and performance traces through the real daemon.
+
+Needs tracefs and the right to write there; skipped elsewhere. TRACED_WORK names
+the program whose marks are traced, LIBHALYARD the library it links.
+"""
+
+import glob
+import json
+import os
+import shutil
+import statistics
+import subprocess
+import tempfile
+import unittest
+
+from harness import DaemonTest, PATIENCE
+
+TRACEFS = "/sys/kernel/tracing"
+PARAMETERS = os.path.join(os.path.dirname(__file__), "../../docs/examples/audio-trace.plist")
+TEST = 11
+# What a mark costs while it is traced, and what a loaded machine adds to that.
+TOLERANCE_NS = 20_000
+TOLERANCE_SHARE = 0.05
+
+
+def traces_of(pid):
+    """Instances and probes that this process has in the kernel."""
+    found = glob.glob(f"{TRACEFS}/instances/halyard_{pid}_*")
+    with open(f"{TRACEFS}/uprobe_events", encoding="ascii") as probes:
+        return found + [line for line in probes if f"halyard_{pid}_" in line]
+
+
+def trace_cmd_works():
+    """Some releases crash on some kernels."""
+    if not shutil.which("trace-cmd"):
+        return False
+    name = f"halyard_{os.getpid()}_0_0"
+    with tempfile.TemporaryDirectory() as directory:
+        done = subprocess.run(["trace-cmd", "record", "-q", "-B", name, "-o", "t.dat", "-e",
+                               "sched:sched_switch", "true"], cwd=directory, check=False,
+                              stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
+    if os.path.isdir(f"{TRACEFS}/instances/{name}"):
+        os.rmdir(f"{TRACEFS}/instances/{name}")
+    return done.returncode == 0
+
+
+@unittest.skipUnless(os.access(f"{TRACEFS}/uprobe_events", os.W_OK),
+                     "no tracefs that we may write to")
+class Tracing(DaemonTest):
+    configuration = "[feature_flags.AudioAnalytics]\nTracing = true\n"
+
+    def traces(self, name):
+        return os.path.join(self.daemon.root, "logs", "Traces", name)
+
+    def read(self, name):
+        with open(self.traces(name), encoding="utf-8") as file:
+            return json.load(file)
+
+    def work(self, environment=None):
+        """The durations, by item, that the traced program measured itself."""
+        done = subprocess.run(
+            [os.environ["TRACED_WORK"], self.daemon.socket_path, os.path.abspath(PARAMETERS)],
+            env=environment, stdout=subprocess.PIPE, text=True, timeout=PATIENCE, check=True)
+        measured = {}
+        for line in done.stdout.splitlines():
+            item, nanoseconds = line.split()
+            measured.setdefault(item, []).append(int(nanoseconds))
+        return measured
+
+    def results(self):
+        traced = {}
+        for entry in self.read("tracing_results.pbj")["benchmarks"]:
+            self.assertEqual(entry["time_unit"], "ns")
+            traced.setdefault(entry["name"], []).append(entry["real_time"])
+        return traced
+
+    def assert_agree(self, traced, measured):
+        self.assertEqual({item: len(values) for item, values in traced.items()},
+                         {item: len(values) for item, values in measured.items()})
+        for item, values in measured.items():
+            expected = statistics.median(values)
+            self.assertAlmostEqual(statistics.median(traced[item]), expected, msg=item,
+                                   delta=TOLERANCE_NS + expected * TOLERANCE_SHARE)
+
+    def test_the_results_agree_with_what_the_program_measured(self):
+        measured = self.work()
+        self.assertEqual(sorted(measured), ["handover", "render"])
+        self.assert_agree(self.results(), measured)
+        context = self.read("tracing_results.pbj")["context"]
+        self.assertEqual((context["name"], context["version"]), ("HYReporting", 4))
+        self.assertEqual(traces_of(self.daemon.process.pid), [])
+
+    def test_the_time_line_holds_every_pair_under_its_own_id(self):
+        measured = self.work()
+        line = self.read("tracing_results.trace.json")
+        events = [event for event in line["traceEvents"] if event["ph"] in "be"]
+        pairs = sum(len(values) for values in measured.values())
+        self.assertEqual(len(events), 2 * pairs)
+        self.assertEqual(len({event["id"] for event in events}), pairs)
+        [trace] = line["otherData"]["traces"]
+        self.assertEqual(trace, {"name": "audio", "clock": "CLOCK_MONOTONIC", "eventsLost": 0,
+                                 "pairs": pairs, "startsWithoutStop": 0, "stopsWithoutStart": 0})
+
+    def test_a_clients_own_copy_of_the_library_is_traced(self):
+        copies = os.path.join(self.daemon.root, "copies")
+        os.mkdir(copies)
+        shutil.copy(os.environ["LIBHALYARD"], os.path.join(copies, "libhalyard.so.0"))
+        environment = dict(os.environ, LD_LIBRARY_PATH=copies)
+        measured = self.work(environment)
+        self.assert_agree(self.results(), measured)
+
+    def test_what_a_killed_daemon_leaves_the_next_one_removes(self):
+        client = self.connect()
+        client.result("createReportingSession", 7)
+        client.result("setServiceType", TEST, 7)
+        client.result("setConfiguration",
+                      {"HYReportingLoomisPlistFilePath": os.path.abspath(PARAMETERS)}, 7)
+        client.result("startReportingSessionForID", 7)
+        pid = self.daemon.process.pid
+        self.assertNotEqual(traces_of(pid), [])
+        self.daemon.kill()
+        self.assertNotEqual(traces_of(pid), [])
+        self.daemon.run()
+        self.assertEqual(traces_of(pid), [])
+
+    def test_a_lost_connection_ends_the_trace(self):
+        client = self.connect()
+        client.result("createReportingSession", 7)
+        client.result("setServiceType", TEST, 7)
+        client.result("setConfiguration",
+                      {"HYReportingLoomisPlistFilePath": os.path.abspath(PARAMETERS)}, 7)
+        client.result("startReportingSessionForID", 7)
+        client.close()
+        self.daemon.wait_for(lambda: os.path.exists(self.traces("tracing_results.pbj")))
+        self.daemon.wait_for(lambda: not traces_of(self.daemon.process.pid))
+
+    def performance_session(self):
+        client = self.connect()
+        client.result("createReportingSession", 7)
+        client.result("setServiceType", TEST, 7)
+        client.result("setConfiguration",
+                      {"HYReportingTraceType": "evtap",
+                       "HYReportingLoomisPlistFilePath": os.path.abspath(PARAMETERS)}, 7)
+        client.result("startReportingSessionForID", 7)
+        return client
+
+    def test_a_clients_evtap_takes_a_performance_trace(self):
+        client = self.performance_session()
+        client.result("stopReportingSessionForID", 7)
+        self.daemon.wait_for(lambda: "started performance trace." in self.daemon.log())
+        self.assertFalse(os.path.exists(self.traces("tracing_results.pbj")))
+        self.assertEqual(traces_of(self.daemon.process.pid), [])
+
+    @unittest.skipUnless(trace_cmd_works(), "no trace-cmd that works on this kernel")
+    def test_a_performance_trace_leaves_its_file(self):
+        client = self.performance_session()
+        self.daemon.wait_for(lambda: traces_of(self.daemon.process.pid))
+        client.result("stopReportingSessionForID", 7)
+        [trace] = glob.glob(self.traces("*.dat"))
+        self.assertGreater(os.path.getsize(trace), 0)
+        self.daemon.wait_for(
+            lambda: "Performance Trace Completed: " + trace in self.daemon.log())
+
+
+if __name__ == "__main__":
+    unittest.main()
