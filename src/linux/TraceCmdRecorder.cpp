@@ -60,6 +60,7 @@ private:
     void makeRoom() const;
     MaybeError record(ChildProcess& child);
     void removeInstance() const;
+    void removeFiles() const;
 
     const TraceCmdRecorder::Options options_;
     const std::string name_;
@@ -127,6 +128,9 @@ void Recording::run() {
     }
     const MaybeError error = record(child);
     removeInstance();
+    if (error) {
+        removeFiles();
+    }
     if (const auto told = delegate()) {
         told->performanceTraceDidStop(error);
         told->performanceTraceDidComplete(error ? "" : file_.string(), name_, error);
@@ -157,6 +161,20 @@ void Recording::removeInstance() const {
     const fs::path instance = options_.tracefs / "instances" / name_;
     (void)writeTracefs(instance / "events/enable", "0");
     (void)::rmdir(instance.c_str());
+}
+
+// Of a recorder that failed: its parts for each processor.
+void Recording::removeFiles() const {
+    std::error_code error;
+    std::vector<fs::path> parts;
+    for (const auto& entry : fs::directory_iterator(options_.directory, error)) {
+        if (entry.path().filename().string().starts_with(name_ + kExtension)) {
+            parts.push_back(entry.path());
+        }
+    }
+    for (const fs::path& part : parts) {
+        fs::remove(part, error);
+    }
 }
 
 class TraceCmdSession final : public platform::PerformanceTraceSession {
