@@ -1,13 +1,22 @@
 #include "common/Description.h"
 
 #include <algorithm>
+#include <array>
 #include <chrono>
+#include <fmt/compile.h>
 #include <fmt/format.h>
 
 namespace halyard {
 namespace {
 
 constexpr int kIndent = 4;
+
+// Room for the longest shortest form of a double, and some.
+using DecimalBuffer = std::array<char, 40>;
+
+void appendInteger(std::string& out, const fmt::format_int& digits) {
+    out.append(digits.data(), digits.size());
+}
 
 bool isPlain(char c) noexcept {
     return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '_' ||
@@ -51,16 +60,30 @@ void appendQuoted(std::string& out, std::string_view text) {
 
 void appendNested(std::string& out, const Value& value, int depth);
 
+void appendText(std::string& out, std::string_view text) {
+    if (needsQuotes(text)) {
+        appendQuoted(out, text);
+    } else {
+        out += text;
+    }
+}
+
 void appendElement(std::string& out, const Value& value, int depth) {
     if (value.isList() || value.isDictionary()) {
         appendNested(out, value, depth);
         return;
     }
-    const std::string text = describe(value);
-    if (needsQuotes(text)) {
-        appendQuoted(out, text);
-    } else {
-        out += text;
+    if (value.isString()) {
+        appendText(out, value.text());
+        return;
+    }
+    const std::size_t start = out.size();
+    appendDescription(out, value);
+    const std::string_view text = std::string_view(out).substr(start);
+    if (needsQuotes(text)) { // A date, or a number with a "+" in it.
+        const std::string copy(text);
+        out.resize(start);
+        appendQuoted(out, copy);
     }
 }
 
@@ -69,7 +92,7 @@ void appendNested(std::string& out, const Value& value, int depth) {
     const std::size_t inner = outer + kIndent;
     if (value.isList()) {
         out += "(\n";
-        const List list = value.list();
+        const std::span<const Value> list = List::itemsOf(value);
         for (std::size_t i = 0; i < list.size(); ++i) {
             out.append(inner, ' ');
             appendElement(out, list[i], depth + 1);
@@ -79,8 +102,7 @@ void appendNested(std::string& out, const Value& value, int depth) {
         return;
     }
     out += "{\n";
-    const Dictionary dictionary = value.dictionary();
-    for (const auto* entry : sortedEntries(dictionary)) {
+    for (const auto* entry : sortedEntries(Dictionary::entriesOf(value))) {
         out.append(inner, ' ');
         appendElement(out, entry->key, depth + 1);
         out += " = ";
@@ -90,8 +112,9 @@ void appendNested(std::string& out, const Value& value, int depth) {
     out.append(outer, ' ').append("}");
 }
 
-template <class Real> std::string shortest(Real value) {
-    return fmt::format("{}", value);
+template <class Real> std::string_view shortest(Real value, DecimalBuffer& buffer) {
+    const auto end = fmt::format_to(buffer.data(), FMT_COMPILE("{}"), value);
+    return {buffer.data(), static_cast<std::size_t>(end - buffer.data())};
 }
 
 struct CivilTime {
@@ -125,11 +148,13 @@ CivilTime civilTime(std::int64_t seconds) {
 } // namespace
 
 std::string shortestDecimal(double value) {
-    return shortest(value);
+    DecimalBuffer buffer;
+    return std::string(shortest(value, buffer));
 }
 
 std::string shortestDecimal(float value) {
-    return shortest(value);
+    DecimalBuffer buffer;
+    return std::string(shortest(value, buffer));
 }
 
 std::string describe(Date date) {
@@ -150,22 +175,23 @@ std::string rfc3339(Date date) {
 }
 
 void appendDescription(std::string& out, const Value& value) {
+    DecimalBuffer buffer;
     switch (value.kind()) {
     case Value::Kind::None:
         out += "(null)";
         break;
     case Value::Kind::Bool:
     case Value::Kind::Int:
-        out += fmt::format_int(value.integerValue()).c_str();
+        appendInteger(out, fmt::format_int(value.integerValue()));
         break;
     case Value::Kind::UInt:
-        out += fmt::format_int(value.unsignedValue()).c_str();
+        appendInteger(out, fmt::format_int(value.unsignedValue()));
         break;
     case Value::Kind::Float:
-        out += shortestDecimal(value.floatValue());
+        out += shortest(value.floatValue(), buffer);
         break;
     case Value::Kind::Double:
-        out += shortestDecimal(value.doubleValue());
+        out += shortest(value.doubleValue(), buffer);
         break;
     case Value::Kind::String:
         out += value.text();

@@ -148,7 +148,7 @@ TEST(DictionaryTest, CopiesShareTheirContents) {
 TEST(DictionaryTest, SortedEntriesFollowTheBytesOfTheKeys) {
     const Dictionary dictionary{{"b", 1}, {"a", 2}, {"B", 3}, {"\xC3\xA4", 4}};
     std::string keys;
-    for (const auto* entry : sortedEntries(dictionary)) {
+    for (const auto* entry : sortedEntries({dictionary.begin(), dictionary.end()})) {
         keys += entry->key.text();
     }
     EXPECT_EQ(keys, "Bab\xC3\xA4");

@@ -60,14 +60,14 @@ template <class Writer> void writeValue(Writer& writer, const Value& value) {
         break;
     case Value::Kind::List:
         writer.StartArray();
-        for (const Value& item : value.list()) {
+        for (const Value& item : List::itemsOf(value)) {
             writeValue(writer, item);
         }
         writer.EndArray();
         break;
     case Value::Kind::Dictionary:
         writer.StartObject();
-        for (const auto& entry : value.dictionary()) {
+        for (const auto& entry : Dictionary::entriesOf(value)) {
             writeText(writer, entry.key.text());
             writeValue(writer, entry.value);
         }

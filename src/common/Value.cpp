@@ -278,6 +278,24 @@ bool numbersEqual(const Value& left, const Value& right) noexcept {
 
 } // namespace
 
+// Null stands for an empty dictionary.
+static bool equalBlocks(const DictionaryBlock* left, const DictionaryBlock* right) noexcept {
+    const std::size_t size = left != nullptr ? left->entries.size() : 0;
+    if (size != (right != nullptr ? right->entries.size() : 0)) {
+        return false;
+    }
+    for (std::size_t i = 0; i < size; ++i) {
+        const Dictionary::Entry& entry = left->entries[i];
+        // Messages of one kind carry their keys in one order: try that first.
+        const Dictionary::Entry* counterpart =
+            right->entries[i].key == entry.key ? &right->entries[i] : right->find(entry.key.text());
+        if (counterpart == nullptr || !(entry.value == counterpart->value)) {
+            return false;
+        }
+    }
+    return true;
+}
+
 bool operator==(const Value& left, const Value& right) noexcept {
     if (left.isNumber()) {
         return right.isNumber() && numbersEqual(left, right);
@@ -294,9 +312,10 @@ bool operator==(const Value& left, const Value& right) noexcept {
     case Value::Kind::Date:
         return left.date() == right.date();
     case Value::Kind::List:
-        return left.list() == right.list();
+        return std::ranges::equal(List::itemsOf(left), List::itemsOf(right));
     case Value::Kind::Dictionary:
-        return left.dictionary() == right.dictionary();
+        return equalBlocks(left.onHeap() ? left.wide_.dictionary : nullptr,
+                           right.onHeap() ? right.wide_.dictionary : nullptr);
     default:
         return true;
     }
@@ -348,6 +367,13 @@ void List::append(Value value) {
         *this = List(std::move(copy));
     }
     holder_.wide_.list->items.push_back(std::move(value));
+}
+
+std::span<const Value> List::itemsOf(const Value& value) noexcept {
+    if (!value.isList() || !value.onHeap()) {
+        return {};
+    }
+    return value.wide_.list->items;
 }
 
 bool operator==(const List& left, const List& right) noexcept {
@@ -534,26 +560,20 @@ void Dictionary::merge(const Dictionary& other) {
 }
 
 bool operator==(const Dictionary& left, const Dictionary& right) noexcept {
-    if (left.size() != right.size()) {
-        return false;
-    }
-    const auto* other = right.begin();
-    for (const Dictionary::Entry& entry : left) {
-        // Messages of one kind carry their keys in one order: try that first.
-        const Value* counterpart =
-            other->key == entry.key ? &other->value : right.find(entry.key.text());
-        if (counterpart == nullptr || !(entry.value == *counterpart)) {
-            return false;
-        }
-        ++other;
-    }
-    return true;
+    return equalBlocks(left.block(), right.block());
 }
 
-std::vector<const Dictionary::Entry*> sortedEntries(const Dictionary& dictionary) {
+std::span<const Dictionary::Entry> Dictionary::entriesOf(const Value& value) noexcept {
+    if (!value.isDictionary() || !value.onHeap()) {
+        return {};
+    }
+    return value.wide_.dictionary->entries;
+}
+
+std::vector<const Dictionary::Entry*> sortedEntries(std::span<const Dictionary::Entry> entries) {
     std::vector<const Dictionary::Entry*> sorted;
-    sorted.reserve(dictionary.size());
-    for (const auto& entry : dictionary) {
+    sorted.reserve(entries.size());
+    for (const auto& entry : entries) {
         sorted.push_back(&entry);
     }
     std::sort(sorted.begin(), sorted.end(),

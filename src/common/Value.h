@@ -18,6 +18,7 @@
 #include <cstdint>
 #include <initializer_list>
 #include <limits>
+#include <span>
 #include <string>
 #include <string_view>
 #include <type_traits>
@@ -201,6 +202,10 @@ public:
 
     void append(Value value);
 
+    // The items of a value, borrowed from it: walking what other threads share
+    // without touching its reference count. Empty unless it is a list.
+    static std::span<const Value> itemsOf(const Value& value) noexcept;
+
     friend bool operator==(const List& left, const List& right) noexcept;
 
 private:
@@ -245,6 +250,9 @@ public:
     // Sets every entry of `other` here, in its order.
     void merge(const Dictionary& other);
 
+    // As List::itemsOf, in the order of insertion.
+    static std::span<const Entry> entriesOf(const Value& value) noexcept;
+
     friend bool operator==(const Dictionary& left, const Dictionary& right) noexcept;
 
 private:
@@ -255,6 +263,6 @@ private:
 };
 
 // Sorted pairs, for the writers whose output must not depend on insertion order.
-std::vector<const Dictionary::Entry*> sortedEntries(const Dictionary& dictionary);
+std::vector<const Dictionary::Entry*> sortedEntries(std::span<const Dictionary::Entry> entries);
 
 } // namespace halyard

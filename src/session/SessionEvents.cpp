@@ -10,19 +10,23 @@ namespace {
 constexpr const char* kSummaryKey = "HY_Session_Summary_Event";
 constexpr std::uint32_t kVolumeDigits = 4;
 
-void remember(const Dictionary& message, std::string_view key, Value& last) {
-    if (const Value* value = message.find(key)) {
-        last = *value;
-    }
-}
-
 } // namespace
 
 void VolumeStretches::take(const Dictionary& message) {
-    remember(message, HYReportingMessageKeySelectedFormat, format_);
-    remember(message, HYReportingMessageKeyActiveDevices, devices_);
-    remember(message, HYReportingMessageKeyVolumeProcess, process_);
-    if (const Value* volume = message.find(HYReportingMessageKeyVolume)) {
+    const Value* volume = nullptr;
+    for (const auto& [name, value] : message) {
+        const std::string_view key = name.text();
+        if (key == HYReportingMessageKeyVolume) {
+            volume = &value;
+        } else if (key == HYReportingMessageKeySelectedFormat) {
+            format_ = value;
+        } else if (key == HYReportingMessageKeyActiveDevices) {
+            devices_ = value;
+        } else if (key == HYReportingMessageKeyVolumeProcess) {
+            process_ = value;
+        }
+    }
+    if (volume != nullptr) {
         takeVolume(*volume, message);
     }
 }

@@ -21,12 +21,13 @@
 
 namespace halyard {
 
-inline constexpr const char* HYReportingMessageKeySelectedFormat = "session_selected_format";
-inline constexpr const char* HYReportingMessageKeyActiveDevices = "active_devices";
-inline constexpr const char* HYReportingMessageKeyVolumeProcess = "VQSessionVolumeOperationProcess";
-inline constexpr const char* HYReportingMessageKeyVolume = "VQSessionVolume";
-inline constexpr const char* HYReportingMessageKeyPlayingState = "VQSessionVolumePlayingState";
-inline constexpr const char* HYReportingMessageKeyHYTimestamp = "hyreporting_timestamp";
+inline constexpr std::string_view HYReportingMessageKeySelectedFormat = "session_selected_format";
+inline constexpr std::string_view HYReportingMessageKeyActiveDevices = "active_devices";
+inline constexpr std::string_view HYReportingMessageKeyVolumeProcess =
+    "VQSessionVolumeOperationProcess";
+inline constexpr std::string_view HYReportingMessageKeyVolume = "VQSessionVolume";
+inline constexpr std::string_view HYReportingMessageKeyPlayingState = "VQSessionVolumePlayingState";
+inline constexpr std::string_view HYReportingMessageKeyHYTimestamp = "hyreporting_timestamp";
 
 // One event for each stretch that lasted longer than `minimumPlaytime` seconds.
 // A stretch that still plays at the end has none: nothing says when it ended.
