@@ -1,7 +1,7 @@
 // MessagePack-RPC, the server's and the client's side of it: bytes to calls and
 // answers, and back. No sockets here.
 //
-// Format: the MessagePack and MessagePack-RPC specifications (msgpack.org).
+// Format: MessagePack and MessagePack-RPC, as msgpack.org describes them.
 #pragma once
 
 #include <cstddef>
