@@ -6,18 +6,14 @@
 #include <string_view>
 #include <variant>
 
+#include "Require.h"
 #include "linux/ChannelSource.h"
 #include "linux/SourceText.h"
 
+using halyard::fuzz::require;
 using namespace halyard::linux_;
 
 namespace {
-
-void require(bool holds) {
-    if (!holds) {
-        std::abort();
-    }
-}
 
 void checkStates(const std::optional<SourceStates>& states) {
     require(!states || (!states->empty() && states->size() <= kMaxSourceStates));

@@ -6,21 +6,13 @@
 #include <string_view>
 #include <variant>
 
+#include "Require.h"
 #include "common/Description.h"
 #include "common/PropertyListText.h"
 
 using halyard::Error;
 using halyard::Value;
-
-namespace {
-
-void require(bool holds) {
-    if (!holds) {
-        std::abort();
-    }
-}
-
-} // namespace
+using halyard::fuzz::require;
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     const auto first = halyard::parsePropertyListText({reinterpret_cast<const char*>(data), size});

@@ -6,18 +6,14 @@
 #include <string_view>
 #include <variant>
 
+#include "Require.h"
 #include "linux/Settings.h"
 
+using halyard::fuzz::require;
 using halyard::linux_::ParsedSettings;
 using halyard::linux_::SettingsError;
 
 namespace {
-
-void require(bool holds) {
-    if (!holds) {
-        std::abort();
-    }
-}
 
 void check(const ParsedSettings& parsed) {
     using namespace halyard::linux_;

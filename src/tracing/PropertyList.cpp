@@ -8,6 +8,7 @@
 #include <string>
 
 #include "common/PropertyListText.h"
+#include "tracing/BinaryPropertyListExtent.h"
 
 namespace halyard {
 namespace {
@@ -56,6 +57,11 @@ bool isTooDeepXml(std::string_view bytes) {
     return false;
 }
 
+bool isSaneBinary(std::string_view bytes) {
+    BinaryPropertyListExtent extent(bytes, kMostPropertyListLevels, kMostPropertyListBytes);
+    return extent.measure().has_value();
+}
+
 std::string dataText(plist_t node) {
     std::uint64_t length = 0;
     const char* const bytes = plist_get_data_ptr(node, &length);
@@ -71,11 +77,17 @@ Value valueOf(plist_t node, int level);
 
 Value listOf(plist_t node, int level) {
     List list;
-    const std::uint32_t size = plist_array_get_size(node);
-    for (std::uint32_t i = 0; i < size; ++i) {
-        list.append(valueOf(plist_array_get_item(node, i), level + 1));
+    plist_array_iter cursor = nullptr;
+    plist_array_new_iter(node, &cursor);
+    const std::unique_ptr<void, decltype(&std::free)> owned(cursor, &std::free);
+    for (;;) {
+        plist_t item = nullptr;
+        plist_array_next_item(node, cursor, &item);
+        if (item == nullptr) {
+            return list;
+        }
+        list.append(valueOf(item, level + 1));
     }
-    return list;
 }
 
 Value dictionaryOf(plist_t node, int level) {
@@ -160,12 +172,13 @@ std::variant<Value, Error> parseWithLibrary(std::string_view bytes, bool binary)
 } // namespace
 
 std::variant<Value, Error> parsePropertyList(std::string_view bytes) {
-    const bool binary = bytes.starts_with(kBinaryMagic);
-    if (bytes.size() > (binary ? kMostBinaryPropertyListBytes : kMostPropertyListBytes)) {
+    if (bytes.size() > kMostPropertyListBytes) {
         return propertyListError("too large");
     }
-    if (binary) {
-        return parseWithLibrary(bytes, true);
+    if (bytes.starts_with(kBinaryMagic)) {
+        return isSaneBinary(bytes)
+                   ? parseWithLibrary(bytes, true)
+                   : propertyListError("a binary property list that is damaged or too large");
     }
     if (!beginsXml(bytes)) {
         return parsePropertyListText(bytes);

@@ -11,7 +11,6 @@ namespace halyard {
 
 // More levels, or more bytes, are an error: these files name a few hundred events.
 inline constexpr std::size_t kMostPropertyListBytes = 1024 * 1024;
-inline constexpr std::size_t kMostBinaryPropertyListBytes = 32 * 1024;
 
 // The value, which is never none, or what is wrong with it. Any thread.
 [[nodiscard]] std::variant<Value, Error> parsePropertyList(std::string_view bytes);
