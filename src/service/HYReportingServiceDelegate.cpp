@@ -232,20 +232,27 @@ void HYReportingServiceDelegate::stopAllSessions() {
 Dictionary HYReportingServiceDelegate::status() const {
     std::int64_t sessions = 0;
     std::int64_t started = 0;
-    std::uint64_t repeats = repeatsOfRetiredSessions_;
+    std::uint64_t repeats = repeatsOfRetiredSessions_.load();
+    List waiting;
+    const auto now = platform::current().clock->steadyTime();
     const auto clients = getAllClients();
     for (const Client& client : clients) {
         for (const Session& session : sessionsOf(*client)) {
             ++sessions;
             started += session->started() ? 1 : 0;
             repeats += session->redundantMessages();
+            if (const auto since = session->stopWaitsSince()) {
+                waiting.append(
+                    Dictionary{{"pid", client->processIdentifier()},
+                               {"session", session->reporterID()},
+                               {"seconds", std::chrono::duration<double>(now - *since).count()}});
+            }
         }
     }
-    return Dictionary{{"connections", clients.size()},
-                      {"sessions", sessions},
-                      {"sessions_started", started},
-                      {"active_session_count", activeSessionCount_},
-                      {"repeats_dropped", repeats}};
+    return Dictionary{
+        {"connections", clients.size()}, {"sessions", sessions},
+        {"sessions_started", started},   {"active_session_count", activeSessionCount_.load()},
+        {"stops_waiting", waiting},      {"repeats_dropped", repeats}};
 }
 
 } // namespace halyard

@@ -7,6 +7,7 @@
 // delivery threads may use.
 #pragma once
 
+#include <atomic>
 #include <cstdint>
 #include <memory>
 #include <optional>
@@ -49,14 +50,15 @@ public:
     void handleEventForIBX(const Dictionary& message, AudioEventCategory category,
                            std::uint16_t type, const Session& session,
                            const std::optional<std::string>& processName) override;
-    std::int64_t activeSessionCount() const override { return activeSessionCount_; }
-    void setActiveSessionCount(std::int64_t count) override { activeSessionCount_ = count; }
+    std::int64_t activeSessionCount() const override { return activeSessionCount_.load(); }
+    void setActiveSessionCount(std::int64_t count) override { activeSessionCount_.store(count); }
 
     // The master switch, which nothing in the daemon ever turns off.
     void setReportingEnabled(bool enabled) { reportingEnabled_ = enabled; }
     const std::shared_ptr<platform::SerialQueue>& serviceQueue() const { return serviceQueue_; }
 
-    // What operators see; on the service work queue.
+    // What operators see; the keys are listed in docs/wire.md. Any thread, but a
+    // whole only on the service work queue.
     Dictionary status() const;
     // Ends every session as a lost connection does. On the service work queue.
     void stopAllSessions();
@@ -72,8 +74,9 @@ private:
     std::shared_ptr<platform::SerialQueue> serviceQueue_;
     bool reportingEnabled_ = true;
     const Dictionary defaults_;
-    std::int64_t activeSessionCount_ = 0;
-    std::uint64_t repeatsOfRetiredSessions_ = 0;
+    // Written on the service work queue only.
+    std::atomic<std::int64_t> activeSessionCount_{0};
+    std::atomic<std::uint64_t> repeatsOfRetiredSessions_{0};
     std::vector<FeatureRecord> features_;
     std::unique_ptr<HYReportingDriverUtility> driverUtility_;
     // Null but on internal builds.

@@ -1,5 +1,8 @@
 #include "service/RequestDispatch.h"
 
+#include <atomic>
+#include <chrono>
+
 #include "platform/Device.h"
 #include "platform/Operations.h"
 #include "platform/Platform.h"
@@ -9,6 +12,9 @@ namespace halyard {
 namespace {
 
 using protocol::Method;
+
+// How long the status waits for its turn.
+constexpr std::chrono::seconds kStatusPatience{1};
 
 BoolReply boolReply(protocol::Reply reply) {
     return [reply = std::move(reply)](const MaybeError& error, bool success) {
@@ -81,14 +87,23 @@ void RequestDispatch::handleAdministration(protocol::Request request) {
     }
 }
 
+// After the requests before it, so that they are in it; when something holds the
+// service up, operators learn what, instead of waiting as well.
 void RequestDispatch::answerStatus(const protocol::Reply& reply) const {
-    serviceQueue_->async([reply, service = service_] {
+    auto answer = [reply, service = service_, given = std::make_shared<std::atomic_flag>()] {
+        if (given->test_and_set()) {
+            return;
+        }
         Dictionary status = platform::current().operations->status();
         if (const auto alive = service.lock()) {
             status.merge(alive->status());
         }
         reply(std::nullopt, status);
-    });
+    };
+    serviceQueue_->async(answer);
+    platform::current()
+        .queues->makeSerialQueue("com.kestrel.halyard.status", platform::QueuePriority::Utility)
+        ->asyncAfter(kStatusPatience, std::move(answer));
 }
 
 } // namespace halyard

@@ -177,7 +177,37 @@ TEST_F(RequestDispatchTest, TheStatusJoinsTheAdaptersCountersAndTheServices) {
                                                {"sessions", 2},
                                                {"sessions_started", 1},
                                                {"active_session_count", 1},
+                                               {"stops_waiting", List()},
                                                {"repeats_dropped", 1}}));
+}
+
+TEST_F(RequestDispatchTest, TheStatusShowsAStopThatWaitsForItsTraceWhileAllElseWaits) {
+    platform_.featureFlags.flags[{"AudioAnalytics", "Tracing"}] = true;
+    platform_.performanceTraces.completes = false;
+    const Peer other = connect(200, "mixer");
+    std::shared_ptr<testing::Answer> status;
+    std::shared_ptr<testing::Answer> create;
+    platform_.conditions.onWait = [&] {
+        status = other.ask(Method::AdminStatus);
+        create = other.create(9);
+        EXPECT_FALSE(status->given());
+        platform_.queues.advance(std::chrono::seconds(1));
+        EXPECT_TRUE(status->given());
+        EXPECT_FALSE(create->given());
+        platform_.performanceTraces.sessions[0]->delegate.lock()->performanceTraceDidComplete(
+            "/traces/one.dat", "one", std::nullopt);
+        return true;
+    };
+    const Peer tester = connect(100);
+    tester.create(7);
+    tester.setServiceType(kAudioServiceTypeTest, 7);
+    tester.start(7);
+    EXPECT_TRUE(succeeded(tester.stop(7)));
+    ASSERT_NE(status, nullptr);
+    EXPECT_EQ(status->result.dictionary()["stops_waiting"],
+              Value(List{Value(Dictionary{{"pid", 100}, {"session", 7}, {"seconds", 1.0}})}));
+    EXPECT_TRUE(create->given());
+    EXPECT_EQ(tester.ask(Method::AdminStatus)->result.dictionary()["stops_waiting"], Value(List()));
 }
 
 TEST_F(RequestDispatchTest, TheStatusOfAGoneServiceIsThatOfTheAdapters) {

@@ -20,6 +20,7 @@
 #include "common/HYReportingUtility.h"
 #include "common/Mutex.h"
 #include "common/Value.h"
+#include "platform/Clock.h"
 #include "platform/HWReport.h"
 #include "platform/PerformanceTrace.h"
 #include "platform/RelayReporting.h"
@@ -147,6 +148,9 @@ public:
     void setupTracing(const std::string* fileName) HY_EXCLUDES(stateMutex_);
     std::optional<std::string> tracingFileName() const HY_EXCLUDES(stateMutex_);
     bool startedTracing() const { return startedTracing_.load(); }
+    // Since when a stop waits for its trace to complete, which has no limit; none
+    // while none does.
+    std::optional<platform::SteadyTime> stopWaitsSince() const HY_EXCLUDES(stateMutex_);
     // Where the last performance trace lies; empty before.
     std::string getPSTraceFileURL() const HY_EXCLUDES(stateMutex_);
 
@@ -197,6 +201,8 @@ private:
     void startTracing();
     void startPerformanceTrace() HY_EXCLUDES(stateMutex_);
     void stopTracing();
+    void waitForTrace();
+    void setStopWaitsSince(std::optional<platform::SteadyTime> since) HY_EXCLUDES(stateMutex_);
     std::shared_ptr<platform::PerformanceTraceSession> traceSession() const
         HY_EXCLUDES(stateMutex_);
     void dropTraceSession() HY_EXCLUDES(stateMutex_);
@@ -231,6 +237,7 @@ private:
     std::optional<platform::PerformanceTraceConfig> traceConfig_ HY_GUARDED_BY(stateMutex_);
     std::shared_ptr<platform::PerformanceTraceSession> traceSession_ HY_GUARDED_BY(stateMutex_);
     std::string finalTraceURL_ HY_GUARDED_BY(stateMutex_);
+    std::optional<platform::SteadyTime> stopWaitsSince_ HY_GUARDED_BY(stateMutex_);
 
     mutable Mutex batchMutex_;
     // Null while the session is not started.

@@ -105,6 +105,12 @@ void HYReportingSession::stopTracing() {
         return;
     }
     startedTracing_.store(false);
+    setStopWaitsSince(platform::current().clock->steadyTime());
+    waitForTrace();
+    setStopWaitsSince(std::nullopt);
+}
+
+void HYReportingSession::waitForTrace() {
     if (tracingFileName()) {
         traceRunner_->stopTracingandProcessResults();
         return;
@@ -113,6 +119,16 @@ void HYReportingSession::stopTracing() {
         running->stopPerformanceTrace();
     }
     mTraceDispatchSemaphore_.wait();
+}
+
+std::optional<platform::SteadyTime> HYReportingSession::stopWaitsSince() const {
+    const MutexLock lock(stateMutex_);
+    return stopWaitsSince_;
+}
+
+void HYReportingSession::setStopWaitsSince(std::optional<platform::SteadyTime> since) {
+    const MutexLock lock(stateMutex_);
+    stopWaitsSince_ = since;
 }
 
 void HYReportingSession::performanceTraceDidStart(const MaybeError& error) {

@@ -27,6 +27,7 @@ public:
     }
 
     std::vector<std::shared_ptr<State>> sessions;
+    bool completes = true; // when it is stopped; else somebody calls the delegate
     MaybeError startError; // completes, too
     MaybeError stopError;
     MaybeError completeError;
@@ -53,7 +54,10 @@ private:
             ++state_->stopped;
             const auto delegate = state_->delegate.lock();
             delegate->performanceTraceDidStop(owner_.stopError);
-            delegate->performanceTraceDidComplete("/traces/one.dat", "one", owner_.completeError);
+            if (owner_.completes) {
+                delegate->performanceTraceDidComplete("/traces/one.dat", "one",
+                                                      owner_.completeError);
+            }
         }
 
     private:

@@ -37,13 +37,19 @@ public:
         return true;
     }
 
-    bool suspended() const { return suspended_; }
+    void run(const platform::Task& task) {
+        running_ = true;
+        task();
+        running_ = false;
+    }
+    bool ready() const { return !suspended_ && !running_; }
     const std::string& name() const { return name_; }
 
 private:
     ManualQueues& owner_;
     std::string name_;
     bool suspended_ = false;
+    bool running_ = false;
     int waits_ = 0;
 };
 
@@ -64,13 +70,13 @@ platform::WorkQueue& ManualQueues::backgroundQueue() {
 
 bool ManualQueues::runOne() {
     const auto next = std::find_if(ready_.begin(), ready_.end(),
-                                   [](const Ready& ready) { return !ready.queue->suspended(); });
+                                   [](const Ready& ready) { return ready.queue->ready(); });
     if (next == ready_.end()) {
         return false;
     }
     const Ready running = std::move(*next);
     ready_.erase(next);
-    running.task();
+    running.queue->run(running.task);
     return true;
 }
 

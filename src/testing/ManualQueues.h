@@ -26,8 +26,8 @@ public:
     makeSerialQueue(std::string_view name, platform::QueuePriority priority) override;
     platform::WorkQueue& backgroundQueue() override;
 
-    // Runs the oldest ready task of any queue that is not suspended; false when
-    // there is none.
+    // Runs the oldest ready task of any queue that is not suspended, nor running
+    // the task that calls this; false when there is none.
     bool runOne();
     void runUntilIdle();
     // Drops what is pending.

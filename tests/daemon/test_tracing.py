@@ -12,15 +12,20 @@ import statistics
 import subprocess
 import tempfile
 import unittest
+import unittest.mock
 
 from harness import DaemonTest, PATIENCE
 
 TRACEFS = "/sys/kernel/tracing"
 PARAMETERS = os.path.join(os.path.dirname(__file__), "../../docs/examples/audio-trace.plist")
 TEST = 11
-# What a mark costs while it is traced, and what a loaded machine adds to that.
+# What the marks cost while they are traced, and what a loaded machine adds to
+# that. The slowest quarter may hold anything: a thread may lose its processor
+# between a mark and its own clock.
 TOLERANCE_NS = 20_000
 TOLERANCE_SHARE = 0.05
+# Both clocks are CLOCK_MONOTONIC, of which the kernel traces by an approximation.
+CLOCKS_APART_NS = 1_000
 
 
 def traces_of(pid):
@@ -78,9 +83,14 @@ class Tracing(DaemonTest):
         self.assertEqual({item: len(values) for item, values in traced.items()},
                          {item: len(values) for item, values in measured.items()})
         for item, values in measured.items():
-            expected = statistics.median(values)
-            self.assertAlmostEqual(statistics.median(traced[item]), expected, msg=item,
-                                   delta=TOLERANCE_NS + expected * TOLERANCE_SHARE)
+            inner = sorted(values)
+            outer = sorted(traced[item])
+            # A traced stretch holds the measured one, so no rank is shorter.
+            for own, mark in zip(inner, outer):
+                self.assertGreaterEqual(mark, own - CLOCKS_APART_NS, item)
+            for own, mark in zip(statistics.quantiles(inner, n=8)[:-1],
+                                 statistics.quantiles(outer, n=8)[:-1]):
+                self.assertLessEqual(mark, own + TOLERANCE_NS + own * TOLERANCE_SHARE, item)
 
     def test_the_results_agree_with_what_the_program_measured(self):
         measured = self.work()
@@ -160,6 +170,54 @@ class Tracing(DaemonTest):
         self.assertGreater(os.path.getsize(trace), 0)
         self.daemon.wait_for(
             lambda: "Performance Trace Completed: " + trace in self.daemon.log())
+
+
+# In the place of trace-cmd: does not end before it is let.
+SLOW_RECORDER = """#!/bin/sh
+trap '' INT
+while [ ! -e "$RELEASE_RECORDER" ]; do sleep 0.02; done
+while [ "$1" != -o ]; do shift; done
+echo trace > "$2"
+"""
+
+
+class SlowTraces(DaemonTest):
+    configuration = Tracing.configuration
+
+    def setUp(self):
+        programs = tempfile.TemporaryDirectory()
+        self.addCleanup(programs.cleanup)
+        recorder = os.path.join(programs.name, "trace-cmd")
+        with open(recorder, "w", encoding="ascii") as file:
+            file.write(SLOW_RECORDER)
+        os.chmod(recorder, 0o755)
+        self.release = os.path.join(programs.name, "release")
+        environment = {"PATH": programs.name + ":" + os.environ["PATH"],
+                       "RELEASE_RECORDER": self.release}
+        with unittest.mock.patch.dict(os.environ, environment):
+            super().setUp()
+
+    def test_the_status_shows_a_stop_that_waits_and_all_else_goes_on_after_it(self):
+        tester, other = self.connect(), self.connect()
+        tester.session(7, TEST)
+        self.daemon.wait_for(lambda: "Performance Trace Started" in self.daemon.log())
+        self.assertEqual(other.result("admin.status")["stops_waiting"], [])
+        stop = tester.start("stopReportingSessionForID", 7)
+        create = other.start("createReportingSession", 9)
+
+        def waiting():
+            return other.result("admin.status")["stops_waiting"]
+
+        self.daemon.wait_for(waiting)
+        [waits] = waiting()
+        self.assertEqual((waits["session"], waits["pid"]), (7, os.getpid()))
+        self.assertGreater(waits["seconds"], 0)
+        self.assertNotIn(create, other.answers)  # one request after the other
+        with open(self.release, "wb"):
+            pass
+        self.assertEqual(tester.answer(stop), [None, True])
+        self.assertEqual(other.answer(create), [None, True])
+        self.assertEqual(waiting(), [])
 
 
 if __name__ == "__main__":
