@@ -10,7 +10,8 @@ BUILD_PACKAGES := g++ cmake ninja-build ccache pkg-config python3 \
 # What the demonstration plays with.
 RUN_PACKAGES := pipewire pipewire-bin pipewire-pulse libspa-0.2-modules wireplumber \
 	sox espeak-ng sqlite3 procps
-TEST_PACKAGES := libmsgpack-cxx-dev libgtest-dev libgmock-dev libbenchmark-dev clang-format python3-msgpack \
+TEST_PACKAGES := libmsgpack-cxx-dev libgtest-dev libgmock-dev libbenchmark-dev libsndfile1-dev \
+	clang-format python3-msgpack \
 	neovim
 CHECK_PACKAGES := clang clang-tidy libclang-rt-14-dev
 BENCH_PACKAGES := libmsgpack-cxx-dev libbenchmark-dev sqlite3
@@ -24,6 +25,8 @@ TIDY ?=
 # `make run KEEP=DIR` leaves the demonstration's directories there.
 KEEP ?=
 
+# Tests of kernel event traces need a tracefs, which few containers mount.
+CTEST := tools/with-tracefs.sh ctest
 CTEST_FLAGS := --output-on-failure --no-label-summary --parallel $(TEST_JOBS)
 # ThreadSanitizer of these compilers does not cope with more than 28 bits of
 # address space randomisation, which newer kernels use.
@@ -48,7 +51,7 @@ run:
 test: deps
 	cmake --preset test
 	cmake --build --preset test --parallel $(JOBS)
-	ctest --preset test $(CTEST_FLAGS)
+	$(CTEST) --preset test $(CTEST_FLAGS)
 
 check: deps
 	@tools/install-deps.sh $(CHECK_PACKAGES)
@@ -57,7 +60,7 @@ check: deps
 		wrapper=; case $$preset in *-tsan) wrapper="$(FIXED_ADDRESSES)";; esac; \
 		cmake --preset $$preset; \
 		$$wrapper cmake --build --preset $$preset --parallel $(JOBS); \
-		$$wrapper ctest --preset $$preset $(CTEST_FLAGS); \
+		$$wrapper $(CTEST) --preset $$preset $(CTEST_FLAGS); \
 	done
 	$(MAKE) fuzz
 	$(if $(TIDY),$(MAKE) tidy)

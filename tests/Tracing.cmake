@@ -1,7 +1,11 @@
 # Traces of a real program through the real daemon, where the system lets us.
 
-add_executable(traced_work tracing/traced_work.cpp)
-target_link_libraries(traced_work PRIVATE halyard_options halyard Threads::Threads)
+pkg_check_modules(SNDFILE REQUIRED IMPORTED_TARGET sndfile)
+
+add_executable(traced_work tracing/traced_work.cpp tracing/Sound.cpp)
+target_include_directories(traced_work PRIVATE ${CMAKE_CURRENT_SOURCE_DIR})
+target_link_libraries(traced_work PRIVATE halyard_options halyard Threads::Threads
+  PkgConfig::SNDFILE)
 
 add_test(NAME daemon.tracing
   COMMAND ${HALYARD_PYTHON} ${CMAKE_CURRENT_SOURCE_DIR}/daemon/test_tracing.py)

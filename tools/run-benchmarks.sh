@@ -7,4 +7,5 @@ build=$1
 for piece in "$build"/*_benchmark; do
     [ -x "$piece" ] && "$piece"
 done
-exec "$build/halyard-load" "$build/halyardd"
+"$build/halyard-load" "$build/halyardd"
+exec "$(dirname "$0")/with-tracefs.sh" "$build/halyard-trace-load" "$build/halyardd"

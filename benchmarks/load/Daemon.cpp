@@ -81,6 +81,9 @@ void Daemon::writeConfiguration(const DaemonSettings& settings) const {
     if (!settings.analytics) {
         file << "[analytics]\nwanted = []\n";
     }
+    if (settings.tracing) {
+        file << "[feature_flags.AudioAnalytics]\nTracing = true\n";
+    }
 }
 
 void Daemon::spawn() {

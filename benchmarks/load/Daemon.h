@@ -2,6 +2,7 @@
 #pragma once
 
 #include <cstdint>
+#include <filesystem>
 #include <string>
 #include <sys/types.h>
 
@@ -14,6 +15,7 @@ namespace halyard::load {
 struct DaemonSettings {
     bool analytics = true; // as shipped: every message is an analytics event as well
     std::string logLevel;
+    bool tracing = false; // sessions of type test are traced
 };
 
 struct MemoryUse {
@@ -36,6 +38,8 @@ public:
     Daemon& operator=(const Daemon&) = delete;
 
     Connection connect() const;
+    std::string socketPath() const;
+    std::filesystem::path logsDirectory() const { return directory_.path() / "log"; }
     // CPU time of all its threads since it started.
     std::uint64_t cpuNanoseconds() const;
     MemoryUse memory() const;
@@ -50,7 +54,6 @@ private:
     [[noreturn]] void run() const;
     void awaitSocket();
     [[noreturn]] void failWithLog(const std::string& what) const;
-    std::string socketPath() const;
 
     const Options& options_;
     TemporaryDirectory directory_;

@@ -1,7 +1,9 @@
 #include "linux/TracefsEventTrace.h"
 
+#include <algorithm>
 #include <atomic>
 #include <cerrno>
+#include <charconv>
 #include <chrono>
 #include <condition_variable>
 #include <mutex>
@@ -11,6 +13,7 @@
 #include <utility>
 
 #include "linux/MarkLibraries.h"
+#include "linux/SmallFile.h"
 #include "linux/TraceDelivery.h"
 #include "linux/TraceInstance.h"
 #include "linux/TraceReader.h"
@@ -21,11 +24,28 @@ namespace {
 
 constexpr std::chrono::milliseconds kDrainPeriod{10};
 constexpr int kDrainsPerSearch = 50; // for libraries of clients that are new
+// What an event takes until its results are written (see docs/performance.md).
+constexpr std::uint64_t kBytesPerEvent = 320;
+
+// Events that fit into half of the memory that nobody needs now.
+std::uint64_t eventsThatFit() {
+    const auto read = readSmallFile("/proc/meminfo", 64 * 1024);
+    const auto* const text = std::get_if<std::string>(&read);
+    const std::size_t at = text != nullptr ? text->find("MemAvailable:") : std::string::npos;
+    std::uint64_t kibibytes = 0;
+    if (at != std::string::npos) {
+        const std::size_t digits = text->find_first_of("0123456789", at);
+        std::from_chars(text->data() + std::min(digits, text->size()), text->data() + text->size(),
+                        kibibytes);
+    }
+    return kibibytes * 1024 / 2 / kBytesPerEvent;
+}
 
 class TracefsSession final : public platform::EventTraceSession {
 public:
     explicit TracefsSession(const TracefsEventTrace::Options& options)
-        : options_(options), instance_(options_.tracefs), reader_(instance_, options_.tracefs) {}
+        : options_(options), mostEvents_(std::min(options.mostEvents, eventsThatFit())),
+          instance_(options_.tracefs), reader_(instance_, options_.tracefs) {}
 
     ~TracefsSession() override {
         delivery_->close();
@@ -66,6 +86,7 @@ private:
     void finish();
 
     const TracefsEventTrace::Options options_;
+    const std::uint64_t mostEvents_;
     const std::shared_ptr<TraceDelivery> delivery_ = std::make_shared<TraceDelivery>();
     std::uint32_t first_ = 0;
     std::uint32_t last_ = UINT32_MAX;
@@ -165,7 +186,7 @@ void TracefsSession::drain() {
 }
 
 void TracefsSession::deliver(std::vector<trace_point> points) {
-    const std::uint64_t room = options_.mostEvents - delivered_;
+    const std::uint64_t room = mostEvents_ - delivered_;
     if (points.size() > room) {
         refused_ += points.size() - room;
         points.resize(room);
@@ -187,7 +208,7 @@ void TracefsSession::finish() {
         HY_LOG_ERROR(HYReportingTraceCategory,
                      "{} trace events lost: {} by the kernel, {} beyond "
                      "the {} that are kept",
-                     lost_.load(), lost_.load() - refused_, refused_, options_.mostEvents);
+                     lost_.load(), lost_.load() - refused_, refused_, mostEvents_);
     }
     delivery_->complete();
 }

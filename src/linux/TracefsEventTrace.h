@@ -18,13 +18,16 @@ namespace halyard::linux_ {
 
 class TracefsEventTrace final : public platform::EventTrace {
 public:
+    // At 100,000 events a second, a minute and more.
+    static constexpr std::uint64_t kMostEvents = 8'000'000;
+
     struct Options {
         std::filesystem::path tracefs = kTracefs;
         // The processes, beside our own, whose libraries are probed. Any thread,
         // often while a session runs.
         std::function<std::vector<std::int32_t>()> clients;
-        // Of one session; those beyond are counted as lost.
-        std::uint64_t mostEvents = 1'000'000;
+        // Of one session, if the memory holds them; those beyond are counted as lost.
+        std::uint64_t mostEvents = kMostEvents;
     };
 
     // Removes what a daemon that was killed left in the kernel.

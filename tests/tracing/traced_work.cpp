@@ -1,10 +1,11 @@
-// A program that times stretches of real work itself while a session of its own
-// has them traced. Prints a line "ITEM NANOSECONDS" for each.
+// A program that times what it does to sounds while a session of its own has it
+// traced. Several threads decode two voices each and mix them ("render"); blocks
+// go to another thread, which adds them to what has been played ("handover").
+// Prints a line "ITEM NANOSECONDS" for each stretch that it timed.
 //
 // usage: traced_work SOCKET TRACE-PARAMETER-FILE
 
 #include <chrono>
-#include <cmath>
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
@@ -13,8 +14,11 @@
 #include <vector>
 
 #include "halyard/halyard.h"
+#include "tracing/Sound.h"
 
 namespace {
+
+using namespace halyard::tracing_test;
 
 constexpr std::uint32_t kRender = 0x21040010; // the stop is one more
 constexpr std::uint32_t kHandover = 0x21040020;
@@ -26,30 +30,38 @@ std::int64_t now() {
     return std::chrono::nanoseconds(std::chrono::steady_clock::now().time_since_epoch()).count();
 }
 
-// Tens of microseconds of arithmetic.
-void work(int amount) {
-    volatile double sum = 0;
-    for (int i = 0; i < amount * 1000; ++i) {
-        sum = sum + std::sqrt(static_cast<double>(i));
-    }
-}
+class Renderer {
+public:
+    explicit Renderer(int number)
+        : low_(compressedTone(220.0 + number)), high_(compressedTone(660.0 + number)) {}
 
-std::int64_t render() {
-    evmark_trace(kRender, 0, 0, 0, 0);
-    const std::int64_t begin = now();
-    work(10);
-    const std::int64_t end = now();
-    evmark_trace(kRender + 1, 0, 0, 0, 0);
-    return end - begin;
-}
+    // How long it took.
+    std::int64_t render(Block& block) {
+        evmark_trace(kRender, 0, 0, 0, 0);
+        const std::int64_t begin = now();
+        block.fill(0);
+        low_.decode(voice_);
+        mix(voice_, 0.7F, block);
+        high_.decode(voice_);
+        mix(voice_, 0.3F, block);
+        const std::int64_t end = now();
+        evmark_trace(kRender + 1, 0, 0, 0, 0);
+        return end - begin;
+    }
+
+private:
+    Voice low_;
+    Voice high_;
+    Block voice_{};
+};
 
 // Begins here, ends on another thread.
-std::int64_t handOver() {
+std::int64_t handOver(const Block& block, Block& played) {
     evmark_trace(kHandover, 0, 0, 0, 0);
     const std::int64_t begin = now();
     std::int64_t end = 0;
-    std::thread([&end] {
-        work(5);
+    std::thread([&] {
+        mix(block, 0.5F, played);
         end = now();
         evmark_trace(kHandover + 1, 0, 0, 0, 0);
     }).join();
@@ -58,11 +70,13 @@ std::int64_t handOver() {
 
 void measure() {
     std::vector<std::int64_t> rendered[kThreads];
+    std::vector<Block> blocks(kThreads);
     std::vector<std::thread> threads;
-    for (auto& times : rendered) {
-        threads.emplace_back([&times] {
-            for (int i = 0; i < kTimes; ++i) {
-                times.push_back(render());
+    for (int i = 0; i < kThreads; ++i) {
+        threads.emplace_back([i, &times = rendered[i], &block = blocks[std::size_t(i)]] {
+            Renderer renderer(i);
+            for (int time = 0; time < kTimes; ++time) {
+                times.push_back(renderer.render(block));
             }
         });
     }
@@ -74,8 +88,10 @@ void measure() {
             std::printf("render %lld\n", static_cast<long long>(time));
         }
     }
+    Block played{};
     for (int i = 0; i < kTimes; ++i) {
-        std::printf("handover %lld\n", static_cast<long long>(handOver()));
+        const Block& block = blocks[std::size_t(i % kThreads)];
+        std::printf("handover %lld\n", static_cast<long long>(handOver(block, played)));
     }
 }
 
