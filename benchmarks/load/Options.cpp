@@ -27,6 +27,7 @@ costs it, next to the floor: a process that appends the same bytes to a file.
   --directory=DIR   where the private directories are made (/var/tmp)
   --timeout=SECONDS longest wait for one answer (120)
   --only=WHAT       throughput or memory
+  --mode=NAME       throughput of this mode alone, as the table names it
   --json            print JSON
 )";
 
@@ -77,6 +78,9 @@ bool setText(Options& options, std::string_view name, std::string_view text) {
         options.logLevel = text;
     } else if (name == "--directory") {
         options.directory = text;
+    } else if (name == "--mode") {
+        options.mode = text;
+        options.memory = false;
     } else if (name == "--only" && (text == "throughput" || text == "memory")) {
         options.throughput = text == "throughput";
         options.memory = text == "memory";

@@ -11,6 +11,7 @@ struct Options {
     std::string daemon;
     std::string directory = "/var/tmp"; // private directories are made in it
     std::string logLevel = "info";      // the daemon's default
+    std::string mode;                   // only this one; empty: all
     // Of the sessions started at once, the daemon uploads five.
     std::uint32_t clients = 4;
     std::uint32_t messages = 200000; // per round and mode, of all clients together

@@ -28,8 +28,10 @@ Report measureAll(const Options& options) {
         report.throughput.push_back(
             medianOf(options.rounds, [&] { return measureFloor(options); }));
         for (const Mode& mode : modes()) {
-            report.throughput.push_back(
-                medianOf(options.rounds, [&] { return measure(options, mode); }));
+            if (options.mode.empty() || options.mode == mode.name) {
+                report.throughput.push_back(
+                    medianOf(options.rounds, [&] { return measure(options, mode); }));
+            }
         }
     }
     if (options.memory) {
