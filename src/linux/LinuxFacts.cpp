@@ -5,6 +5,8 @@
 #include <mutex>
 #include <random>
 
+#include "linux/PooledSerialQueue.h"
+
 namespace halyard::linux_ {
 namespace {
 
@@ -13,6 +15,7 @@ public:
     void lock() override { mutex_.lock(); }
     void unlock() override { mutex_.unlock(); }
     bool waitFor(std::chrono::nanoseconds timeout) override {
+        WakeUpScope::flushCurrent(); // It may be what this thread submitted that signals.
         return condition_.wait_for(mutex_, timeout) == std::cv_status::no_timeout;
     }
     void signal() override { condition_.notify_one(); }

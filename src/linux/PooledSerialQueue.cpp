@@ -9,12 +9,39 @@ namespace {
 
 // Tasks' worth of room that an idle queue keeps for its next burst.
 constexpr std::size_t kKeptCapacity = 16;
+// Tasks after which the queues they submitted to are let go, whatever follows.
+constexpr std::size_t kTasksPerWakeUp = 64;
+
+WakeUpScope*& currentScope() {
+    thread_local WakeUpScope* current = nullptr;
+    return current;
+}
 
 } // namespace
 
 ChargePtr& currentCharge() {
     thread_local ChargePtr current;
     return current;
+}
+
+WakeUpScope::WakeUpScope() : outer_(std::exchange(currentScope(), this)) {}
+
+WakeUpScope::~WakeUpScope() {
+    currentScope() = outer_;
+    flush();
+}
+
+void WakeUpScope::flush() {
+    for (const auto& queue : queues_) {
+        queue->wakeWorker();
+    }
+    queues_.clear();
+}
+
+void WakeUpScope::flushCurrent() {
+    for (WakeUpScope* scope = currentScope(); scope != nullptr; scope = scope->outer_) {
+        scope->flush();
+    }
 }
 
 void PooledSerialQueue::async(platform::Task task) {
@@ -30,8 +57,16 @@ void PooledSerialQueue::asyncAfter(std::chrono::nanoseconds delay, platform::Tas
 void PooledSerialQueue::scheduleLocked() {
     if (!scheduled_ && !suspended_) {
         scheduled_ = true;
-        worker_.post([self = shared_from_this()] { self->drain(); });
+        if (currentScope() != nullptr) {
+            currentScope()->queues_.push_back(shared_from_this());
+        } else {
+            wakeWorker();
+        }
     }
+}
+
+void PooledSerialQueue::wakeWorker() {
+    worker_.post([self = shared_from_this()] { self->drain(); });
 }
 
 void PooledSerialQueue::suspend(std::chrono::nanoseconds limit, platform::Task onTimeout) {
@@ -100,8 +135,12 @@ void PooledSerialQueue::drain() {
 
 std::size_t PooledSerialQueue::runUntilSuspended(std::vector<Item>& items) {
     suspendCalled_ = false;
+    WakeUpScope wakeUps;
     std::size_t ran = 0;
     while (ran < items.size() && !suspendCalled_) {
+        if (ran % kTasksPerWakeUp == 0) {
+            wakeUps.flush();
+        }
         Item& item = items[ran++];
         const ChargeScope scope(std::move(item.charge));
         item.task();

@@ -17,6 +17,34 @@
 
 namespace halyard::linux_ {
 
+class PooledSerialQueue;
+
+// While one lives, queues that the thread submits to are not run before the
+// scope ends: they find all of what it submitted, where each task by itself
+// would wake a worker that goes back to sleep after it. Scopes may be nested;
+// the innermost counts.
+//
+// A thread that blocks within a scope has to flush it first, as the platform's
+// condition does: it may be waiting for what it has submitted.
+class WakeUpScope {
+public:
+    WakeUpScope();
+    ~WakeUpScope();
+    WakeUpScope(const WakeUpScope&) = delete;
+    WakeUpScope& operator=(const WakeUpScope&) = delete;
+
+    // Lets the queues run now; the scope goes on.
+    void flush();
+    // The same for the calling thread's scope, if there is one.
+    static void flushCurrent();
+
+private:
+    friend class PooledSerialQueue;
+
+    WakeUpScope* const outer_;
+    std::vector<std::shared_ptr<PooledSerialQueue>> queues_;
+};
+
 class PooledSerialQueue final : public platform::SerialQueue,
                                 public std::enable_shared_from_this<PooledSerialQueue> {
 public:
@@ -41,8 +69,11 @@ private:
         ChargePtr charge;
     };
 
+    friend class WakeUpScope;
+
     bool resumeWait(std::uint64_t wait, platform::Task first) HY_EXCLUDES(mutex_);
     void scheduleLocked() HY_REQUIRES(mutex_);
+    void wakeWorker();
     void drain();
     // How many ran: all, or as many as up to the one that suspended the queue.
     std::size_t runUntilSuspended(std::vector<Item>& items) HY_EXCLUDES(mutex_);

@@ -5,7 +5,10 @@
 #include <asio/executor_work_guard.hpp>
 #include <atomic>
 #include <future>
+#include <mutex>
 #include <thread>
+
+#include "linux/LinuxFacts.h"
 
 namespace halyard::linux_ {
 namespace {
@@ -111,6 +114,41 @@ TEST_F(QueuesTest, ASuspendedQueueGoesOnWhenItsLimitPasses) {
 
     EXPECT_EQ(order, (std::vector<int>{1, 2}));
     EXPECT_FALSE(queue->resume([] { FAIL() << "it is not suspended any more"; }));
+}
+
+TEST_F(QueuesTest, WhatIsSubmittedInAScopeRunsWhenItEnds) {
+    const auto queue = relayQueue();
+    std::atomic<int> ran{0};
+    {
+        const WakeUpScope scope;
+        queue->async([&] { ++ran; });
+        relayQueue()->async([] {});
+        EXPECT_EQ(ran, 0);
+    }
+    drain();
+
+    EXPECT_EQ(ran, 1);
+}
+
+TEST_F(QueuesTest, ATaskMayWaitForWhatItSubmits) {
+    const auto queue = relayQueue();
+    const auto condition = SystemConditions().makeCondition();
+    bool ran = false;
+    const auto service = queues_.makeSerialQueue("service", QueuePriority::UserInteractive);
+    service->async([&] {
+        const std::lock_guard lock(*condition);
+        queue->async([&] {
+            const std::lock_guard inner(*condition);
+            ran = true;
+            condition->signal();
+        });
+        while (!ran) {
+            (void)condition->waitFor(1h);
+        }
+    });
+    drain();
+
+    EXPECT_TRUE(ran);
 }
 
 TEST_F(QueuesTest, AThousandWaitingQueuesHoldNoThread) {

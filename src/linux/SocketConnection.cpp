@@ -6,6 +6,7 @@
 #include <sys/socket.h>
 #include <utility>
 
+#include "linux/PooledSerialQueue.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {
@@ -185,6 +186,7 @@ void SocketConnection::readAvailable() {
 std::size_t SocketConnection::takeFrames(std::string_view stream) {
     const auto charge = std::make_shared<ReadCharge>(shared_from_this());
     const ChargeScope scope(charge);
+    const WakeUpScope wakeUps; // Once for all requests of the read.
     std::size_t taken = 0;
     while (taken < stream.size() && !ended_ && mayRead()) {
         const std::string_view rest = stream.substr(taken);
