@@ -10,6 +10,7 @@ namespace halyard {
 namespace {
 
 constexpr int kIndent = 4;
+constexpr std::size_t kSortedInPlace = 16;
 
 // Room for the longest shortest form of a double, and some.
 using DecimalBuffer = std::array<char, 40>;
@@ -18,14 +19,28 @@ void appendInteger(std::string& out, const fmt::format_int& digits) {
     out.append(digits.data(), digits.size());
 }
 
-bool isPlain(char c) noexcept {
+constexpr bool isPlain(char c) noexcept {
     return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '_' ||
            c == '$' || c == '.' || c == ':' || c == '-' || c == '/';
 }
 
+constexpr std::array<bool, 256> kPlain = [] {
+    std::array<bool, 256> plain{};
+    for (std::size_t c = 0; c < plain.size(); ++c) {
+        plain[c] = isPlain(static_cast<char>(c));
+    }
+    return plain;
+}();
+
 bool needsQuotes(std::string_view text) noexcept {
-    return text.empty() || !std::all_of(text.begin(), text.end(), isPlain) ||
-           text.find("//") != std::string_view::npos;
+    char before = 0;
+    for (const char c : text) {
+        if (!kPlain[static_cast<unsigned char>(c)] || (c == '/' && before == '/')) {
+            return true;
+        }
+        before = c;
+    }
+    return text.empty();
 }
 
 void appendQuoted(std::string& out, std::string_view text) {
@@ -79,12 +94,33 @@ void appendElement(std::string& out, const Value& value, int depth) {
     }
     const std::size_t start = out.size();
     appendDescription(out, value);
+    if (value.isInteger()) {
+        return; // Always plain.
+    }
     const std::string_view text = std::string_view(out).substr(start);
     if (needsQuotes(text)) { // A date, or a number with a "+" in it.
         const std::string copy(text);
         out.resize(start);
         appendQuoted(out, copy);
     }
+}
+
+// Every message is described, and most dictionaries within messages are small.
+template <class Body>
+void forEachSorted(std::span<const Dictionary::Entry> entries, const Body& body) {
+    if (entries.size() > kSortedInPlace) {
+        for (const auto* entry : sortedEntries(entries)) {
+            body(*entry);
+        }
+        return;
+    }
+    std::array<const Dictionary::Entry*, kSortedInPlace> sorted;
+    const auto end = std::transform(entries.begin(), entries.end(), sorted.begin(),
+                                    [](const Dictionary::Entry& entry) { return &entry; });
+    std::sort(sorted.begin(), end, [](const auto* left, const auto* right) {
+        return left->key.text() < right->key.text();
+    });
+    std::for_each(sorted.begin(), end, [&](const auto* entry) { body(*entry); });
 }
 
 void appendNested(std::string& out, const Value& value, int depth) {
@@ -102,13 +138,13 @@ void appendNested(std::string& out, const Value& value, int depth) {
         return;
     }
     out += "{\n";
-    for (const auto* entry : sortedEntries(Dictionary::entriesOf(value))) {
+    forEachSorted(Dictionary::entriesOf(value), [&](const Dictionary::Entry& entry) {
         out.append(inner, ' ');
-        appendElement(out, entry->key, depth + 1);
+        appendElement(out, entry.key, depth + 1);
         out += " = ";
-        appendElement(out, entry->value, depth + 1);
+        appendElement(out, entry.value, depth + 1);
         out += ";\n";
-    }
+    });
     out.append(outer, ' ').append("}");
 }
 

@@ -9,6 +9,8 @@ namespace {
 
 constexpr const char* kSummaryKey = "HY_Session_Summary_Event";
 constexpr std::uint32_t kVolumeDigits = 4;
+constexpr std::size_t kBlockBytes = 32 * 1024;
+constexpr std::size_t kBlockSlack = 256; // most values fit into it
 
 } // namespace
 
@@ -60,6 +62,31 @@ void VolumeStretches::endStretch(double length) {
                                  {"play_secondsBucketed", lengthBucket.value_or("")}});
 }
 
+std::string& SummaryTexts::Joined::end() {
+    if (blocks.empty()) {
+        return blocks.emplace_back();
+    }
+    blocks.back() += ','; // An empty text is a value, too.
+    if (blocks.back().size() >= kBlockBytes) {
+        blocks.emplace_back().reserve(kBlockBytes + kBlockSlack);
+    }
+    return blocks.back();
+}
+
+std::string SummaryTexts::Joined::take() {
+    std::size_t size = 0;
+    for (const std::string& block : blocks) {
+        size += block.size();
+    }
+    std::string text;
+    text.reserve(size);
+    for (std::string& block : blocks) {
+        text += block;
+        block = std::string(); // One long text at a time.
+    }
+    return text;
+}
+
 SummaryTexts::Joined& SummaryTexts::joinedFor(const Value& key, std::size_t place) {
     if (place >= lastAtPlace_.size()) {
         lastAtPlace_.resize(place + 1);
@@ -71,7 +98,7 @@ SummaryTexts::Joined& SummaryTexts::joinedFor(const Value& key, std::size_t plac
     if (const auto known = positions_.find(key.text()); known != positions_.end()) {
         guess = known->second;
     } else {
-        guess = &joined_.emplace_back(Joined{key, {}, false});
+        guess = &joined_.emplace_back(Joined{key, {}});
         positions_.emplace(guess->key.text(), guess);
     }
     return *guess;
@@ -81,11 +108,7 @@ void SummaryTexts::take(const Dictionary& message) {
     ++messages_;
     std::size_t place = 0;
     for (const auto& [key, value] : message) {
-        Joined& joined = joinedFor(key, place++);
-        if (std::exchange(joined.begun, true)) {
-            joined.values += ',';
-        }
-        appendDescription(joined.values, value);
+        appendDescription(joinedFor(key, place++).end(), value);
     }
 }
 
@@ -98,11 +121,10 @@ std::optional<Dictionary> SummaryTexts::finish(AudioServiceType serviceType) {
     entries.push_back({kSummaryKey, std::to_string(serviceType)});
     for (Joined& each : joined_) {
         if (each.key.text() == kSummaryKey) {
-            entries.front().value = std::to_string(serviceType) + ',' + each.values;
+            entries.front().value = std::to_string(serviceType) + ',' + each.take();
         } else {
-            entries.push_back({std::move(each.key), Value(each.values)});
+            entries.push_back({std::move(each.key), Value(each.take())});
         }
-        each.values = std::string(); // One long text at a time.
     }
     *this = SummaryTexts();
     return Dictionary(std::move(entries));

@@ -64,9 +64,15 @@ public:
 
 private:
     struct Joined {
+        // Where the next value's text is to be appended.
+        std::string& end();
+        // The whole text, which it lets go of.
+        std::string take();
+
         Value key;
-        std::string values;
-        bool begun = false; // An empty text is a value, too.
+        // Full ones stay as they are: one string that grows for hours would be
+        // moved to twice the room over and over.
+        std::vector<std::string> blocks;
     };
 
     Joined& joinedFor(const Value& key, std::size_t place);

@@ -154,6 +154,17 @@ TEST_F(SessionEventsTest, KeysMayComeInAnyOrderAndNumber) {
                                        {"d", "7"}}));
 }
 
+TEST_F(SessionEventsTest, TheTextOfALongSessionIsWhole) {
+    std::string expected;
+    for (int i = 0; i < 20000; ++i) { // Some hundred kilobytes, in values of many lengths.
+        const std::string value(static_cast<std::size_t>(i % 37), static_cast<char>('a' + i % 26));
+        add(Dictionary{{"a", value}, {"n", i}});
+        expected += (i == 0 ? "" : ",") + value;
+    }
+
+    EXPECT_EQ((*summary(4))["a"], Value(expected));
+}
+
 TEST_F(SessionEventsTest, AClientsOwnSummaryKeyIsJoinedBehindTheServiceType) {
     add(Dictionary{{"HY_Session_Summary_Event", "x"}});
 
