@@ -27,6 +27,7 @@ public:
 
     // Valid until the next call.
     std::string_view write(const Value& value);
+    std::string_view write(const Dictionary& value);
 
 private:
     struct Buffer;

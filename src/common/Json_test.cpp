@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 #include <limits>
+#include <rapidjson/stringbuffer.h>
+#include <rapidjson/writer.h>
 
 namespace halyard {
 namespace {
@@ -39,6 +41,26 @@ TEST(JsonTest, TextIsEscapedAndRepaired) {
     EXPECT_EQ(toJson(std::string_view("\0", 1)), "\"\\u0000\"");
     EXPECT_EQ(toJson("\xC3\xA4\xFF"), "\"\xC3\xA4\xEF\xBF\xBD\"");
     EXPECT_EQ(toJson(Dictionary{{"\xFF", 1}}), "{\"\xEF\xBF\xBD\":1}");
+}
+
+TEST(JsonTest, EveryByteIsEscapedWhereverItStands) {
+    const std::string plain(17, 'x');
+    for (std::size_t at = 0; at < plain.size(); ++at) {
+        for (int byte = 0; byte < 0x80; ++byte) {
+            std::string text = plain;
+            text[at] = static_cast<char>(byte);
+            rapidjson::StringBuffer expected;
+            rapidjson::Writer<rapidjson::StringBuffer>(expected).String(
+                text.data(), static_cast<rapidjson::SizeType>(text.size()));
+            ASSERT_EQ(toJson(text), expected.GetString()) << byte << " at " << at;
+        }
+    }
+}
+
+TEST(JsonTest, LongTextsAreWhole) {
+    const std::string text(100'000, 'x');
+    EXPECT_EQ(toJson(List{Value(text), Value("\n" + text)}),
+              "[\"" + text + "\",\"\\n" + text + "\"]");
 }
 
 TEST(JsonTest, ContainersKeepTheirOrder) {
