@@ -14,7 +14,7 @@ namespace {
 constexpr std::int64_t kSlabShare = 8;
 // How much longer than allowed the file may be before pages are given back,
 // since moving them costs more than using them again.
-constexpr std::int64_t kSlackPages = 256;
+constexpr std::int64_t kSlackBytes = 1024 * 1024;
 constexpr std::int64_t kSlackShare = 16;
 
 struct Source {
@@ -137,13 +137,14 @@ int StoreRetention::trimAge(double oldest, bool& more) {
 }
 
 int StoreRetention::shrink(std::int64_t maxPages, bool& more) {
-    const std::int64_t slack = std::min(kSlackPages, maxPages / kSlackShare);
+    const std::int64_t most = kSlackBytes / pageSize_;
+    const std::int64_t slack = std::min(most, maxPages / kSlackShare);
     std::int64_t total = 0;
     int code = pages(pageCount_, total);
     if (code != SQLITE_OK || total <= maxPages + slack) {
         return code;
     }
-    const std::int64_t excess = std::min(total - maxPages, 4 * kSlackPages);
+    const std::int64_t excess = std::min(total - maxPages, 4 * most);
     more = more || excess < total - maxPages;
     const std::string sql = fmt::format("PRAGMA incremental_vacuum({})", excess);
     return sqlite3_exec(database_, sql.c_str(), nullptr, nullptr, nullptr);

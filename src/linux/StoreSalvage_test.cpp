@@ -10,7 +10,7 @@
 namespace halyard::linux_ {
 namespace {
 
-constexpr std::int64_t kPage = 4096;
+constexpr std::int64_t kPage = 8192;
 
 class StoreSalvageTest : public StoreFixture {
 protected:
