@@ -42,18 +42,26 @@ bool equalButForTimeStamps(const Dictionary& left, const Dictionary& right) {
     return compared == countCompared(right);
 }
 
-bool MessageBatch::addUnlessRedundant(AudioEventCategory category, AudioEventType type,
-                                      const Dictionary& message) {
+std::pair<MessageBatch::Kinds::iterator, bool> MessageBatch::kindOf(AudioEventCategory category,
+                                                                    AudioEventType type) {
+    if (lastKind_ != kinds_.end() && lastCategory_ == category && lastType_ == type) {
+        return {lastKind_, true};
+    }
     std::string base;
-    base.reserve(48);
     appendCategoryString(base, category);
     base += '_';
     base += HYReportingUtilityTypeString(type);
+    const auto [kind, isNew] = kinds_.try_emplace(std::move(base));
+    lastKind_ = kind;
+    lastCategory_ = category;
+    lastType_ = type;
+    return {kind, !isNew};
+}
 
-    auto kind = kinds_.find(base);
-    if (kind == kinds_.end()) {
-        kind = kinds_.emplace(std::move(base), Kind{}).first;
-    } else {
+bool MessageBatch::addUnlessRedundant(AudioEventCategory category, AudioEventType type,
+                                      const Dictionary& message) {
+    const auto [kind, known] = kindOf(category, type);
+    if (known) {
         const bool isError = category == kAudioEventCategoryError || type == kAudioEventTypeError;
         if (!isError && equalButForTimeStamps(message, kind->second.last)) {
             return true;

@@ -19,6 +19,7 @@
 #include <map>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include "common/HYReportingUtility.h"
@@ -70,9 +71,18 @@ private:
         Dictionary last; // the newest accepted message
     };
 
+    using Kinds = std::map<std::string, Kind, std::less<>>;
+
+    // The kind of these, and whether it was there before.
+    std::pair<Kinds::iterator, bool> kindOf(AudioEventCategory category, AudioEventType type);
+
     const bool keepsMessages_;
     // Bounded by the names that categories and types can have (a few thousand).
-    std::map<std::string, Kind, std::less<>> kinds_;
+    Kinds kinds_;
+    // The newest message's: the next one is often of the same.
+    Kinds::iterator lastKind_ = kinds_.end();
+    AudioEventCategory lastCategory_ = 0;
+    AudioEventType lastType_ = 0;
     std::vector<Entry> entries_;
     VolumeStretches volumes_;
     SummaryTexts summary_;
