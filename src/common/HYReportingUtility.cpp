@@ -187,7 +187,7 @@ Dictionary HYReportingUtilityAddAudioMessageTag(Dictionary message, AudioEventCa
     return message;
 }
 
-Dictionary HYReportingUtilityRemoveWhiteSpaceFromKeys(const Dictionary& dictionary) {
+Dictionary HYReportingUtilityRemoveWhiteSpaceFromKeys(Dictionary dictionary) {
     if (std::none_of(dictionary.begin(), dictionary.end(),
                      [](const auto& entry) { return hasBlank(entry.key.text()); })) {
         return dictionary;

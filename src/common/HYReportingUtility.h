@@ -124,7 +124,7 @@ Dictionary HYReportingUtilityAddAudioMessageTag(Dictionary message, AudioEventCa
                                                 AudioEventType type);
 // Every blank in a key becomes "_"; of keys that become equal the later one
 // wins. Returns the same shared dictionary when no key holds a blank.
-Dictionary HYReportingUtilityRemoveWhiteSpaceFromKeys(const Dictionary& dictionary);
+Dictionary HYReportingUtilityRemoveWhiteSpaceFromKeys(Dictionary dictionary);
 
 // Half away from zero; negative places round to tens, hundreds and so on.
 double HYReportingUtilityRoundWithPlaces(double value, std::int32_t places);

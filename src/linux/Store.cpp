@@ -138,9 +138,9 @@ void Store::closeUpload(const StoreUploadPtr& upload) {
 }
 
 bool Store::addMessage(const StoreUploadPtr& upload, std::uint16_t category, std::uint32_t type,
-                       const Dictionary& payload) {
-    const bool taken =
-        writer_->queue().push(StoreMessageRow{upload, payload, type, category, writer_->now()});
+                       Dictionary payload) {
+    const bool taken = writer_->queue().push(
+        StoreMessageRow{upload, std::move(payload), type, category, writer_->now()});
     if (taken && !upload->accepted.load(std::memory_order_relaxed)) {
         upload->accepted = true;
     }

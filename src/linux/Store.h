@@ -45,7 +45,7 @@ public:
     // False when the row was dropped, which happens only while nothing can be
     // written.
     [[nodiscard]] bool addMessage(const StoreUploadPtr& upload, std::uint16_t category,
-                                  std::uint32_t type, const Dictionary& payload);
+                                  std::uint32_t type, Dictionary payload);
     [[nodiscard]] bool addSingleMessage(const Dictionary& sessionInfo, const Dictionary& userInfo,
                                         std::uint16_t category, std::uint32_t type,
                                         const Dictionary& payload);

@@ -43,9 +43,9 @@ public:
         }
     }
     MaybeError sendMessageWithCategory(std::uint16_t category, std::uint32_t type,
-                                       const Dictionary& payload) override {
+                                       Dictionary payload) override {
         const bool taken =
-            upload_ != nullptr && store_.addMessage(upload_, category, type, payload);
+            upload_ != nullptr && store_.addMessage(upload_, category, type, std::move(payload));
         return taken ? MaybeError() : notTaken(store_);
     }
     // Every row is committed within moments anyway; a commit of its own for each

@@ -43,9 +43,8 @@ public:
     // late, perhaps before this returns, perhaps never.
     virtual void startConfigurationWithCompletionHandler(BackendHandler handler) = 0;
     // Must not block: what cannot be taken at once is an error.
-    [[nodiscard]] virtual MaybeError sendMessageWithCategory(std::uint16_t category,
-                                                             std::uint32_t type,
-                                                             const Dictionary& payload) = 0;
+    [[nodiscard]] virtual MaybeError
+    sendMessageWithCategory(std::uint16_t category, std::uint32_t type, Dictionary payload) = 0;
     virtual void flushMessages() = 0;
     virtual std::string description() const = 0;
 };

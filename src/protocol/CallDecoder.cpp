@@ -14,6 +14,8 @@ constexpr std::size_t kRequestLength = 4;
 constexpr std::size_t kNotificationLength = 3;
 // Containers around an argument: the frame and its params.
 constexpr int kArgumentDepth = 2;
+// A message gets its tag in place, without moving its entries.
+constexpr std::size_t kSpareEntries = 1;
 // Of a name that comes from outside, in an answer.
 constexpr std::size_t kMaxShownBytes = 64;
 
@@ -108,7 +110,7 @@ bool ArgumentReader::takeDictionary(const Token& token) {
     if (token.family != Family::Map) {
         return wrongType(token);
     }
-    out_.dictionary = decoder_.dictionary(token, kArgumentDepth);
+    out_.dictionary = decoder_.dictionary(token, kArgumentDepth, kSpareEntries);
     if (decoder_.problem() != ValueDecoder::Problem::None) {
         complaint_ = "holds " + decoder_.problemText();
         return false;

@@ -67,13 +67,13 @@ Value ValueDecoder::value(const Token& token, int depth) {
     return {};
 }
 
-Dictionary ValueDecoder::dictionary(const Token& map, int depth) {
+Dictionary ValueDecoder::dictionary(const Token& map, int depth, std::size_t spare) {
     if (depth >= kMaxDepth) {
         fail(Problem::Malformed);
         return {};
     }
     std::vector<Dictionary::Entry> entries;
-    entries.reserve(map.size);
+    entries.reserve(map.size + spare);
     for (std::size_t i = 0; i < map.size && problem_ == Problem::None; ++i) {
         const Token key = next();
         if (key.family != Family::Text) {

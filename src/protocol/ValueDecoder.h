@@ -87,8 +87,8 @@ public:
 
     // `depth` is the number of containers around the object.
     Value value(const Token& token, int depth);
-    // Requires a map.
-    Dictionary dictionary(const Token& map, int depth);
+    // Requires a map. Keeps room for as many entries more as `spare` says.
+    Dictionary dictionary(const Token& map, int depth, std::size_t spare = 0);
 
     Problem problem() const noexcept { return problem_; }
     // "a dictionary key that is no string"

@@ -58,7 +58,7 @@ HYReportingClientServerInstance::~HYReportingClientServerInstance() {
 }
 
 template <class Body> void HYReportingClientServerInstance::onServiceQueue(Body body) {
-    serviceQueue_->async([weak = weak_from_this(), body = std::move(body)] {
+    serviceQueue_->async([weak = weak_from_this(), body = std::move(body)]() mutable {
         const auto self = weak.lock();
         const auto delegate = self != nullptr ? self->delegate_.lock() : nullptr;
         if (delegate != nullptr) {
@@ -175,17 +175,21 @@ void HYReportingClientServerInstance::sendMessage(
                            : std::nullopt;
     onServiceQueue([message = std::move(message), category, type,
                     processName = std::move(processName), reporterIDs = std::move(reporterIDs),
-                    reply = std::move(reply)](auto& self, Delegate& delegate) {
-        reply(self.send(delegate, message, category, type, reporterIDs, processName));
+                    reply = std::move(reply)](auto& self, Delegate& delegate) mutable {
+        const MaybeError error =
+            self.send(delegate, std::move(message), category, type, reporterIDs, processName);
+        if (reply) {
+            reply(error);
+        }
     });
 }
 
 MaybeError
-HYReportingClientServerInstance::send(Delegate& delegate, const Dictionary& message,
+HYReportingClientServerInstance::send(Delegate& delegate, Dictionary message,
                                       AudioEventCategory category, std::uint16_t type,
                                       const std::optional<std::vector<std::int64_t>>& reporterIDs,
                                       const std::optional<std::string>& processName) {
-    const MessageFanOut fanOut(delegate, {message, category, type, processName});
+    MessageFanOut fanOut(delegate, {std::move(message), category, type, processName});
     return fanOut.route(reporterIDs, [&](std::int64_t reporterID) {
         return findReportingSessionForID(delegate, reporterID, true);
     });

@@ -79,7 +79,7 @@ private:
     void start(Delegate& delegate, std::int64_t reporterID, const BoolReply& reply);
     void stop(Delegate& delegate, std::int64_t reporterID);
     void destroy(Delegate& delegate, std::int64_t reporterID);
-    MaybeError send(Delegate& delegate, const Dictionary& message, AudioEventCategory category,
+    MaybeError send(Delegate& delegate, Dictionary message, AudioEventCategory category,
                     std::uint16_t type, const std::optional<std::vector<std::int64_t>>& reporterIDs,
                     const std::optional<std::string>& processName);
     void leave(Delegate& delegate);

@@ -35,7 +35,7 @@ public:
                                   BoolReply reply) = 0;
     // Answered when the session stops or is started again.
     virtual void startReportingSessionForID(std::int64_t reporterID, BoolReply reply) = 0;
-    // No list at all broadcasts; an empty list sends nothing.
+    // No list at all broadcasts; an empty list sends nothing. The reply may be null.
     virtual void sendMessage(Dictionary message, AudioEventCategory category, std::uint16_t type,
                              std::optional<std::vector<std::int64_t>> reporterIDs,
                              ErrorReply reply) = 0;

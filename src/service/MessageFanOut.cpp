@@ -34,7 +34,7 @@ Value describeSessions(const std::vector<std::shared_ptr<HYReportingSession>>& s
 }
 
 MaybeError MessageFanOut::route(const std::optional<std::vector<std::int64_t>>& reporterIDs,
-                                const Lookup& findAcrossAllClients) const {
+                                const Lookup& findAcrossAllClients) {
     HY_LOG_DEBUG(HYReportingClientCategory, "sending message for reporter {}",
                  describeIDs(reporterIDs));
     platform::current().traceMarks->mark(kSendMark, 0, 0, 0, 0);
@@ -50,15 +50,18 @@ MaybeError MessageFanOut::route(const std::optional<std::vector<std::int64_t>>& 
 }
 
 void MessageFanOut::sendToAddressed(const std::vector<std::int64_t>& reporterIDs,
-                                    const Lookup& findAcrossAllClients) const {
-    for (const std::int64_t reporterID : reporterIDs) {
+                                    const Lookup& findAcrossAllClients) {
+    for (const std::int64_t& reporterID : reporterIDs) {
         if (reporterID == 0) {
             continue;
         }
         if (const Session session = findAcrossAllClients(reporterID)) {
             offerToSinks(session);
             offerToIssueCapture(session);
-            sendToSession(*session);
+            // The last takes it over, and may change what nobody else holds.
+            const bool last = &reporterID == &reporterIDs.back();
+            session->sendMessage(last ? std::move(message_.payload) : message_.payload,
+                                 message_.category, message_.type, nullptr);
         }
     }
 }
@@ -70,7 +73,7 @@ void MessageFanOut::broadcast() const {
     for (const Session& session : sessions) {
         // The session first here, last when it is addressed: readers of the
         // store rely on either order.
-        sendToSession(*session);
+        session->sendMessage(message_.payload, message_.category, message_.type, nullptr);
         offerToSinks(session);
         offerToIssueCapture(session);
     }
@@ -104,10 +107,6 @@ void MessageFanOut::offerToSinks(const Session& session) const {
 void MessageFanOut::offerToIssueCapture(const Session& session) const {
     delegate_.handleEventForIBX(message_.payload, message_.category, message_.type, session,
                                 message_.processName);
-}
-
-void MessageFanOut::sendToSession(HYReportingSession& session) const {
-    session.sendMessage(message_.payload, message_.category, message_.type, nullptr);
 }
 
 } // namespace halyard

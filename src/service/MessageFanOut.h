@@ -1,7 +1,8 @@
 // Routes one client message to the sessions concerned and to the four sinks.
 //
 // Runs on the service work queue, so sessions see one message at a time, in the
-// order of arrival. Borrows everything it is given; lives for one message.
+// order of arrival. Borrows all that it is given but the message; lives for that
+// one message.
 #pragma once
 
 #include <cstdint>
@@ -21,7 +22,7 @@ namespace halyard {
 
 // What a client sent.
 struct ClientMessage {
-    const Dictionary& payload;
+    Dictionary payload;
     AudioEventCategory category;
     std::uint16_t type;
     // The sender's, where issue capture will want it.
@@ -34,25 +35,24 @@ public:
     using Lookup = std::function<Session(std::int64_t reporterID)>;
 
     MessageFanOut(HYReportingServiceDelegateProtocol& delegate, ClientMessage message)
-        : delegate_(delegate), message_(message) {}
+        : delegate_(delegate), message_(std::move(message)) {}
 
     // Without a list the message goes to every started session or, where there
     // is none, out on its own. The error is that of a disabled service; unknown
-    // reporter IDs are skipped silently.
+    // reporter IDs are skipped silently. Call it once: the message goes.
     MaybeError route(const std::optional<std::vector<std::int64_t>>& reporterIDs,
-                     const Lookup& findAcrossAllClients) const;
+                     const Lookup& findAcrossAllClients);
 
 private:
     void sendToAddressed(const std::vector<std::int64_t>& reporterIDs,
-                         const Lookup& findAcrossAllClients) const;
+                         const Lookup& findAcrossAllClients);
     void broadcast() const;
     void sendStandalone() const;
-    void sendToSession(HYReportingSession& session) const;
     void offerToSinks(const Session& session) const;
     void offerToIssueCapture(const Session& session) const;
 
     HYReportingServiceDelegateProtocol& delegate_;
-    const ClientMessage message_;
+    ClientMessage message_;
 };
 
 // A list of session descriptions, for log lines.

@@ -22,6 +22,14 @@ BoolReply boolReply(protocol::Reply reply) {
     };
 }
 
+// None for a notification: messages are too many for one that does nothing.
+ErrorReply errorReply(protocol::Reply reply) {
+    if (!reply) {
+        return nullptr;
+    }
+    return [reply = std::move(reply)](const MaybeError& error) { reply(error, Value()); };
+}
+
 } // namespace
 
 void RequestDispatch::handle(protocol::Request request) {
@@ -44,9 +52,8 @@ void RequestDispatch::handle(protocol::Request request) {
     case Method::StartReportingSessionForID:
         return client_->startReportingSessionForID(a.reporterID, boolReply(std::move(reply)));
     case Method::SendMessage:
-        return client_->sendMessage(
-            std::move(a.dictionary), a.category, a.type, std::move(a.reporterIDs),
-            [reply = std::move(reply)](const MaybeError& error) { reply(error, Value()); });
+        return client_->sendMessage(std::move(a.dictionary), a.category, a.type,
+                                    std::move(a.reporterIDs), errorReply(std::move(reply)));
     case Method::StopReportingSessionForID:
         return client_->stopReportingSessionForID(a.reporterID, boolReply(std::move(reply)));
     case Method::DestroyReportingSession:

@@ -62,11 +62,6 @@ std::string HYReportingSession::description() const {
         describe(HYReportingUtilityRetrieveAppName(configuration_)), started() ? 1 : 0);
 }
 
-AudioServiceType HYReportingSession::serviceType() const {
-    const MutexLock lock(stateMutex_);
-    return serviceType_;
-}
-
 std::string HYReportingSession::serviceName() const {
     const MutexLock lock(stateMutex_);
     return serviceName_;
@@ -237,12 +232,13 @@ bool HYReportingSession::createMessageIdentifierWithCategory(AudioEventCategory 
     return redundant;
 }
 
-void HYReportingSession::sendMessage(const Dictionary& message, AudioEventCategory category,
+void HYReportingSession::sendMessage(Dictionary message, AudioEventCategory category,
                                      AudioEventType type, bool /*sync*/, const SendReply& reply) {
     HY_LOG_DEBUG(HYReportingSessionCategory, "sending message for session owned by {}",
                  reporterID_);
+    auto original = platform::logEnabled(LogLevel::Debug) ? std::optional(message) : std::nullopt;
     Dictionary tagged = HYReportingUtilityAddAudioMessageTag(
-        HYReportingUtilityRemoveWhiteSpaceFromKeys(message), category, type);
+        HYReportingUtilityRemoveWhiteSpaceFromKeys(std::move(message)), category, type);
     bool redundant = false;
     {
         const MutexLock lock(batchMutex_);
@@ -251,7 +247,7 @@ void HYReportingSession::sendMessage(const Dictionary& message, AudioEventCatego
     mark(kMessageMark);
     const bool wasStarted = started();
     if (relayReportingEnabled()) {
-        relay({std::move(tagged), message, category, type, wasStarted, redundant});
+        relay({std::move(tagged), std::move(original), category, type, wasStarted, redundant});
     }
     if (reply) {
         reply(std::nullopt);

@@ -83,11 +83,11 @@ public:
     // reporting enabled, hands it on to the relay queue. `sync` is ignored: every
     // delivery is asynchronous. The reply may be null; it is called at once and
     // never tells what became of the delivery.
-    void sendMessage(const Dictionary& message, AudioEventCategory category, AudioEventType type,
+    void sendMessage(Dictionary message, AudioEventCategory category, AudioEventType type,
                      bool sync, const SendReply& reply);
-    void sendMessage(const Dictionary& message, AudioEventCategory category, AudioEventType type,
+    void sendMessage(Dictionary message, AudioEventCategory category, AudioEventType type,
                      const SendReply& reply) {
-        sendMessage(message, category, type, false, reply);
+        sendMessage(std::move(message), category, type, false, reply);
     }
 
     // Uploads one message on its own, one second later. `userInfo` is ignored:
@@ -111,7 +111,7 @@ public:
     bool started() const { return started_.load(); }
     std::int64_t reporterID() const { return reporterID_; }
     const std::vector<std::int32_t>& processIdentifiers() const { return processIdentifiers_; }
-    AudioServiceType serviceType() const override HY_EXCLUDES(stateMutex_);
+    AudioServiceType serviceType() const override { return serviceType_.load(); }
     std::string serviceName() const HY_EXCLUDES(stateMutex_);
     Dictionary configuration() const override HY_EXCLUDES(stateMutex_);
     bool relayReportingEnabled() const { return relayReportingEnabled_.load(); }
@@ -163,7 +163,7 @@ private:
     struct Opening;
     struct Delivery {
         Dictionary tagged;
-        Dictionary message; // as the client sent it
+        std::optional<Dictionary> original; // as the client sent it, where it will be logged
         AudioEventCategory category;
         AudioEventType type;
         bool wasStarted; // when the message was sent
@@ -188,7 +188,7 @@ private:
     // On the relay queue.
     void openRelayReporting(const Opening& opening);
     void finishOpening(bool signalled);
-    void deliver(const Delivery& delivery);
+    void deliver(Delivery delivery);
     void closeRelayReporting(AudioServiceType type);
     void dropRelayReportingSession() HY_EXCLUDES(stateMutex_);
 
@@ -224,7 +224,8 @@ private:
     std::unique_ptr<TraceRunner> traceRunner_;
 
     mutable Mutex stateMutex_;
-    AudioServiceType serviceType_ HY_GUARDED_BY(stateMutex_) = kAudioServiceTypeUnknown;
+    // Changed together with the name, but asked for by itself with every message.
+    std::atomic<AudioServiceType> serviceType_{kAudioServiceTypeUnknown};
     std::string serviceName_ HY_GUARDED_BY(stateMutex_) = "unknown";
     Dictionary configuration_ HY_GUARDED_BY(stateMutex_);
     TransactionCompleteBlock transactionCompleteBlock_ HY_GUARDED_BY(stateMutex_);

@@ -195,10 +195,12 @@ void HYReportingSession::closeRelayReporting(AudioServiceType type) {
 
 void HYReportingSession::relay(Delivery delivery) {
     relayReportingQueue()->async(
-        [self = shared_from_this(), delivery = std::move(delivery)] { self->deliver(delivery); });
+        [self = shared_from_this(), delivery = std::move(delivery)]() mutable {
+            self->deliver(std::move(delivery));
+        });
 }
 
-void HYReportingSession::deliver(const Delivery& delivery) {
+void HYReportingSession::deliver(Delivery delivery) {
     HY_LOG_DEBUG(HYReportingSessionRelayReportingCategory, "entering relayreporting {}", __func__);
     if (!delivery.wasStarted) {
         HY_LOG_DEBUG(HYReportingSessionRelayReportingCategory,
@@ -217,11 +219,11 @@ void HYReportingSession::deliver(const Delivery& delivery) {
     }
     const MaybeError error = upload->sendMessageWithCategory(
         HYReportingUtilityRetrieveRelayReportingCategoryFromCategory(delivery.category),
-        delivery.type, delivery.tagged);
-    if (!error) { // A failure stays silent: the framework counts it.
+        delivery.type, std::move(delivery.tagged));
+    if (!error && delivery.original) { // A failure stays silent: the framework counts it.
         HY_LOG_DEBUG(HYReportingSessionRelayReportingCategory,
                      "RelayReportingAgent {} : message {} : category {} : type {}",
-                     upload->description(), Value(delivery.message), delivery.category,
+                     upload->description(), Value(*delivery.original), delivery.category,
                      delivery.type);
     }
 }

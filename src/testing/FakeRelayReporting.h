@@ -84,11 +84,11 @@ private:
             }
         }
         MaybeError sendMessageWithCategory(std::uint16_t category, std::uint32_t type,
-                                           const Dictionary& payload) override {
+                                           Dictionary payload) override {
             if (owner_.failure) {
                 return owner_.failure;
             }
-            upload_->messages.push_back({category, type, payload});
+            upload_->messages.push_back({category, type, std::move(payload)});
             return std::nullopt;
         }
         void flushMessages() override { ++upload_->flushes; }
