@@ -3,6 +3,8 @@
 #include <algorithm>
 #include <pthread.h>
 
+#include "linux/PooledSerialQueue.h"
+
 namespace halyard::linux_ {
 namespace {
 
@@ -94,6 +96,7 @@ std::vector<Reading> GuardedReader::read(std::span<const std::shared_ptr<Channel
             desk_->sources.push_back(sources[place]);
         }
         desk_->changed.notify_all();
+        WakeUpScope::flushCurrent(); // Nobody else has to wait for a source.
         const bool inTime = desk_->changed.wait_for(
             lock, patience_, [&] { return desk_->readings.size() == waiting.size(); });
         const std::size_t done = desk_->readings.size();
