@@ -94,6 +94,10 @@ LinuxPlatform::LinuxPlatform(Directories directories, platform::TraceMarks& trac
     platform::install(&platform_);
     configuration_.observe(
         [this](const Settings&, const Settings& after) { log_.setLevel(after.logLevel); });
+    // Before the first reading: a change that comes after that is told.
+    configurationWatch_ = std::make_unique<ConfigurationWatch>(
+        context_, std::filesystem::absolute(directories_.configuration), Configuration::kFileName,
+        [this] { (void)configuration_.reload(); });
     (void)configuration_.reload();
 
     store_ = std::make_unique<Store>(
@@ -174,7 +178,7 @@ std::optional<std::string> LinuxPlatform::open(platform::ListenerDelegate* deleg
     listener_->setDelegate(delegate);
     watchStopSignals();
     watchReloadSignal();
-    watchConfiguration();
+    observeConfiguration();
     return std::nullopt;
 }
 
@@ -196,13 +200,10 @@ void LinuxPlatform::watchReloadSignal() {
     });
 }
 
-void LinuxPlatform::watchConfiguration() {
+void LinuxPlatform::observeConfiguration() {
     configuration_.observe(
         [this](const Settings&, const Settings& after) { applySettings(after); });
     announceChangedPreferences(configuration_, notifications_);
-    configurationWatch_ = std::make_unique<ConfigurationWatch>(
-        context_, std::filesystem::absolute(directories_.configuration), Configuration::kFileName,
-        [this] { (void)configuration_.reload(); });
 }
 
 // The service queue answers the manager's watchdog: it is what must not hang.

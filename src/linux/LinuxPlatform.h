@@ -61,7 +61,7 @@ private:
     void applySettings(const Settings& settings);
     void watchStopSignals();
     void watchReloadSignal();
-    void watchConfiguration();
+    void observeConfiguration();
     void armWatchdog();
     void beginShutdown();
     void finishShutdown(bool inTime);
