@@ -229,6 +229,16 @@ void HYReportingServiceDelegate::stopAllSessions() {
     }
 }
 
+bool HYReportingServiceDelegate::isStopWaiting() const {
+    const auto clients = getAllClients();
+    return std::any_of(clients.begin(), clients.end(), [](const Client& client) {
+        const auto sessions = sessionsOf(*client);
+        return std::any_of(sessions.begin(), sessions.end(), [](const Session& session) {
+            return session->stopWaitsSince().has_value();
+        });
+    });
+}
+
 Dictionary HYReportingServiceDelegate::status() const {
     std::int64_t sessions = 0;
     std::int64_t started = 0;

@@ -60,6 +60,8 @@ public:
     // What operators see; the keys are listed in docs/wire.md. Any thread, but a
     // whole only on the service work queue.
     Dictionary status() const;
+    // Whether a session's stop waits for its trace to complete. Any thread.
+    bool isStopWaiting() const;
     // Ends every session as a lost connection does. On the service work queue.
     void stopAllSessions();
 

@@ -13,8 +13,48 @@ namespace {
 
 using protocol::Method;
 
-// How long the status waits for its turn.
+// How long the status waits for its turn before it looks for the reason.
 constexpr std::chrono::seconds kStatusPatience{1};
+
+// An answer with the status. It comes after the requests before it, which are in
+// it then; but a stop that waits for its trace holds up the service, and what it
+// waits for is what operators want to know, so then it is given at once.
+class PendingStatus : public std::enable_shared_from_this<PendingStatus> {
+public:
+    PendingStatus(protocol::Reply reply, std::weak_ptr<HYReportingServiceDelegate> service)
+        : reply_(std::move(reply)), service_(std::move(service)) {}
+
+    void answer() {
+        const auto service = service_.lock();
+        if (given_.test_and_set()) {
+            return;
+        }
+        Dictionary status = platform::current().operations->status();
+        if (service != nullptr) {
+            status.merge(service->status());
+        }
+        reply_(std::nullopt, status);
+    }
+    // Looks for such a stop every now and then until the answer is given.
+    void watch() {
+        queue_->asyncAfter(kStatusPatience, [self = shared_from_this()] {
+            const auto service = self->service_.lock();
+            if (service != nullptr && service->isStopWaiting()) {
+                self->answer();
+            } else if (!self->given_.test()) {
+                self->watch();
+            }
+        });
+    }
+
+private:
+    const protocol::Reply reply_;
+    const std::weak_ptr<HYReportingServiceDelegate> service_;
+    const std::shared_ptr<platform::SerialQueue> queue_ =
+        platform::current().queues->makeSerialQueue("com.kestrel.halyard.status",
+                                                    platform::QueuePriority::Utility);
+    std::atomic_flag given_;
+};
 
 BoolReply boolReply(protocol::Reply reply) {
     return [reply = std::move(reply)](const MaybeError& error, bool success) {
@@ -94,23 +134,10 @@ void RequestDispatch::handleAdministration(protocol::Request request) {
     }
 }
 
-// After the requests before it, so that they are in it; when something holds the
-// service up, operators learn what, instead of waiting as well.
 void RequestDispatch::answerStatus(const protocol::Reply& reply) const {
-    auto answer = [reply, service = service_, given = std::make_shared<std::atomic_flag>()] {
-        if (given->test_and_set()) {
-            return;
-        }
-        Dictionary status = platform::current().operations->status();
-        if (const auto alive = service.lock()) {
-            status.merge(alive->status());
-        }
-        reply(std::nullopt, status);
-    };
-    serviceQueue_->async(answer);
-    platform::current()
-        .queues->makeSerialQueue("com.kestrel.halyard.status", platform::QueuePriority::Utility)
-        ->asyncAfter(kStatusPatience, std::move(answer));
+    const auto pending = std::make_shared<PendingStatus>(reply, service_);
+    serviceQueue_->async([pending] { pending->answer(); });
+    pending->watch();
 }
 
 } // namespace halyard

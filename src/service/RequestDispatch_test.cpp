@@ -210,6 +210,15 @@ TEST_F(RequestDispatchTest, TheStatusShowsAStopThatWaitsForItsTraceWhileAllElseW
     EXPECT_EQ(tester.ask(Method::AdminStatus)->result.dictionary()["stops_waiting"], Value(List()));
 }
 
+TEST_F(RequestDispatchTest, AStatusKeepsItsPlaceHoweverLongTheRequestsBeforeItTake) {
+    const auto answer = ask(Method::AdminStatus);
+    service_->serviceQueue()->suspend(std::chrono::minutes(1), [] {});
+    platform_.queues.advance(std::chrono::seconds(59));
+    EXPECT_FALSE(answer->given());
+    platform_.queues.advance(std::chrono::seconds(2));
+    EXPECT_EQ(answer->count, 1);
+}
+
 TEST_F(RequestDispatchTest, TheStatusOfAGoneServiceIsThatOfTheAdapters) {
     platform_.operations.counters = {{"uptime_sec", 12}};
     const auto answer = ask(Method::AdminStatus);
