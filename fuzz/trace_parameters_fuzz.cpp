@@ -9,8 +9,8 @@
 #include "testing/TestPlatform.h"
 #include "tracing/TraceParamsParser.h"
 
-using halyard::fuzz::require;
 using halyard::TraceDataParams;
+using halyard::fuzz::require;
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     static halyard::testing::TestPlatform platform;

@@ -28,7 +28,8 @@ TraceResults readTraceResults(const std::filesystem::path& timeline) {
     const std::string tail = tailOf(timeline);
     const std::size_t at = tail.rfind(kMetadata);
     rapidjson::Document document;
-    if (at == std::string::npos || document.Parse(('{' + tail.substr(at)).c_str()).HasParseError()) {
+    if (at == std::string::npos ||
+        document.Parse(('{' + tail.substr(at)).c_str()).HasParseError()) {
         throw std::runtime_error(timeline.string() + " has no metadata");
     }
     const auto& trace = document["otherData"]["traces"][0];

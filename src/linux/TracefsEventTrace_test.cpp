@@ -43,7 +43,8 @@ Mark markFunction() {
 // A session with what it delivered.
 struct Traced {
     std::unique_ptr<platform::EventTraceSession> session;
-    std::vector<trace_point> points; // at rest once `completed` is ready
+    std::vector<trace_point> points; // ours; at rest once `completed` is ready
+    std::size_t pointsOfAll = 0;
     std::promise<void> completed;
 
     void end() {
@@ -88,6 +89,7 @@ protected:
         EXPECT_EQ(
             traced->session->addEventsRange(kFirst, kLast,
                                             [traced = traced.get()](const trace_point& point) {
+                                                ++traced->pointsOfAll;
                                                 // Tests beside this one may mark, too.
                                                 if (point.pid == ::getpid()) {
                                                     traced->points.push_back(point);
@@ -181,11 +183,13 @@ TEST_F(TracefsEventTraceTest, EventsBeyondTheBoundAreCountedAsLost) {
         mark_(kFirst, 0, 0, 0, 0);
     }
     traced->end();
-    EXPECT_THAT(traced->points, SizeIs(10));
-    EXPECT_EQ(traced->session->eventsLost(), 15U);
-    EXPECT_TRUE(
-        platform_.log.has(LogLevel::Error, HYReportingTraceCategory,
-                          "15 trace events lost: 0 by the kernel, 15 beyond the 10 that are kept"));
+    EXPECT_EQ(traced->pointsOfAll, 10U);
+    const std::uint64_t lost = traced->session->eventsLost();
+    EXPECT_GE(lost, 15U);
+    EXPECT_TRUE(platform_.log.has(
+        LogLevel::Error, HYReportingTraceCategory,
+        fmt::format("{0} trace events lost: 0 by the kernel, {0} beyond the 10 that are kept",
+                    lost)));
 }
 
 TEST_F(TracefsEventTraceTest, NothingStaysInTheKernel) {

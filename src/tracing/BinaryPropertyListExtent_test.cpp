@@ -88,8 +88,12 @@ TEST(BinaryPropertyListExtentTest, KeysAreTextsWithoutAZero) {
     const auto withKey = [](const std::string& key) {
         return measure(file({"\xD1\1\2"s, key, "\x09"}));
     };
-    EXPECT_NE(withKey("\x52" "kv"), std::nullopt);
-    EXPECT_EQ(withKey("\x52" "k\0"s), std::nullopt);
+    EXPECT_NE(withKey("\x52"
+                      "kv"),
+              std::nullopt);
+    EXPECT_EQ(withKey("\x52"
+                      "k\0"s),
+              std::nullopt);
     EXPECT_NE(withKey("\x61\0k"s), std::nullopt);
     EXPECT_EQ(withKey("\x61\0\0"s), std::nullopt);
     EXPECT_EQ(withKey("\x09"), std::nullopt);
