@@ -16,7 +16,7 @@ fi
 # Without git (a release archive, or a checkout that belongs to somebody else)
 # every file counts.
 sources() {
-    git ls-files -z -- '*.h' '*.cpp' '*.c' 2>/dev/null ||
+    git ls-files -z --cached --others --exclude-standard -- '*.h' '*.cpp' '*.c' 2>/dev/null ||
         find . -name 'build*' -prune -o \( -name '*.h' -o -name '*.cpp' -o -name '*.c' \) -print0
 }
 # $mode is a list of words.
