@@ -46,7 +46,8 @@ function(halyard_folder name)
   endif()
 endfunction()
 
-# halyard_test(NAME source...): a GoogleTest program whose cases ctest lists.
+# halyard_test(NAME source...): a GoogleTest program whose cases ctest lists. Those
+# that the filter NAME_serial names run while no other test does.
 function(halyard_test name)
   find_package(GTest REQUIRED)
   include(GoogleTest)
@@ -56,7 +57,12 @@ function(halyard_test name)
     # Its optimiser takes "text" + std::string() for overlapping (gcc bug 105651).
     target_compile_options(${name} PRIVATE $<$<CONFIG:Release>:-Wno-restrict>)
   endif()
-  gtest_discover_tests(${name} DISCOVERY_TIMEOUT 60 PROPERTIES TIMEOUT 120)
+  if(DEFINED ${name}_serial)
+    gtest_discover_tests(${name} DISCOVERY_TIMEOUT 60 TEST_FILTER "${${name}_serial}"
+      TEST_LIST ${name}_serial_TESTS PROPERTIES TIMEOUT 120 RUN_SERIAL TRUE)
+    set(others TEST_FILTER "-${${name}_serial}")
+  endif()
+  gtest_discover_tests(${name} DISCOVERY_TIMEOUT 60 ${others} PROPERTIES TIMEOUT 120)
 endfunction()
 
 # halyard_uses_rapidjson(file...): its stack adds to a null pointer before it has
