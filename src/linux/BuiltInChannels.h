@@ -5,7 +5,7 @@
 #include <vector>
 
 #include "linux/ChannelSource.h"
-#include "linux/Settings.h"
+#include "linux/DriverChannel.h"
 
 namespace halyard::linux_ {
 

@@ -15,7 +15,7 @@
 #include <vector>
 
 #include "linux/SampledFile.h"
-#include "linux/Settings.h"
+#include "linux/DriverChannel.h"
 #include "platform/Clock.h"
 
 namespace halyard::linux_ {

@@ -18,7 +18,7 @@
 #include "linux/ChannelSource.h"
 #include "linux/GuardedReader.h"
 #include "linux/SampleSet.h"
-#include "linux/Settings.h"
+#include "linux/DriverChannel.h"
 #include "platform/Clock.h"
 #include "platform/HWReport.h"
 

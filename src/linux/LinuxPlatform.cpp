@@ -24,15 +24,11 @@ constexpr std::chrono::seconds kShutdownLimit{25};
 // second: these rows take a slow machine less than that.
 constexpr StoreQueue::Marks kStoreMarks{12288, 6144, 16 * 1024 * 1024, 8 * 1024 * 1024};
 
-StoreLimits storeLimits(const Settings& settings) {
-    return {settings.store.maxBytes, settings.store.maxAge};
-}
-
 StoreOptions storeOptions(const std::filesystem::path& directory, const Settings& settings,
                           Pressure& pressure) {
     StoreOptions options;
     options.path = directory / kStoreFile;
-    options.limits = storeLimits(settings);
+    options.limits = settings.store;
     options.marks = kStoreMarks;
     options.onPressure = [&pressure](bool on) { pressure.set(Pressure::Store, on); };
     return options;
@@ -158,7 +154,7 @@ LinuxPlatform::~LinuxPlatform() {
 
 void LinuxPlatform::applySettings(const Settings& settings) {
     analytics_->setWanted(settings.wantedEvents);
-    store_->setLimits(storeLimits(settings));
+    store_->setLimits(settings.store);
 }
 
 PeerRights LinuxPlatform::rightsOfPeer(const Peer& peer) const {

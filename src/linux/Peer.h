@@ -5,9 +5,17 @@
 #include <string>
 #include <vector>
 
-#include "linux/Settings.h"
-
 namespace halyard::linux_ {
+
+// Names, or numeric ids in decimal, of those who are let in beside the daemon's
+// own user and root.
+struct Access {
+    std::vector<std::string> users;
+    std::vector<std::string> groups;
+    std::vector<std::string> adminUsers;
+
+    bool operator==(const Access&) const = default;
+};
 
 struct Peer {
     std::int32_t pid = 0;

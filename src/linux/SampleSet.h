@@ -14,7 +14,7 @@
 #include <vector>
 
 #include "linux/ChannelSource.h"
-#include "linux/Settings.h"
+#include "linux/DriverChannel.h"
 #include "platform/HWReport.h"
 
 namespace halyard::linux_ {

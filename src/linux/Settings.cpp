@@ -5,6 +5,7 @@
 #include <limits>
 #include <span>
 
+#include "linux/Quantities.h"
 #include "linux/TomlValue.h"
 
 namespace halyard::linux_ {
@@ -330,7 +331,7 @@ void SettingsReader::readMaxBytes(const toml::node& node, const std::string& nam
     }
     if (!bytes) {
         fail(node, fmt::format("{} must be a size such as \"256MiB\" or a number of bytes", name));
-    } else if (*bytes < StoreSettings::kLeastBytes) {
+    } else if (*bytes < StoreLimits::kLeastBytes) {
         fail(node, fmt::format("{} must be at least 256KiB", name));
     } else {
         settings().store.maxBytes = *bytes;

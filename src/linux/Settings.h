@@ -15,44 +15,11 @@
 
 #include "common/LogCategory.h"
 #include "common/Value.h"
-#include "linux/Quantities.h"
+#include "linux/DriverChannel.h"
+#include "linux/Peer.h"
+#include "linux/StoreLimits.h"
 
 namespace halyard::linux_ {
-
-enum class ChannelFormat : std::uint8_t { Simple, State, Histogram };
-
-// A statistics channel beside the built-in ones. At least one of group and
-// subgroup is there.
-struct DriverChannel {
-    std::optional<std::string> group;
-    std::optional<std::string> subgroup;
-    std::string driver;
-    std::string name; // not empty
-    std::string unit;
-    ChannelFormat format = ChannelFormat::Simple;
-    std::string source; // "SCHEME:REST", neither part empty
-
-    bool operator==(const DriverChannel&) const = default;
-};
-
-// Names, or numeric ids in decimal, of those who are let in beside the daemon's
-// own user and root.
-struct Access {
-    std::vector<std::string> users;
-    std::vector<std::string> groups;
-    std::vector<std::string> adminUsers;
-
-    bool operator==(const Access&) const = default;
-};
-
-struct StoreSettings {
-    static constexpr std::uint64_t kLeastBytes = 256 * kKiB;
-
-    std::uint64_t maxBytes = 256 * kMiB;
-    std::chrono::seconds maxAge = std::chrono::hours(7 * 24);
-
-    bool operator==(const StoreSettings&) const = default;
-};
 
 struct Settings {
     using Switches = std::map<std::string, bool, std::less<>>;
@@ -62,7 +29,7 @@ struct Settings {
     Switches deviceProperties;
     std::vector<std::string> wantedEvents{"com.kestrel.halyard.*"}; // shell patterns
     Access access;
-    StoreSettings store;
+    StoreLimits store;
     LogLevel logLevel = LogLevel::Info;
     std::vector<DriverChannel> driverChannels;
 
@@ -95,7 +62,6 @@ struct ParsedSettings {
 };
 
 inline constexpr std::size_t kMaxSettingsWarnings = 32;
-inline constexpr std::size_t kMaxDriverChannels = 1024;
 // Of lists and dictionaries within a preference.
 inline constexpr int kMaxPreferenceDepth = 32;
 

@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 
 #include "common/Description.h"
+#include "linux/Quantities.h"
 
 namespace halyard::linux_ {
 namespace {

@@ -6,6 +6,8 @@
 #include <string>
 #include <string_view>
 
+#include "linux/StoreLimits.h"
+
 namespace halyard::linux_ {
 namespace {
 

@@ -17,13 +17,6 @@
 
 namespace halyard::linux_ {
 
-struct StoreLimits {
-    static constexpr std::uint64_t kLeastBytes = 256 * 1024;
-
-    std::uint64_t maxBytes = 256 * 1024 * 1024; // at least kLeastBytes
-    std::chrono::seconds maxAge = std::chrono::days(7);
-};
-
 class StoreRetention {
 public:
     static constexpr std::int64_t kSlabRows = 1024;

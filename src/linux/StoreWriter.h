@@ -14,6 +14,7 @@
 
 #include "common/Mutex.h"
 #include "linux/StoreDatabase.h"
+#include "linux/StoreLimits.h"
 #include "linux/StoreQueue.h"
 #include "linux/StoreRetention.h"
 #include "platform/Clock.h"

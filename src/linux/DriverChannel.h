@@ -1,0 +1,29 @@
+// A statistics channel as an operator orders it: what it is called, and where its
+// numbers come from. A plain value.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <optional>
+#include <string>
+
+namespace halyard::linux_ {
+
+enum class ChannelFormat : std::uint8_t { Simple, State, Histogram };
+
+// Beside the built-in ones. At least one of group and subgroup is there.
+struct DriverChannel {
+    std::optional<std::string> group;
+    std::optional<std::string> subgroup;
+    std::string driver;
+    std::string name; // not empty
+    std::string unit;
+    ChannelFormat format = ChannelFormat::Simple;
+    std::string source; // "SCHEME:REST", neither part empty
+
+    bool operator==(const DriverChannel&) const = default;
+};
+
+inline constexpr std::size_t kMaxDriverChannels = 1024;
+
+} // namespace halyard::linux_
