@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <pthread.h>
 
-#include "linux/PooledSerialQueue.h"
+#include "linux/queues/PooledSerialQueue.h"
 
 namespace halyard::linux_ {
 namespace {

@@ -23,7 +23,7 @@
 #include <string_view>
 #include <vector>
 
-#include "linux/Worker.h"
+#include "linux/queues/Worker.h"
 #include "platform/Clock.h"
 #include "platform/IncidentReporter.h"
 

@@ -5,7 +5,7 @@
 #include <mutex>
 #include <random>
 
-#include "linux/PooledSerialQueue.h"
+#include "linux/queues/PooledSerialQueue.h"
 
 namespace halyard::linux_ {
 namespace {

@@ -16,9 +16,9 @@
 #include <vector>
 
 #include "linux/ChannelSource.h"
+#include "linux/DriverChannel.h"
 #include "linux/GuardedReader.h"
 #include "linux/SampleSet.h"
-#include "linux/DriverChannel.h"
 #include "platform/Clock.h"
 #include "platform/HWReport.h"
 

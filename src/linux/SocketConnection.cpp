@@ -6,7 +6,7 @@
 #include <sys/socket.h>
 #include <utility>
 
-#include "linux/PooledSerialQueue.h"
+#include "linux/queues/PooledSerialQueue.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {

@@ -22,10 +22,10 @@
 #include <unordered_set>
 
 #include "common/Mutex.h"
-#include "linux/Charge.h"
 #include "linux/Peer.h"
-#include "linux/Pressure.h"
 #include "linux/ProcessList.h"
+#include "linux/queues/Charge.h"
+#include "linux/queues/Pressure.h"
 #include "platform/Listener.h"
 #include "protocol/Wire.h"
 

@@ -16,8 +16,8 @@
 #include <vector>
 
 #include "linux/Peer.h"
-#include "linux/Pressure.h"
 #include "linux/SocketConnection.h"
+#include "linux/queues/Pressure.h"
 #include "platform/Listener.h"
 
 namespace halyard::linux_ {

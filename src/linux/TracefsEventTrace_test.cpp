@@ -13,7 +13,7 @@
 #include <unistd.h>
 
 #include "linux/MarkLibraries.h"
-#include "linux/Queues.h"
+#include "linux/queues/Queues.h"
 #include "testing/TempTree.h"
 #include "testing/TestPlatform.h"
 

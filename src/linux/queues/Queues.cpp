@@ -1,4 +1,4 @@
-#include "linux/Queues.h"
+#include "linux/queues/Queues.h"
 
 #include <algorithm>
 #include <asio/post.hpp>

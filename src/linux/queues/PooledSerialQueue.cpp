@@ -1,4 +1,4 @@
-#include "linux/PooledSerialQueue.h"
+#include "linux/queues/PooledSerialQueue.h"
 
 #include <cassert>
 #include <iterator>

@@ -12,9 +12,9 @@
 #include <vector>
 
 #include "common/Mutex.h"
-#include "linux/PooledSerialQueue.h"
-#include "linux/Pressure.h"
-#include "linux/Worker.h"
+#include "linux/queues/PooledSerialQueue.h"
+#include "linux/queues/Pressure.h"
+#include "linux/queues/Worker.h"
 #include "platform/WorkQueue.h"
 
 namespace halyard::linux_ {

@@ -1,4 +1,4 @@
-#include "linux/Worker.h"
+#include "linux/queues/Worker.h"
 
 #include <csignal>
 #include <pthread.h>

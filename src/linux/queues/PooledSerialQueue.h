@@ -11,8 +11,8 @@
 #include <vector>
 
 #include "common/Mutex.h"
-#include "linux/Charge.h"
-#include "linux/Worker.h"
+#include "linux/queues/Charge.h"
+#include "linux/queues/Worker.h"
 #include "platform/WorkQueue.h"
 
 namespace halyard::linux_ {
