@@ -3,8 +3,8 @@
 
 #include <benchmark/benchmark.h>
 
-#include "linux/LinuxFacts.h"
 #include "linux/LinuxHWReport.h"
+#include "linux/system/LinuxFacts.h"
 
 namespace {
 

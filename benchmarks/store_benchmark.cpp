@@ -10,8 +10,8 @@
 #include <string>
 
 #include "common/Json.h"
-#include "linux/LinuxFacts.h"
 #include "linux/Store.h"
+#include "linux/system/LinuxFacts.h"
 
 namespace {
 

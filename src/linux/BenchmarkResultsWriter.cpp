@@ -9,8 +9,8 @@
 
 #include "common/Description.h"
 #include "common/Utf8.h"
-#include "linux/AtomicFile.h"
 #include "linux/TimelineFile.h"
+#include "linux/system/AtomicFile.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {

@@ -5,7 +5,7 @@
 // Both appear whole or not at all. Writers are for one thread at a time.
 #pragma once
 
-#include "linux/Directories.h"
+#include "linux/system/Directories.h"
 #include "platform/Clock.h"
 #include "platform/ResultsWriter.h"
 

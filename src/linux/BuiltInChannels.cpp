@@ -7,7 +7,7 @@
 #include <optional>
 #include <set>
 
-#include "linux/SmallFile.h"
+#include "linux/system/SmallFile.h"
 
 namespace halyard::linux_ {
 namespace {

@@ -4,7 +4,7 @@
 #include <charconv>
 #include <fmt/format.h>
 
-#include "linux/SmallFile.h"
+#include "linux/system/SmallFile.h"
 
 namespace halyard::linux_ {
 namespace {

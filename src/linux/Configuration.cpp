@@ -2,7 +2,7 @@
 
 #include <utility>
 
-#include "linux/SmallFile.h"
+#include "linux/system/SmallFile.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {

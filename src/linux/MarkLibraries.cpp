@@ -9,7 +9,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "linux/SmallFile.h"
+#include "linux/system/SmallFile.h"
 
 namespace halyard::linux_ {
 namespace {

@@ -3,7 +3,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "linux/NotificationCenter.h"
+#include "linux/system/NotificationCenter.h"
 #include "testing/ManualQueues.h"
 #include "testing/TempTree.h"
 

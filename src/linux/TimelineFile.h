@@ -13,7 +13,7 @@
 #include <system_error>
 #include <vector>
 
-#include "linux/AtomicFile.h"
+#include "linux/system/AtomicFile.h"
 #include "platform/ResultsWriter.h"
 
 namespace halyard::linux_ {

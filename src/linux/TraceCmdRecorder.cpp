@@ -8,8 +8,8 @@
 #include <vector>
 
 #include "common/Mutex.h"
-#include "linux/ChildProcess.h"
-#include "linux/LinuxFiles.h"
+#include "linux/system/ChildProcess.h"
+#include "linux/system/LinuxFiles.h"
 
 namespace halyard::linux_ {
 namespace {

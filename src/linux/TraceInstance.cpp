@@ -8,8 +8,8 @@
 #include <thread>
 #include <unistd.h>
 
-#include "linux/SmallFile.h"
 #include "linux/Tracefs.h"
+#include "linux/system/SmallFile.h"
 
 namespace halyard::linux_ {
 namespace {

@@ -9,7 +9,7 @@
 #include <fmt/format.h>
 #include <unistd.h>
 
-#include "linux/SmallFile.h"
+#include "linux/system/SmallFile.h"
 
 extern "C" {
 #include <kbuffer.h>

@@ -11,7 +11,7 @@
 #include <unistd.h>
 #include <vector>
 
-#include "linux/SmallFile.h"
+#include "linux/system/SmallFile.h"
 
 namespace halyard::linux_ {
 namespace {

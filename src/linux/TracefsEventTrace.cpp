@@ -13,10 +13,10 @@
 #include <utility>
 
 #include "linux/MarkLibraries.h"
-#include "linux/SmallFile.h"
 #include "linux/TraceDelivery.h"
 #include "linux/TraceInstance.h"
 #include "linux/TraceReader.h"
+#include "linux/system/SmallFile.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {

@@ -3,8 +3,8 @@
 #include <variant>
 
 #include "halyard/halyard.h"
-#include "linux/Directories.h"
 #include "linux/LinuxPlatform.h"
+#include "linux/system/Directories.h"
 #include "platform/Log.h"
 #include "service/HYReportingServiceDelegate.h"
 

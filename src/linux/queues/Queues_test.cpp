@@ -8,7 +8,7 @@
 #include <mutex>
 #include <thread>
 
-#include "linux/LinuxFacts.h"
+#include "linux/system/LinuxFacts.h"
 
 namespace halyard::linux_ {
 namespace {

@@ -4,7 +4,7 @@
 // Any thread.
 #pragma once
 
-#include "linux/Directories.h"
+#include "linux/system/Directories.h"
 #include "platform/Files.h"
 
 namespace halyard::linux_ {

@@ -1,4 +1,4 @@
-#include "linux/IncidentFolder.h"
+#include "linux/system/IncidentFolder.h"
 
 #include <algorithm>
 #include <cstdlib>
@@ -10,7 +10,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "linux/ProcessFacts.h"
+#include "linux/system/ProcessFacts.h"
 #include "testing/ManualClock.h"
 
 namespace halyard::linux_ {

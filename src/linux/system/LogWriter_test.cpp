@@ -1,4 +1,4 @@
-#include "linux/LogWriter.h"
+#include "linux/system/LogWriter.h"
 
 #include <gtest/gtest.h>
 

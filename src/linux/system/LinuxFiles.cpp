@@ -1,10 +1,10 @@
-#include "linux/LinuxFiles.h"
+#include "linux/system/LinuxFiles.h"
 
 #include <cerrno>
 #include <sys/stat.h>
 
-#include "linux/AtomicFile.h"
-#include "linux/SmallFile.h"
+#include "linux/system/AtomicFile.h"
+#include "linux/system/SmallFile.h"
 
 namespace halyard::linux_ {
 namespace {

@@ -1,4 +1,4 @@
-#include "linux/Directories.h"
+#include "linux/system/Directories.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>

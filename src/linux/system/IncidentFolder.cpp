@@ -1,4 +1,4 @@
-#include "linux/IncidentFolder.h"
+#include "linux/system/IncidentFolder.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -12,7 +12,7 @@
 
 #include "common/Description.h"
 #include "common/Json.h"
-#include "linux/ProcessFacts.h"
+#include "linux/system/ProcessFacts.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {

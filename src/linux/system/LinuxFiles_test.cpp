@@ -1,11 +1,11 @@
-#include "linux/LinuxFiles.h"
+#include "linux/system/LinuxFiles.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
-#include "linux/AtomicFile.h"
-#include "linux/SmallFile.h"
+#include "linux/system/AtomicFile.h"
+#include "linux/system/SmallFile.h"
 #include "testing/TempTree.h"
 
 namespace halyard::linux_ {

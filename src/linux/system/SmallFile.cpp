@@ -1,4 +1,4 @@
-#include "linux/SmallFile.h"
+#include "linux/system/SmallFile.h"
 
 #include <cerrno>
 #include <fcntl.h>

@@ -1,4 +1,4 @@
-#include "linux/LinuxFacts.h"
+#include "linux/system/LinuxFacts.h"
 
 #include <condition_variable>
 #include <ctime>

@@ -1,4 +1,4 @@
-#include "linux/NotificationCenter.h"
+#include "linux/system/NotificationCenter.h"
 
 #include <utility>
 #include <vector>

@@ -1,4 +1,4 @@
-#include "linux/ProcessFacts.h"
+#include "linux/system/ProcessFacts.h"
 
 #include <algorithm>
 #include <array>

@@ -1,9 +1,9 @@
-#include "linux/ProcProcessTable.h"
+#include "linux/system/ProcProcessTable.h"
 
 #include <unistd.h>
 #include <utility>
 
-#include "linux/SmallFile.h"
+#include "linux/system/SmallFile.h"
 
 namespace halyard::linux_ {
 namespace {

@@ -1,4 +1,4 @@
-#include "linux/ProcProcessTable.h"
+#include "linux/system/ProcProcessTable.h"
 
 #include <csignal>
 #include <gtest/gtest.h>

@@ -1,4 +1,4 @@
-#include "linux/AtomicFile.h"
+#include "linux/system/AtomicFile.h"
 
 #include <atomic>
 #include <cerrno>

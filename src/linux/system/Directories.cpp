@@ -1,4 +1,4 @@
-#include "linux/Directories.h"
+#include "linux/system/Directories.h"
 
 #include <algorithm>
 #include <cerrno>

@@ -1,4 +1,4 @@
-#include "linux/ChildProcess.h"
+#include "linux/system/ChildProcess.h"
 
 #include <cerrno>
 #include <csignal>
