@@ -28,7 +28,8 @@ FOLDERS = {
     # The rooms of linux/ have an order of their own.
     "linux/queues": BASE,
     "linux/system": BASE | {"linux/queues"},
-    "linux": BASE | {"linux/queues", "linux/system"},
+    "linux/net": BASE | {"linux/queues", "linux/system"},
+    "linux": BASE | {"linux/queues", "linux/system", "linux/net"},
     "client": {"common", "protocol"},
     "testing": BASE,
 }

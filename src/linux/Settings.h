@@ -16,8 +16,8 @@
 #include "common/LogCategory.h"
 #include "common/Value.h"
 #include "linux/DriverChannel.h"
-#include "linux/Peer.h"
 #include "linux/StoreLimits.h"
+#include "linux/net/Peer.h"
 
 namespace halyard::linux_ {
 

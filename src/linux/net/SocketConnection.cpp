@@ -1,4 +1,4 @@
-#include "linux/SocketConnection.h"
+#include "linux/net/SocketConnection.h"
 
 #include <asio/post.hpp>
 #include <cerrno>

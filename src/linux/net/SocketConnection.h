@@ -22,8 +22,8 @@
 #include <unordered_set>
 
 #include "common/Mutex.h"
-#include "linux/Peer.h"
-#include "linux/ProcessList.h"
+#include "linux/net/Peer.h"
+#include "linux/net/ProcessList.h"
 #include "linux/queues/Charge.h"
 #include "linux/queues/Pressure.h"
 #include "platform/Listener.h"

@@ -1,4 +1,4 @@
-#include "linux/Peer.h"
+#include "linux/net/Peer.h"
 
 #include <algorithm>
 #include <charconv>

@@ -15,8 +15,8 @@
 #include <unordered_set>
 #include <vector>
 
-#include "linux/Peer.h"
-#include "linux/SocketConnection.h"
+#include "linux/net/Peer.h"
+#include "linux/net/SocketConnection.h"
 #include "linux/queues/Pressure.h"
 #include "platform/Listener.h"
 

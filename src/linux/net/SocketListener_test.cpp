@@ -1,4 +1,4 @@
-#include "linux/SocketListener.h"
+#include "linux/net/SocketListener.h"
 
 #include <gtest/gtest.h>
 
