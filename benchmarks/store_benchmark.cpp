@@ -10,7 +10,7 @@
 #include <string>
 
 #include "common/Json.h"
-#include "linux/Store.h"
+#include "linux/store/Store.h"
 #include "linux/system/LinuxFacts.h"
 
 namespace {

@@ -29,7 +29,8 @@ FOLDERS = {
     "linux/queues": BASE,
     "linux/system": BASE | {"linux/queues"},
     "linux/net": BASE | {"linux/queues", "linux/system"},
-    "linux": BASE | {"linux/queues", "linux/system", "linux/net"},
+    "linux/store": BASE,
+    "linux": BASE | {"linux/queues", "linux/system", "linux/net", "linux/store"},
     "client": {"common", "protocol"},
     "testing": BASE,
 }

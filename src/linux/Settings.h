@@ -16,8 +16,8 @@
 #include "common/LogCategory.h"
 #include "common/Value.h"
 #include "linux/DriverChannel.h"
-#include "linux/StoreLimits.h"
 #include "linux/net/Peer.h"
+#include "linux/store/StoreLimits.h"
 
 namespace halyard::linux_ {
 

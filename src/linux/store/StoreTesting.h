@@ -13,7 +13,7 @@
 #include <string>
 #include <vector>
 
-#include "linux/Store.h"
+#include "linux/store/Store.h"
 #include "platform/Log.h"
 #include "platform/Platform.h"
 

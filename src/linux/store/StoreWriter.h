@@ -13,10 +13,10 @@
 #include <vector>
 
 #include "common/Mutex.h"
-#include "linux/StoreDatabase.h"
-#include "linux/StoreLimits.h"
-#include "linux/StoreQueue.h"
-#include "linux/StoreRetention.h"
+#include "linux/store/StoreDatabase.h"
+#include "linux/store/StoreLimits.h"
+#include "linux/store/StoreQueue.h"
+#include "linux/store/StoreRetention.h"
 #include "platform/Clock.h"
 
 namespace halyard::linux_ {

@@ -1,4 +1,4 @@
-#include "linux/StoreRetention.h"
+#include "linux/store/StoreRetention.h"
 
 #include <algorithm>
 #include <fmt/format.h>
@@ -6,7 +6,7 @@
 #include <string>
 #include <string_view>
 
-#include "linux/StoreLimits.h"
+#include "linux/store/StoreLimits.h"
 
 namespace halyard::linux_ {
 namespace {

@@ -7,8 +7,8 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include "linux/StoreFaultyDisk.h"
-#include "linux/StoreTesting.h"
+#include "linux/store/StoreFaultyDisk.h"
+#include "linux/store/StoreTesting.h"
 
 namespace halyard::linux_ {
 namespace {

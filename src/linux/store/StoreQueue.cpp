@@ -1,4 +1,4 @@
-#include "linux/StoreQueue.h"
+#include "linux/store/StoreQueue.h"
 
 #include <algorithm>
 #include <iterator>

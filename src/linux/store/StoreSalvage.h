@@ -11,7 +11,7 @@
 #include <cstdint>
 #include <filesystem>
 
-#include "linux/StoreSqlite.h"
+#include "linux/store/StoreSqlite.h"
 #include "platform/Clock.h"
 
 namespace halyard::linux_ {

@@ -1,11 +1,11 @@
 // Files that are damaged, foreign or from the future.
 
-#include "linux/StoreSalvage.h"
+#include "linux/store/StoreSalvage.h"
 
 #include <fstream>
 #include <sstream>
 
-#include "linux/StoreTesting.h"
+#include "linux/store/StoreTesting.h"
 
 namespace halyard::linux_ {
 namespace {

@@ -17,7 +17,7 @@
 #include <string_view>
 #include <thread>
 
-#include "linux/StoreWriter.h"
+#include "linux/store/StoreWriter.h"
 
 namespace halyard::linux_ {
 

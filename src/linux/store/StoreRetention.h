@@ -13,7 +13,7 @@
 #include <cstdint>
 #include <optional>
 
-#include "linux/StoreDatabase.h"
+#include "linux/store/StoreDatabase.h"
 
 namespace halyard::linux_ {
 

@@ -1,4 +1,4 @@
-#include "linux/StoreRelayReporting.h"
+#include "linux/store/StoreRelayReporting.h"
 
 #include <algorithm>
 #include <fmt/format.h>

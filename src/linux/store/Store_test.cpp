@@ -1,8 +1,8 @@
 // The store as its users and an outside reader see it, while all goes well.
 
-#include "linux/Store.h"
+#include "linux/store/Store.h"
 
-#include "linux/StoreTesting.h"
+#include "linux/store/StoreTesting.h"
 
 namespace halyard::linux_ {
 namespace {

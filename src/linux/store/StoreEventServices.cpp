@@ -1,4 +1,4 @@
-#include "linux/StoreEventServices.h"
+#include "linux/store/StoreEventServices.h"
 
 #include <algorithm>
 #include <fnmatch.h>

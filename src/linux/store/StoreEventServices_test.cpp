@@ -1,6 +1,6 @@
-#include "linux/StoreEventServices.h"
+#include "linux/store/StoreEventServices.h"
 
-#include "linux/StoreTesting.h"
+#include "linux/store/StoreTesting.h"
 
 namespace halyard::linux_ {
 namespace {

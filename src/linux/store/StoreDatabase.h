@@ -20,8 +20,8 @@
 #include <vector>
 
 #include "common/Json.h"
-#include "linux/StoreRow.h"
-#include "linux/StoreSqlite.h"
+#include "linux/store/StoreRow.h"
+#include "linux/store/StoreSqlite.h"
 
 namespace halyard::linux_ {
 

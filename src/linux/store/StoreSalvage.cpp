@@ -1,4 +1,4 @@
-#include "linux/StoreSalvage.h"
+#include "linux/store/StoreSalvage.h"
 
 #include <algorithm>
 #include <array>

@@ -1,6 +1,6 @@
-#include "linux/StoreRetention.h"
+#include "linux/store/StoreRetention.h"
 
-#include "linux/StoreTesting.h"
+#include "linux/store/StoreTesting.h"
 
 namespace halyard::linux_ {
 namespace {

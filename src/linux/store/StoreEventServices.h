@@ -8,7 +8,7 @@
 #include <vector>
 
 #include "common/Mutex.h"
-#include "linux/Store.h"
+#include "linux/store/Store.h"
 #include "platform/EventServices.h"
 
 namespace halyard::linux_ {

@@ -1,4 +1,4 @@
-#include "linux/Store.h"
+#include "linux/store/Store.h"
 
 #include <condition_variable>
 #include <csignal>

@@ -3,7 +3,7 @@
 // Any thread.
 #pragma once
 
-#include "linux/Store.h"
+#include "linux/store/Store.h"
 #include "platform/Random.h"
 #include "platform/RelayReporting.h"
 

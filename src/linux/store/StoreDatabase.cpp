@@ -1,4 +1,4 @@
-#include "linux/StoreDatabase.h"
+#include "linux/store/StoreDatabase.h"
 
 #include <cerrno>
 #include <fmt/format.h>

@@ -1,4 +1,4 @@
-#include "linux/StoreWriter.h"
+#include "linux/store/StoreWriter.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -6,7 +6,7 @@
 #include <numeric>
 #include <utility>
 
-#include "linux/StoreSalvage.h"
+#include "linux/store/StoreSalvage.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {

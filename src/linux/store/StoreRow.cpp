@@ -1,4 +1,4 @@
-#include "linux/StoreRow.h"
+#include "linux/store/StoreRow.h"
 
 namespace halyard::linux_ {
 namespace {

@@ -1,6 +1,6 @@
-#include "linux/StoreRelayReporting.h"
+#include "linux/store/StoreRelayReporting.h"
 
-#include "linux/StoreTesting.h"
+#include "linux/store/StoreTesting.h"
 #include "testing/FakeTraceMarks.h"
 
 namespace halyard::linux_ {

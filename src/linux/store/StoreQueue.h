@@ -18,7 +18,7 @@
 #include <vector>
 
 #include "common/Mutex.h"
-#include "linux/StoreRow.h"
+#include "linux/store/StoreRow.h"
 
 namespace halyard::linux_ {
 
