@@ -3,7 +3,7 @@
 
 #include <benchmark/benchmark.h>
 
-#include "linux/LinuxHWReport.h"
+#include "linux/drivers/LinuxHWReport.h"
 #include "linux/system/LinuxFacts.h"
 
 namespace {

@@ -7,8 +7,8 @@
 #include <variant>
 
 #include "Require.h"
-#include "linux/ChannelSource.h"
-#include "linux/SourceText.h"
+#include "linux/drivers/ChannelSource.h"
+#include "linux/drivers/SourceText.h"
 
 using halyard::fuzz::require;
 using namespace halyard::linux_;

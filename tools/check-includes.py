@@ -30,7 +30,8 @@ FOLDERS = {
     "linux/system": BASE | {"linux/queues"},
     "linux/net": BASE | {"linux/queues", "linux/system"},
     "linux/store": BASE,
-    "linux": BASE | {"linux/queues", "linux/system", "linux/net", "linux/store"},
+    "linux/drivers": BASE | {"linux/queues", "linux/system"},
+    "linux": BASE | {"linux/queues", "linux/system", "linux/net", "linux/store", "linux/drivers"},
     "client": {"common", "protocol"},
     "testing": BASE,
 }

@@ -15,7 +15,7 @@
 
 #include "common/LogCategory.h"
 #include "common/Value.h"
-#include "linux/DriverChannel.h"
+#include "linux/drivers/DriverChannel.h"
 #include "linux/net/Peer.h"
 #include "linux/store/StoreLimits.h"
 

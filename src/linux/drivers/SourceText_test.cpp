@@ -1,4 +1,4 @@
-#include "linux/SourceText.h"
+#include "linux/drivers/SourceText.h"
 
 #include <gmock/gmock.h>
 #include <limits>

@@ -1,4 +1,4 @@
-#include "linux/SampleSet.h"
+#include "linux/drivers/SampleSet.h"
 
 #include <gmock/gmock.h>
 #include <limits>

@@ -1,4 +1,4 @@
-#include "linux/BuiltInChannels.h"
+#include "linux/drivers/BuiltInChannels.h"
 
 #include <algorithm>
 #include <filesystem>

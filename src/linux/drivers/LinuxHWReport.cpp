@@ -1,10 +1,10 @@
-#include "linux/LinuxHWReport.h"
+#include "linux/drivers/LinuxHWReport.h"
 
 #include <algorithm>
 #include <fmt/format.h>
 #include <tuple>
 
-#include "linux/BuiltInChannels.h"
+#include "linux/drivers/BuiltInChannels.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {

@@ -14,8 +14,8 @@
 #include <variant>
 #include <vector>
 
-#include "linux/DriverChannel.h"
-#include "linux/SampledFile.h"
+#include "linux/drivers/DriverChannel.h"
+#include "linux/drivers/SampledFile.h"
 #include "platform/Clock.h"
 
 namespace halyard::linux_ {

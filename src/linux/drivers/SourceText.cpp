@@ -1,4 +1,4 @@
-#include "linux/SourceText.h"
+#include "linux/drivers/SourceText.h"
 
 #include <algorithm>
 #include <charconv>

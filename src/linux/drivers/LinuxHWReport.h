@@ -15,10 +15,10 @@
 #include <string>
 #include <vector>
 
-#include "linux/ChannelSource.h"
-#include "linux/DriverChannel.h"
-#include "linux/GuardedReader.h"
-#include "linux/SampleSet.h"
+#include "linux/drivers/ChannelSource.h"
+#include "linux/drivers/DriverChannel.h"
+#include "linux/drivers/GuardedReader.h"
+#include "linux/drivers/SampleSet.h"
 #include "platform/Clock.h"
 #include "platform/HWReport.h"
 

@@ -4,8 +4,8 @@
 
 #include <vector>
 
-#include "linux/ChannelSource.h"
-#include "linux/DriverChannel.h"
+#include "linux/drivers/ChannelSource.h"
+#include "linux/drivers/DriverChannel.h"
 
 namespace halyard::linux_ {
 

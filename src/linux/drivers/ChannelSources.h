@@ -7,8 +7,8 @@
 #include <string>
 #include <vector>
 
-#include "linux/ChannelSource.h"
-#include "linux/SourceText.h"
+#include "linux/drivers/ChannelSource.h"
+#include "linux/drivers/SourceText.h"
 
 namespace halyard::linux_ {
 

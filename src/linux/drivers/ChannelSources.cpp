@@ -1,4 +1,4 @@
-#include "linux/ChannelSources.h"
+#include "linux/drivers/ChannelSources.h"
 
 #include <algorithm>
 #include <charconv>

@@ -1,7 +1,7 @@
 #include <chrono>
 #include <gmock/gmock.h>
 
-#include "linux/ChannelSource.h"
+#include "linux/drivers/ChannelSource.h"
 #include "testing/TempTree.h"
 
 namespace halyard::linux_ {

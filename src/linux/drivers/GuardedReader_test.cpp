@@ -1,4 +1,4 @@
-#include "linux/GuardedReader.h"
+#include "linux/drivers/GuardedReader.h"
 
 #include <future>
 #include <gtest/gtest.h>

@@ -1,11 +1,11 @@
-#include "linux/ChannelSource.h"
+#include "linux/drivers/ChannelSource.h"
 
 #include <charconv>
 #include <fmt/format.h>
 #include <optional>
 
-#include "linux/ChannelSources.h"
-#include "linux/SourceText.h"
+#include "linux/drivers/ChannelSources.h"
+#include "linux/drivers/SourceText.h"
 
 namespace halyard::linux_ {
 namespace {

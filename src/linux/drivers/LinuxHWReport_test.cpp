@@ -1,9 +1,9 @@
-#include "linux/LinuxHWReport.h"
+#include "linux/drivers/LinuxHWReport.h"
 
 #include <algorithm>
 #include <gmock/gmock.h>
 
-#include "linux/BuiltInChannels.h"
+#include "linux/drivers/BuiltInChannels.h"
 #include "testing/TempTree.h"
 #include "testing/TestPlatform.h"
 

@@ -18,7 +18,7 @@
 #include <thread>
 #include <vector>
 
-#include "linux/ChannelSource.h"
+#include "linux/drivers/ChannelSource.h"
 #include "platform/Clock.h"
 
 namespace halyard::linux_ {

@@ -1,4 +1,4 @@
-#include "linux/SampledFile.h"
+#include "linux/drivers/SampledFile.h"
 
 #include <filesystem>
 #include <gtest/gtest.h>

@@ -13,8 +13,8 @@
 #include <string>
 #include <vector>
 
-#include "linux/ChannelSource.h"
-#include "linux/DriverChannel.h"
+#include "linux/drivers/ChannelSource.h"
+#include "linux/drivers/DriverChannel.h"
 #include "platform/HWReport.h"
 
 namespace halyard::linux_ {
