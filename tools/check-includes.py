@@ -31,7 +31,8 @@ FOLDERS = {
     "linux/net": BASE | {"linux/queues", "linux/system"},
     "linux/store": BASE,
     "linux/drivers": BASE | {"linux/queues", "linux/system"},
-    "linux": BASE | {"linux/queues", "linux/system", "linux/net", "linux/store", "linux/drivers"},
+    "linux/trace": BASE | {"linux/queues", "linux/system"},
+    "linux": BASE | {"linux/queues", "linux/system", "linux/net", "linux/store", "linux/drivers", "linux/trace"},
     "client": {"common", "protocol"},
     "testing": BASE,
 }

@@ -14,11 +14,8 @@
 #include <string>
 #include <vector>
 
-#include "linux/BenchmarkResultsWriter.h"
 #include "linux/Configuration.h"
 #include "linux/ConfigurationWatch.h"
-#include "linux/TraceCmdRecorder.h"
-#include "linux/TracefsEventTrace.h"
 #include "linux/drivers/LinuxHWReport.h"
 #include "linux/net/SocketListener.h"
 #include "linux/queues/Pressure.h"
@@ -33,6 +30,9 @@
 #include "linux/system/LogWriter.h"
 #include "linux/system/NotificationCenter.h"
 #include "linux/system/ProcProcessTable.h"
+#include "linux/trace/BenchmarkResultsWriter.h"
+#include "linux/trace/TraceCmdRecorder.h"
+#include "linux/trace/TracefsEventTrace.h"
 #include "platform/Operations.h"
 #include "platform/Platform.h"
 #include "platform/TraceMarks.h"

@@ -1,5 +1,5 @@
 // Needs tracefs and the right to write there, and is skipped elsewhere.
-#include "linux/TracefsEventTrace.h"
+#include "linux/trace/TracefsEventTrace.h"
 
 #include <dlfcn.h>
 #include <fmt/format.h>
@@ -12,8 +12,8 @@
 #include <thread>
 #include <unistd.h>
 
-#include "linux/MarkLibraries.h"
 #include "linux/queues/Queues.h"
+#include "linux/trace/MarkLibraries.h"
 #include "testing/TempTree.h"
 #include "testing/TestPlatform.h"
 

@@ -1,4 +1,4 @@
-#include "linux/BenchmarkResultsWriter.h"
+#include "linux/trace/BenchmarkResultsWriter.h"
 
 #include <fstream>
 #include <gmock/gmock.h>

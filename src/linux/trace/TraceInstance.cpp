@@ -1,4 +1,4 @@
-#include "linux/TraceInstance.h"
+#include "linux/trace/TraceInstance.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -8,8 +8,8 @@
 #include <thread>
 #include <unistd.h>
 
-#include "linux/Tracefs.h"
 #include "linux/system/SmallFile.h"
+#include "linux/trace/Tracefs.h"
 
 namespace halyard::linux_ {
 namespace {

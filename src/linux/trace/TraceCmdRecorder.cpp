@@ -1,4 +1,4 @@
-#include "linux/TraceCmdRecorder.h"
+#include "linux/trace/TraceCmdRecorder.h"
 
 #include <algorithm>
 #include <atomic>

@@ -1,4 +1,4 @@
-#include "linux/TimelineFile.h"
+#include "linux/trace/TimelineFile.h"
 
 #include <fmt/format.h>
 

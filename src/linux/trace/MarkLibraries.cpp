@@ -1,4 +1,4 @@
-#include "linux/MarkLibraries.h"
+#include "linux/trace/MarkLibraries.h"
 
 #include <algorithm>
 #include <cstring>

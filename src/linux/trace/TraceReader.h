@@ -10,7 +10,7 @@
 #include <unordered_map>
 #include <vector>
 
-#include "linux/TraceInstance.h"
+#include "linux/trace/TraceInstance.h"
 #include "platform/EventTrace.h"
 
 struct kbuffer;

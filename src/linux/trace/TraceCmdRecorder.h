@@ -12,7 +12,7 @@
 #include <filesystem>
 #include <string>
 
-#include "linux/Tracefs.h"
+#include "linux/trace/Tracefs.h"
 #include "platform/PerformanceTrace.h"
 
 namespace halyard::linux_ {

@@ -1,4 +1,4 @@
-#include "linux/BenchmarkResultsWriter.h"
+#include "linux/trace/BenchmarkResultsWriter.h"
 
 #include <array>
 #include <cstdlib>
@@ -9,8 +9,8 @@
 
 #include "common/Description.h"
 #include "common/Utf8.h"
-#include "linux/TimelineFile.h"
 #include "linux/system/AtomicFile.h"
+#include "linux/trace/TimelineFile.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {

@@ -11,7 +11,7 @@
 #include <system_error>
 #include <vector>
 
-#include "linux/MarkLibraries.h"
+#include "linux/trace/MarkLibraries.h"
 
 namespace halyard::linux_ {
 

@@ -1,4 +1,4 @@
-#include "linux/TraceCmdRecorder.h"
+#include "linux/trace/TraceCmdRecorder.h"
 
 #include <csignal>
 #include <fstream>

@@ -11,7 +11,7 @@
 #include <memory>
 #include <vector>
 
-#include "linux/Tracefs.h"
+#include "linux/trace/Tracefs.h"
 #include "platform/EventTrace.h"
 
 namespace halyard::linux_ {

@@ -1,4 +1,4 @@
-#include "linux/TracefsEventTrace.h"
+#include "linux/trace/TracefsEventTrace.h"
 
 #include <algorithm>
 #include <atomic>
@@ -12,11 +12,11 @@
 #include <unistd.h>
 #include <utility>
 
-#include "linux/MarkLibraries.h"
-#include "linux/TraceDelivery.h"
-#include "linux/TraceInstance.h"
-#include "linux/TraceReader.h"
 #include "linux/system/SmallFile.h"
+#include "linux/trace/MarkLibraries.h"
+#include "linux/trace/TraceDelivery.h"
+#include "linux/trace/TraceInstance.h"
+#include "linux/trace/TraceReader.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {

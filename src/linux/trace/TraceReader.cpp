@@ -1,4 +1,4 @@
-#include "linux/TraceReader.h"
+#include "linux/trace/TraceReader.h"
 
 #include <algorithm>
 #include <cerrno>

@@ -1,4 +1,4 @@
-#include "linux/Tracefs.h"
+#include "linux/trace/Tracefs.h"
 
 #include <atomic>
 #include <cerrno>
