@@ -7,7 +7,7 @@
 #include <variant>
 
 #include "Require.h"
-#include "linux/Settings.h"
+#include "linux/config/Settings.h"
 
 using halyard::fuzz::require;
 using halyard::linux_::ParsedSettings;

@@ -25,17 +25,22 @@ FOLDERS = {
     "session": BASE | {"sinks", "tracing"},
     "drivers": BASE | {"sinks", "tracing", "session"},
     "service": BASE | {"sinks", "tracing", "session", "drivers"},
-    # The rooms of linux/ have an order of their own.
-    "linux/queues": BASE,
-    "linux/system": BASE | {"linux/queues"},
-    "linux/net": BASE | {"linux/queues", "linux/system"},
-    "linux/store": BASE,
-    "linux/drivers": BASE | {"linux/queues", "linux/system"},
-    "linux/trace": BASE | {"linux/queues", "linux/system"},
-    "linux": BASE | {"linux/queues", "linux/system", "linux/net", "linux/store", "linux/drivers", "linux/trace"},
     "client": {"common", "protocol"},
     "testing": BASE,
 }
+# The rooms of linux/ have an order of their own; what stands beside them sees all.
+LINUX_ROOMS = {
+    "queues": set(),
+    "system": {"queues"},
+    "net": {"queues", "system"},
+    "store": set(),
+    "drivers": {"queues", "system"},
+    "trace": {"queues", "system"},
+    "config": {"system", "net", "store", "drivers"},
+}
+for room, below in LINUX_ROOMS.items():
+    FOLDERS[f"linux/{room}"] = BASE | {f"linux/{name}" for name in below}
+FOLDERS["linux"] = BASE | {f"linux/{room}" for room in LINUX_ROOMS}
 ROOMY = {folder.split("/")[0] for folder in FOLDERS if "/" in folder}
 # Files that see more than their folder does.
 EXTRA = {

@@ -8,7 +8,7 @@
 #include <unistd.h>
 #include <utility>
 
-#include "linux/PreferenceNotifications.h"
+#include "linux/config/PreferenceNotifications.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {

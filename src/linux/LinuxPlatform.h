@@ -14,8 +14,8 @@
 #include <string>
 #include <vector>
 
-#include "linux/Configuration.h"
-#include "linux/ConfigurationWatch.h"
+#include "linux/config/Configuration.h"
+#include "linux/config/ConfigurationWatch.h"
 #include "linux/drivers/LinuxHWReport.h"
 #include "linux/net/SocketListener.h"
 #include "linux/queues/Pressure.h"

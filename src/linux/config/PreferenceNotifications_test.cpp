@@ -1,4 +1,4 @@
-#include "linux/PreferenceNotifications.h"
+#include "linux/config/PreferenceNotifications.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>

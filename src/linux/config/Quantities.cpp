@@ -1,4 +1,4 @@
-#include "linux/Quantities.h"
+#include "linux/config/Quantities.h"
 
 #include <charconv>
 #include <limits>

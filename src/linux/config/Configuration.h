@@ -11,7 +11,7 @@
 #include <vector>
 
 #include "common/Mutex.h"
-#include "linux/Settings.h"
+#include "linux/config/Settings.h"
 #include "platform/Device.h"
 
 namespace halyard::linux_ {

@@ -1,4 +1,4 @@
-#include "linux/TomlValue.h"
+#include "linux/config/TomlValue.h"
 
 #include <chrono>
 #include <fmt/format.h>

@@ -1,12 +1,12 @@
-#include "linux/Settings.h"
+#include "linux/config/Settings.h"
 
 #include <algorithm>
 #include <fmt/format.h>
 #include <limits>
 #include <span>
 
-#include "linux/Quantities.h"
-#include "linux/TomlValue.h"
+#include "linux/config/Quantities.h"
+#include "linux/config/TomlValue.h"
 
 namespace halyard::linux_ {
 namespace {

@@ -1,4 +1,4 @@
-#include "linux/ConfigurationWatch.h"
+#include "linux/config/ConfigurationWatch.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>

@@ -1,4 +1,4 @@
-#include "linux/Configuration.h"
+#include "linux/config/Configuration.h"
 
 #include <utility>
 

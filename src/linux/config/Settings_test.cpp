@@ -1,10 +1,10 @@
-#include "linux/Settings.h"
+#include "linux/config/Settings.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include "common/Description.h"
-#include "linux/Quantities.h"
+#include "linux/config/Quantities.h"
 
 namespace halyard::linux_ {
 namespace {

@@ -1,4 +1,4 @@
-#include "linux/PreferenceNotifications.h"
+#include "linux/config/PreferenceNotifications.h"
 
 namespace halyard::linux_ {
 namespace {

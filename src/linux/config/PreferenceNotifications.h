@@ -4,8 +4,8 @@
 #include <string_view>
 #include <vector>
 
-#include "linux/Configuration.h"
-#include "linux/Settings.h"
+#include "linux/config/Configuration.h"
+#include "linux/config/Settings.h"
 #include "platform/Device.h"
 
 namespace halyard::linux_ {

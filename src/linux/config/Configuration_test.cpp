@@ -1,4 +1,4 @@
-#include "linux/Configuration.h"
+#include "linux/config/Configuration.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
