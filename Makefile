@@ -26,7 +26,7 @@ TIDY ?=
 KEEP ?=
 
 # Tests of kernel event traces need a tracefs, which few containers mount.
-CTEST := tools/with-tracefs.sh ctest
+CTEST := scripts/with-tracefs.sh ctest
 CTEST_FLAGS := --output-on-failure --no-label-summary --parallel $(TEST_JOBS)
 # ThreadSanitizer of these compilers does not cope with more than 28 bits of
 # address space randomisation, which newer kernels use.
@@ -36,15 +36,15 @@ FIXED_ADDRESSES := setarch $(shell uname -m) -R
 .PHONY: deps build run test check fuzz tidy bench format clean
 
 deps:
-	@tools/install-deps.sh $(BUILD_PACKAGES) $(RUN_PACKAGES) $(TEST_PACKAGES)
+	@scripts/install-deps.sh $(BUILD_PACKAGES) $(RUN_PACKAGES) $(TEST_PACKAGES)
 
 build:
-	@tools/install-deps.sh $(BUILD_PACKAGES)
+	@scripts/install-deps.sh $(BUILD_PACKAGES)
 	cmake --preset release
 	cmake --build --preset release --parallel $(JOBS)
 
 run:
-	@tools/install-deps.sh $(BUILD_PACKAGES) $(RUN_PACKAGES)
+	@scripts/install-deps.sh $(BUILD_PACKAGES) $(RUN_PACKAGES)
 	@$(MAKE) --no-print-directory build
 	tools/demo/run-demo build/release $(if $(KEEP),KEEP=$(KEEP))
 
@@ -54,7 +54,7 @@ test: deps
 	$(CTEST) --preset test $(CTEST_FLAGS)
 
 check: deps
-	@tools/install-deps.sh $(CHECK_PACKAGES)
+	@scripts/install-deps.sh $(CHECK_PACKAGES)
 	set -e; for preset in $(PRESETS); do \
 		echo "== $$preset"; \
 		wrapper=; case $$preset in *-tsan) wrapper="$(FIXED_ADDRESSES)";; esac; \
@@ -66,26 +66,26 @@ check: deps
 	$(if $(TIDY),$(MAKE) tidy)
 
 fuzz:
-	@tools/install-deps.sh $(BUILD_PACKAGES) $(CHECK_PACKAGES)
+	@scripts/install-deps.sh $(BUILD_PACKAGES) $(CHECK_PACKAGES)
 	cmake --preset fuzz
 	cmake --build --preset fuzz --parallel $(JOBS)
-	tools/run-fuzzers.sh build/fuzz $(FUZZ_SECONDS)
+	scripts/run-fuzzers.sh build/fuzz $(FUZZ_SECONDS)
 
 # Reads the compile commands of the clang debug build.
 tidy:
-	@tools/install-deps.sh $(BUILD_PACKAGES) $(TEST_PACKAGES) $(CHECK_PACKAGES)
+	@scripts/install-deps.sh $(BUILD_PACKAGES) $(TEST_PACKAGES) $(CHECK_PACKAGES)
 	cmake --preset clang-debug
 	run-clang-tidy-14 -quiet -p build/clang-debug '$(CURDIR)/(src|tools|benchmarks)/.*\.cpp'
 
 bench:
-	@tools/install-deps.sh $(BUILD_PACKAGES) $(BENCH_PACKAGES)
+	@scripts/install-deps.sh $(BUILD_PACKAGES) $(BENCH_PACKAGES)
 	cmake --preset bench
 	cmake --build --preset bench --parallel $(JOBS)
-	tools/run-benchmarks.sh build/bench
+	scripts/run-benchmarks.sh build/bench
 
 format:
-	@tools/install-deps.sh clang-format
-	tools/check-format.sh --fix
+	@scripts/install-deps.sh clang-format
+	scripts/check-format.sh --fix
 
 clean:
 	rm -rf build

@@ -1,7 +1,7 @@
 #!/bin/sh
 # Runs the benchmarks of a build: the pieces first, then the whole daemon.
 #
-# usage: tools/run-benchmarks.sh BUILD_DIR
+# usage: scripts/run-benchmarks.sh BUILD_DIR
 set -eu
 build=$1
 for piece in "$build"/*_benchmark; do

@@ -3,7 +3,7 @@
 # processors. Corpora grow in BUILD_DIR/corpus; fuzz/corpus/NAME, where it exists,
 # seeds the fuzzer NAME_fuzz.
 #
-# usage: tools/run-fuzzers.sh BUILD_DIR SECONDS
+# usage: scripts/run-fuzzers.sh BUILD_DIR SECONDS
 set -eu
 root=$(cd "$(dirname "$0")/.." && pwd)
 build=$1

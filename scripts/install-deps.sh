@@ -2,7 +2,7 @@
 # Installs those of the named Debian packages that are missing. Says nothing and
 # needs neither root nor a network when all of them are there.
 #
-# usage: tools/install-deps.sh PACKAGE...
+# usage: scripts/install-deps.sh PACKAGE...
 set -eu
 
 if ! command -v dpkg-query >/dev/null 2>&1; then

@@ -3,7 +3,7 @@
 # is; where nobody has mounted it, and we may, the command gets a mount namespace
 # of its own with it, which ends with the command.
 #
-# usage: tools/with-tracefs.sh COMMAND [ARGUMENT...]
+# usage: scripts/with-tracefs.sh COMMAND [ARGUMENT...]
 set -eu
 tracefs=/sys/kernel/tracing
 mount_it='mount -t tracefs nodev "$0" && exec "$@"'
