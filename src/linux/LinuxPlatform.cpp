@@ -8,7 +8,6 @@
 #include <unistd.h>
 #include <utility>
 
-#include "linux/config/PreferenceNotifications.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {
@@ -76,89 +75,71 @@ Dictionary describe(const StoreStatus& store) {
 LinuxPlatform::LinuxPlatform(Directories directories, platform::TraceMarks& traceMarks)
     : directories_(std::move(directories)), stopSignals_(context_, SIGTERM, SIGINT),
       reloadSignals_(context_, SIGHUP), watchdog_(context_), shutdownLimit_(context_),
-      files_(directories_), resultsFiles_(directories_, clock_),
-      performanceTraces_({directories_.logs / "Traces"}), log_(LogWriter::defaultOutput()),
+      log_(LogWriter::defaultOutput()), system_(directories_),
       configuration_(directories_.configuration), ownProcess_([this] {
           // The service was asked to die at once; what it accepted need not.
-          (void)store_->close();
+          (void)store_->store.close();
           log_.flush();
       }),
-      startTime_(clock_.steadyTime()) {
+      startTime_(system_.clock.steadyTime()) {
     std::signal(SIGPIPE, SIG_IGN);
     platform_.log = &log_;
-    platform_.clock = &clock_;
+    platform_.ownProcess = &ownProcess_;
+    platform_.operations = this;
+    platform_.traceMarks = &traceMarks;
+    system_.offerTo(platform_);
+    configuration_.offerTo(platform_);
     platform::install(&platform_);
-    configuration_.observe(
-        [this](const Settings&, const Settings& after) { log_.setLevel(after.logLevel); });
-    // Before the first reading: a change that comes after that is told.
-    configurationWatch_ = std::make_unique<ConfigurationWatch>(
-        context_, std::filesystem::absolute(directories_.configuration), Configuration::kFileName,
-        [this] { (void)configuration_.reload(); });
-    (void)configuration_.reload();
 
-    store_ = std::make_unique<Store>(
-        storeOptions(directories_.state, *configuration_.settings(), pressure_), clock_);
-    relayReporting_ = std::make_unique<StoreRelayReporting>(*store_, random_);
-    analytics_ = std::make_unique<StoreAnalyticsService>(*store_);
-    energyLedger_ = std::make_unique<StoreEnergyLedger>(*store_);
-    metrics_ = std::make_unique<StoreMetricService>(*store_);
+    configuration_.configuration.observe(
+        [this](const Settings&, const Settings& after) { log_.setLevel(after.logLevel); });
+    configuration_.follow(context_);
+    makeServices(*configuration_.configuration.settings());
+}
+
+// What depends on the settings.
+void LinuxPlatform::makeServices(const Settings& settings) {
+    queues_ = std::make_unique<Queues>(context_, pressure_);
+    platform_.queues = queues_.get();
+    store_ = std::make_unique<StoreServices>(storeOptions(directories_.state, settings, pressure_),
+                                             system_.clock, system_.random);
+    store_->offerTo(platform_);
     incidents_ = std::make_unique<IncidentFolder>(
-        clock_,
+        system_.clock,
         IncidentFolder::Options{
             directories_.state / "incidents", "/proc", [this] { return log_.recentLines(); },
             [this](const Dictionary& signature, std::string_view report, platform::WallTime) {
-                (void)store_->addIncident(signature, report);
+                (void)store_->store.addIncident(signature, report);
             }});
-    hwReport_ = std::make_unique<LinuxHWReport>(clock_, configuration_.settings()->driverChannels,
-                                                LinuxHWReport::Options());
-    queues_ = std::make_unique<Queues>(context_, pressure_);
-    eventTrace_ = std::make_unique<TracefsEventTrace>(TracefsEventTrace::Options{
-        kTracefs, [this] {
-            return listener_ ? listener_->connectedProcesses() : std::vector<std::int32_t>();
-        }});
-    applySettings(*configuration_.settings());
-
-    platform_.random = &random_;
-    platform_.queues = queues_.get();
-    platform_.conditions = &conditions_;
-    platform_.files = &files_;
-    platform_.eventTrace = eventTrace_.get();
-    platform_.resultsFiles = &resultsFiles_;
-    platform_.performanceTraces = &performanceTraces_;
-    platform_.traceMarks = &traceMarks;
-    platform_.preferences = &configuration_;
-    platform_.featureFlags = &configuration_;
-    platform_.deviceProperties = &configuration_;
-    platform_.notifications = &notifications_;
-    platform_.processTable = &processTable_;
-    platform_.ownProcess = &ownProcess_;
-    platform_.relayReporting = relayReporting_.get();
-    platform_.analytics = analytics_.get();
-    platform_.energyLedger = energyLedger_.get();
-    platform_.metrics = metrics_.get();
     platform_.incidentReporter = incidents_.get();
-    platform_.operations = this;
+    hwReport_ = std::make_unique<LinuxHWReport>(system_.clock, settings.driverChannels,
+                                                LinuxHWReport::Options());
     platform_.hwReport = hwReport_.get();
+    traces_ = std::make_unique<TraceServices>(directories_, system_.clock, [this] {
+        return listener_ ? listener_->connectedProcesses() : std::vector<std::int32_t>();
+    });
+    traces_->offerTo(platform_);
+    applySettings(settings);
 }
 
 LinuxPlatform::~LinuxPlatform() {
-    configurationWatch_.reset();
+    configuration_.watch.reset();
     queues_->stop();
     incidents_.reset();
     listener_.reset();
-    if (!store_->close()) {
+    if (!store_->store.close()) {
         log_.flush();
         std::_Exit(EXIT_SUCCESS); // A disk that hangs: nothing more can be saved.
     }
 }
 
 void LinuxPlatform::applySettings(const Settings& settings) {
-    analytics_->setWanted(settings.wantedEvents);
-    store_->setLimits(settings.store);
+    store_->analytics.setWanted(settings.wantedEvents);
+    store_->store.setLimits(settings.store);
 }
 
 PeerRights LinuxPlatform::rightsOfPeer(const Peer& peer) const {
-    return rightsOf(peer, configuration_.settings()->access, ::getuid());
+    return rightsOf(peer, configuration_.configuration.settings()->access, ::getuid());
 }
 
 std::optional<std::string> LinuxPlatform::open(platform::ListenerDelegate* delegate) {
@@ -190,16 +171,16 @@ void LinuxPlatform::watchStopSignals() {
 void LinuxPlatform::watchReloadSignal() {
     reloadSignals_.async_wait([this](const asio::error_code& error, int) {
         if (!error) {
-            (void)configuration_.reload();
+            (void)configuration_.configuration.reload();
             watchReloadSignal();
         }
     });
 }
 
 void LinuxPlatform::observeConfiguration() {
-    configuration_.observe(
+    configuration_.configuration.observe(
         [this](const Settings&, const Settings& after) { applySettings(after); });
-    announceChangedPreferences(configuration_, notifications_);
+    configuration_.announceChanges();
 }
 
 // The service queue answers the manager's watchdog: it is what must not hang.
@@ -247,12 +228,12 @@ void LinuxPlatform::finishShutdown(bool inTime) {
 }
 
 void LinuxPlatform::flush(std::function<void()> done) {
-    queues_->drain([this, done = std::move(done)] { store_->flush(done); });
+    queues_->drain([this, done = std::move(done)] { store_->store.flush(done); });
 }
 
 Dictionary LinuxPlatform::status() const {
-    const StoreStatus store = store_->status();
-    const std::chrono::duration<double> uptime = clock_.steadyTime() - startTime_;
+    const StoreStatus store = store_->store.status();
+    const std::chrono::duration<double> uptime = system_.clock.steadyTime() - startTime_;
     return Dictionary{{"version", HALYARD_VERSION},
                       {"pid", ownProcess_.pid()},
                       {"uptime_sec", uptime.count()},

@@ -14,25 +14,17 @@
 #include <string>
 #include <vector>
 
-#include "linux/config/Configuration.h"
-#include "linux/config/ConfigurationWatch.h"
+#include "linux/config/ConfigurationServices.h"
 #include "linux/drivers/LinuxHWReport.h"
 #include "linux/net/SocketListener.h"
 #include "linux/queues/Pressure.h"
 #include "linux/queues/Queues.h"
-#include "linux/store/Store.h"
-#include "linux/store/StoreEventServices.h"
-#include "linux/store/StoreRelayReporting.h"
+#include "linux/store/StoreServices.h"
 #include "linux/system/Directories.h"
 #include "linux/system/IncidentFolder.h"
-#include "linux/system/LinuxFacts.h"
-#include "linux/system/LinuxFiles.h"
 #include "linux/system/LogWriter.h"
-#include "linux/system/NotificationCenter.h"
-#include "linux/system/ProcProcessTable.h"
-#include "linux/trace/BenchmarkResultsWriter.h"
-#include "linux/trace/TraceCmdRecorder.h"
-#include "linux/trace/TracefsEventTrace.h"
+#include "linux/system/SystemServices.h"
+#include "linux/trace/TraceServices.h"
 #include "platform/Operations.h"
 #include "platform/Platform.h"
 #include "platform/TraceMarks.h"
@@ -58,6 +50,7 @@ private:
     void flush(std::function<void()> done) override;
     Dictionary status() const override;
 
+    void makeServices(const Settings& settings);
     void applySettings(const Settings& settings);
     void watchStopSignals();
     void watchReloadSignal();
@@ -74,28 +67,16 @@ private:
     asio::steady_timer watchdog_;
     asio::steady_timer shutdownLimit_;
 
-    SystemClock clock_;
-    SystemRandom random_;
-    SystemConditions conditions_;
-    LinuxFiles files_;
-    BenchmarkResultsFiles resultsFiles_;
-    TraceCmdRecorder performanceTraces_;
-    std::unique_ptr<TracefsEventTrace> eventTrace_;
     LogWriter log_;
+    SystemServices system_;
     Pressure pressure_;
-    Configuration configuration_;
-    NotificationCenter notifications_;
-    ProcProcessTable processTable_;
+    ConfigurationServices configuration_;
     ProcOwnProcess ownProcess_;
-    std::unique_ptr<Store> store_;
-    std::unique_ptr<StoreRelayReporting> relayReporting_;
-    std::unique_ptr<StoreAnalyticsService> analytics_;
-    std::unique_ptr<StoreEnergyLedger> energyLedger_;
-    std::unique_ptr<StoreMetricService> metrics_;
+    std::unique_ptr<StoreServices> store_;
     std::unique_ptr<IncidentFolder> incidents_;
     std::unique_ptr<LinuxHWReport> hwReport_;
+    std::unique_ptr<TraceServices> traces_;
     std::unique_ptr<Queues> queues_;
-    std::unique_ptr<ConfigurationWatch> configurationWatch_;
     std::unique_ptr<SocketListener> listener_;
     platform::Platform platform_;
     platform::SteadyTime startTime_;
