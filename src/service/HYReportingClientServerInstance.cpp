@@ -85,7 +85,7 @@ void HYReportingClientServerInstance::create(Delegate& delegate, std::int64_t re
         std::swap(sessions_[reporterID], session);
     }
     if (session != nullptr) {
-        delegate.sessionRetired(*session); // Replaced.
+        retire(delegate, *session); // Replaced.
     }
     HY_LOG_DEFAULT(HYReportingClientCategory, "session created for reporter {}", reporterID);
 }
@@ -241,11 +241,19 @@ void HYReportingClientServerInstance::destroy(Delegate& delegate, std::int64_t r
         if (session->started()) {
             session->stop(); // Stays counted as active: only a stop request uncounts.
         }
-        delegate.sessionRetired(*session);
+        retire(delegate, *session);
         const MutexLock lock(mapMutex_);
         sessions_.erase(reporterID);
     }
     HY_LOG_DEFAULT(HYReportingClientCategory, "destroying {}", reporterID);
+}
+
+// A reply that is let go answers that nobody will. Left to the session, that
+// would happen wherever its last holder lets go of it, which may be its upload,
+// on another thread and any time later.
+void HYReportingClientServerInstance::retire(Delegate& delegate, HYReportingSession& session) {
+    session.exchangeTransactionCompleteBlock(nullptr);
+    delegate.sessionRetired(session);
 }
 
 void HYReportingClientServerInstance::reporterID(std::int64_t reporterID, DictionaryReply valid) {
@@ -299,7 +307,7 @@ void HYReportingClientServerInstance::leave(Delegate& delegate) {
         if (session->started()) {
             session->stop();
         }
-        delegate.sessionRetired(*session);
+        retire(delegate, *session);
     }
     {
         const MutexLock lock(mapMutex_);

@@ -83,6 +83,8 @@ private:
                     std::uint16_t type, const std::optional<std::vector<std::int64_t>>& reporterIDs,
                     const std::optional<std::string>& processName);
     void leave(Delegate& delegate);
+    // For a session that leaves the map: answers the start that it holds.
+    static void retire(Delegate& delegate, HYReportingSession& session);
 
     std::shared_ptr<HYReportingSession> findReportingSessionForID(const Delegate& delegate,
                                                                   std::int64_t reporterID,

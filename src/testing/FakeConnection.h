@@ -41,13 +41,15 @@ public:
     // The peer's side. Requires an exported object.
     std::shared_ptr<Answer> send(protocol::Method method, protocol::Arguments arguments = {}) {
         auto answer = std::make_shared<Answer>();
-        exported->handle(
-            {method, std::move(arguments), protocol::Reply(std::make_unique<Recorder>(answer))});
+        exported->handle({method, std::move(arguments),
+                          protocol::Reply(std::make_unique<Recorder>(answer, answered_))});
         return answer;
     }
     void notify(protocol::Method method, protocol::Arguments arguments = {}) {
         exported->handle({method, std::move(arguments), protocol::Reply()});
     }
+    // In the order in which they were given.
+    const std::vector<std::shared_ptr<Answer>>& answered() const { return *answered_; }
     void interrupt() { std::exchange(interruptionHandler, nullptr)(); }
     // Lets the exported object go afterwards, as a closed connection does.
     void invalidate() {
@@ -64,8 +66,11 @@ public:
 private:
     class Recorder final : public protocol::Responder {
     public:
-        explicit Recorder(std::shared_ptr<Answer> answer) : answer_(std::move(answer)) {}
+        Recorder(std::shared_ptr<Answer> answer,
+                 std::shared_ptr<std::vector<std::shared_ptr<Answer>>> answered)
+            : answer_(std::move(answer)), answered_(std::move(answered)) {}
         void answer(const MaybeError& error, const Value& result) override {
+            answered_->push_back(answer_);
             ++answer_->count;
             answer_->error = error;
             answer_->result = result;
@@ -73,9 +78,12 @@ private:
 
     private:
         std::shared_ptr<Answer> answer_;
+        std::shared_ptr<std::vector<std::shared_ptr<Answer>>> answered_;
     };
 
     const std::int32_t pid_;
+    const std::shared_ptr<std::vector<std::shared_ptr<Answer>>> answered_ =
+        std::make_shared<std::vector<std::shared_ptr<Answer>>>();
 };
 
 class FakeListener final : public platform::Listener {

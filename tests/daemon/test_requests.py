@@ -32,20 +32,33 @@ class Requests(DaemonTest):
         self.assertEqual(json.loads(first[2]),
                          {"a_key": 1, "rate": 48000.0, "audiotag": "PlaybackStart"})
 
-    def test_a_start_is_answered_when_the_session_is_started_again(self):
+    def test_a_start_is_answered_right_before_the_stop_of_its_session(self):
         client = self.connect()
-        first = client.session(7)
-        client.result("stopReportingSessionForID", 7)
-        self.assertEqual(client.answer(first), [None, True])
-        second = client.start("startReportingSessionForID", 7)
-        # A start of a started session is answered at once and changes nothing.
+        held = client.session(7)
+        for _ in range(2):
+            stopped = client.start("stopReportingSessionForID", 7)
+            while stopped not in client.answers:
+                client.receive()
+            # In the order of their arrival.
+            self.assertEqual(list(client.answers.items()),
+                             [(held, [None, True]), (stopped, [None, True])])
+            client.answers.clear()
+            held = client.start("startReportingSessionForID", 7)
+
+    def test_a_start_of_a_started_session_is_answered_at_once_and_changes_nothing(self):
+        client = self.connect()
+        held = client.session(7)
         self.assertIs(client.result("startReportingSessionForID", 7), True)
-        self.assertNotIn(second, client.answers)
+        self.assertNotIn(held, client.answers)
+        self.assertEqual(client.result("admin.status")["active_session_count"], 1)
 
     def test_a_held_start_whose_session_is_destroyed_is_told(self):
         client = self.connect()
         held = client.session(7)
-        client.result("destroyReportingSession", 7)
+        destroyed = client.start("destroyReportingSession", 7)
+        while destroyed not in client.answers:
+            client.receive()
+        self.assertEqual(list(client.answers), [held, destroyed])  # in their order
         error, _ = client.answer(held)
         self.assertEqual((error["domain"], error["code"]), ("com.kestrel.halyard.ipc", 4))
 
