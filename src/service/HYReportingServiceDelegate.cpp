@@ -76,7 +76,7 @@ void HYReportingServiceDelegate::listenForFeatureStateChanges() {
             });
         feature.notifyToken = registration.token;
         HY_LOG_DEFAULT(HYReportingServiceDelegateCategory, "notify setup result {} token {}",
-                       registration.status, registration.token);
+                       static_cast<std::int32_t>(registration.status), registration.token);
     }
 }
 

@@ -24,6 +24,11 @@ constexpr std::uint32_t kMessageMark = 0x21044838;
 constexpr std::uint32_t kAlarmSpreadSeconds = 60;
 constexpr std::chrono::nanoseconds kSingleMessageDelay{1'000'000'000};
 
+// Log lines show categories and types as signed numbers: a summary's category is -1.
+std::int32_t shown(std::uint32_t number) {
+    return static_cast<std::int32_t>(number);
+}
+
 Value clientVersion() {
     return Value(std::strtof(kClientVersion, nullptr));
 }
@@ -75,7 +80,7 @@ void deliverSingleMessage(const Dictionary& message, AudioEventCategory category
                          error->message);
         } else {
             HY_LOG_DEBUG(HYReportingSessionCategory, "message {} : category {} : type {}",
-                         Value(message), category, type);
+                         Value(message), shown(category), shown(type));
         }
     }
     if (reply) {
@@ -223,8 +228,8 @@ void HYReportingSession::deliver(Delivery delivery) {
     if (!error && delivery.original) { // A failure stays silent: the framework counts it.
         HY_LOG_DEBUG(HYReportingSessionRelayReportingCategory,
                      "RelayReportingAgent {} : message {} : category {} : type {}",
-                     upload->description(), Value(*delivery.original), delivery.category,
-                     delivery.type);
+                     upload->description(), Value(*delivery.original), shown(delivery.category),
+                     shown(delivery.type));
     }
 }
 

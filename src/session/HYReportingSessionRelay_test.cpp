@@ -242,6 +242,15 @@ TEST_F(SessionRelayTest, ADeliveryIsLoggedWithTheClientsOwnMessage) {
                                                "    n = 1;\n} : category 268435463 : type 1"));
 }
 
+TEST_F(SessionRelayTest, ADeliveryIsLoggedWithSignedNumbers) {
+    const auto session = startConnectedSession();
+    session->sendMessage({}, kAudioEventCategoryGroupToolbox | kAudioEventCategoryIO, 0xFFFFFFFE,
+                         nullptr);
+    run();
+    EXPECT_TRUE(loggedByRelay(LogLevel::Debug, "RelayReportingAgent upload : message {\n} : "
+                                               "category -2147483641 : type -2"));
+}
+
 TEST_F(SessionRelayTest, ARedundantMessageIsNotDelivered) {
     const auto session = startConnectedSession();
     sendNumber(*session, 1);

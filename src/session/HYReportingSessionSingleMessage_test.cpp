@@ -37,6 +37,14 @@ TEST_F(SingleMessageTest, IsMarkedAndLogged) {
                             "message {\n    \"a key\" = 1;\n} : category 536870919 : type 2"));
 }
 
+TEST_F(SingleMessageTest, IsLoggedWithSignedNumbers) {
+    HYReportingSession::sendSingleMessage({}, 0xFFFFFFFF, 0xFFFFFFFE, kAudioServiceTypeUnknown, {},
+                                          nullptr);
+    platform_.queues.advance(1s);
+    EXPECT_TRUE(logged(LogLevel::Debug, "message {\n} : category -1 : type -2"));
+    EXPECT_TRUE(logged(LogLevel::Debug, "sending single message after delta 0 for service 65535"));
+}
+
 TEST_F(SingleMessageTest, AlarmsDrawADeltaThatDelaysNothing) {
     platform_.random.next = 59;
     sendSingle(kAudioServiceTypeAlarms);
