@@ -30,10 +30,9 @@ std::vector<FeatureRecord> makeFeatureRecords() {
 Dictionary HYReportingDefaults() {
     const platform::Preferences& preferences = *platform::current().preferences;
     Dictionary defaults;
-    const Value deviceName = preferences.value(kDeviceName, kHalyardDomain);
-    if (deviceName.isString()) {
-        defaults.set(kDeviceName, deviceName);
-    }
+    // As in the feature state: what is set goes in, whatever it is, and only what
+    // is not set stays out.
+    defaults.set(kDeviceName, preferences.value(kDeviceName, kHalyardDomain));
     defaults.set(kDisableReporting,
                  preferences.value(kDisableReporting, kHalyardDomain).boolValue());
     return defaults;

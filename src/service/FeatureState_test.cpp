@@ -49,6 +49,15 @@ TEST_F(FeatureStateTest, DefaultsAreReadOnceAndSwitchNothingOff) {
     EXPECT_TRUE(service_->isReportingEnabled());
 }
 
+TEST_F(FeatureStateTest, ADeviceNameOfAnyKindGoesIntoDefaultsAndStateAlike) {
+    for (const Value& name : {Value("kitchen"), Value(7), Value(false), Value(List{Value("a")})}) {
+        setDeviceName(name);
+        restartService();
+        EXPECT_EQ(service_->getDefaults()["device_name"], name);
+        EXPECT_EQ(service_->getFeaturesState().value_or(Dictionary())["device_name"], name);
+    }
+}
+
 TEST_F(FeatureStateTest, ThereIsNoStateWhenNothingIsSet) {
     platform_.log.clear();
     EXPECT_EQ(service_->getFeaturesState(), std::nullopt);
@@ -103,6 +112,9 @@ TEST_F(FeatureStateTest, AFailedRegistrationIsTold) {
     platform_.notifications.failureStatus = 9;
     restartService();
     EXPECT_TRUE(logged(LogLevel::Default, "notify setup result 9 token 0"));
+    platform_.notifications.failureStatus = 0xFFFFFFFF;
+    restartService();
+    EXPECT_TRUE(logged(LogLevel::Default, "notify setup result -1 token 0"));
 }
 
 TEST_F(FeatureStateTest, AStartingSessionGetsTheState) {
@@ -142,12 +154,17 @@ TEST_F(FeatureStateTest, AChangeReachesTheSessionsOfAllClients) {
     EXPECT_EQ(session(8, 1)->messageIdentifierCount("Setup_Setup"), 1U);
 }
 
-TEST_F(FeatureStateTest, TheDaemonsOwnNotificationSendsTheDeviceNameAgain) {
-    connect(100).createAndStart(7);
+TEST_F(FeatureStateTest, TheDaemonsOwnNotificationSendsTheDeviceNameToAllSessions) {
+    const Peer peer = connect(100);
+    peer.create(6);
+    peer.createAndStart(7);
     setDeviceName("kitchen");
     post(kReporting);
+    platform_.queues.advance(1s);
     EXPECT_EQ(session(7)->nestedAggregatedPayloadData().at(0).message["device_name"],
               Value("kitchen"));
+    ASSERT_THAT(platform_.relayReporting.singles, SizeIs(1)) << "from the unstarted one";
+    EXPECT_EQ(platform_.relayReporting.singles[0].message.payload["device_name"], Value("kitchen"));
 }
 
 TEST_F(FeatureStateTest, AChangeIsLogged) {
