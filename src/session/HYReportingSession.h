@@ -189,7 +189,7 @@ private:
     void openRelayReporting(const Opening& opening);
     void finishOpening(bool signalled);
     void deliver(Delivery delivery);
-    void closeRelayReporting(AudioServiceType type);
+    void closeRelayReporting();
     void dropRelayReportingSession() HY_EXCLUDES(stateMutex_);
 
     // On a thread of the upload framework.

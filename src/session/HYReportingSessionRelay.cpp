@@ -90,6 +90,10 @@ void deliverSingleMessage(const Dictionary& message, AudioEventCategory category
 
 } // namespace
 
+// The service type that counts: an upload session is what its session was when it
+// was started, so the opening is handed copies of that. Deliveries and the closing
+// are handed nothing and ask for the type of the moment in which they run: a
+// session that turns into a test neither delivers nor closes from then on.
 struct HYReportingSession::Opening {
     Dictionary configuration;
     std::string serviceName;
@@ -181,13 +185,12 @@ bool HYReportingSession::hasRelayReportingSession() const {
 }
 
 void HYReportingSession::stopRelayReporting() {
-    relayReportingQueue()->async(
-        [self = shared_from_this(), type = serviceType()] { self->closeRelayReporting(type); });
+    relayReportingQueue()->async([self = shared_from_this()] { self->closeRelayReporting(); });
 }
 
-void HYReportingSession::closeRelayReporting(AudioServiceType type) {
+void HYReportingSession::closeRelayReporting() {
     HY_LOG_DEBUG(HYReportingSessionRelayReportingCategory, "entering relayreporting {}", __func__);
-    if (!HYReportingUtilityAllowSessionTransactions() || type == kAudioServiceTypeTest) {
+    if (!HYReportingUtilityAllowSessionTransactions() || serviceType() == kAudioServiceTypeTest) {
         return;
     }
     if (const auto upload = relayReportingSession()) {

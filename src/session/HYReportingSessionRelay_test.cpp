@@ -270,14 +270,6 @@ TEST_F(SessionRelayTest, AFailedDeliveryIsLostInSilence) {
                                                    "entering relayreporting deliver"));
 }
 
-TEST_F(SessionRelayTest, ASessionThatTurnedTestDeliversNoMore) {
-    const auto session = startConnectedSession();
-    session->setServiceType(kAudioServiceTypeTest);
-    sendNumber(*session, 1);
-    run();
-    EXPECT_THAT(upload().messages, IsEmpty());
-}
-
 TEST_F(SessionRelayTest, StopDeliversWhatWasSentThenFlushesAndCloses) {
     const auto session = startConnectedSession();
     sendNumber(*session, 1);
