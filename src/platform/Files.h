@@ -23,6 +23,9 @@ public:
                                                       std::size_t most) const = 0;
     // Absolute.
     virtual std::string currentDirectory() const = 0;
+    // Where a path really lies, for people to read: the constants' directories
+    // are none of this machine.
+    virtual std::string located(std::string_view path) const = 0;
     // With all missing parents. `mode` is that of the directories made, less the
     // process's mask; one that is there already is a success and stays as it is.
     virtual MaybeError createDirectories(std::string_view path, std::uint32_t mode) = 0;

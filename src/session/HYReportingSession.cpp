@@ -195,7 +195,7 @@ void HYReportingSession::writeSummaryJson() const {
     platform::Files& files = *platform::current().files;
     if (const auto error = files.createDirectories(HYReportingLogsDirectory, kLogsMode)) {
         HY_LOG_ERROR(HYReportingSessionCategory, "can't create logging directory at {}: {}",
-                     HYReportingLogsDirectory, error->message);
+                     files.located(HYReportingLogsDirectory), error->message);
     }
     const platform::Clock& clock = *platform::current().clock;
     const std::string path =
@@ -206,7 +206,7 @@ void HYReportingSession::writeSummaryJson() const {
     if (const auto error = files.writeFileAtomically(path, text)) {
         HY_LOG_ERROR(HYReportingSessionCategory, "jsonOutput writeToURL: {}", error->message);
     } else {
-        HY_LOG_INFO(HYReportingSessionCategory, "jsonOutput writeToURL: {}", path);
+        HY_LOG_INFO(HYReportingSessionCategory, "jsonOutput writeToURL: {}", files.located(path));
     }
 }
 

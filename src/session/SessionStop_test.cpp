@@ -80,14 +80,24 @@ TEST_F(SessionStopTest, TheFileHoldsTheBatchWithItsVolumeEvents) {
     EXPECT_EQ(platform_.files.directories.at(0).mode, 0777u);
 }
 
+TEST_F(SessionStopTest, TheLogNamesTheFileThatWasWritten) {
+    platform_.files.place = "/var/log";
+    const auto session = playedSession();
+    session->stop();
+
+    EXPECT_TRUE(logged(LogLevel::Info,
+                       "jsonOutput writeToURL: /var/log" + platform_.files.files.begin()->first));
+}
+
 TEST_F(SessionStopTest, AFileThatCannotBeWrittenIsToldAndTheSummaryStillGoes) {
+    platform_.files.place = "/var/log";
     platform_.files.createError = Error{"posix", 13, "Permission denied"};
     platform_.files.writeError = Error{"posix", 28, "No space left on device"};
     const auto session = playedSession();
     session->stop();
     run();
 
-    EXPECT_TRUE(logged(LogLevel::Error, std::string("can't create logging directory at ") +
+    EXPECT_TRUE(logged(LogLevel::Error, std::string("can't create logging directory at /var/log") +
                                             HYReportingLogsDirectory + ": Permission denied"));
     EXPECT_TRUE(logged(LogLevel::Error, "jsonOutput writeToURL: No space left on device"));
     EXPECT_THAT(upload().messages, SizeIs(4));

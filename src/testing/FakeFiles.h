@@ -31,6 +31,7 @@ public:
         return file->second;
     }
     std::string currentDirectory() const override { return workingDirectory; }
+    std::string located(std::string_view path) const override { return place + std::string(path); }
     MaybeError createDirectories(std::string_view path, std::uint32_t mode) override {
         directories.push_back({std::string(path), mode});
         return createError;
@@ -45,6 +46,7 @@ public:
     std::map<std::string, std::string> files; // by path
     std::vector<Made> directories;
     std::string workingDirectory = "/current";
+    std::string place; // what stands before every path, on "the machine"
     MaybeError createError;
     MaybeError writeError;
 };

@@ -150,7 +150,7 @@ void TraceRunner::writeBenchdata() {
     if (const auto error =
             system.files->createDirectories(HYReportingTracingLogsDirectory, kDirectoryMode)) {
         HY_LOG_ERROR(HYReportingTraceCategory, "can't create logging directory at {}: {}",
-                     HYReportingTracingLogsDirectory, error->message);
+                     system.files->located(HYReportingTracingLogsDirectory), error->message);
     }
     writer_ = system.resultsFiles->open(std::string(HYReportingTracingLogsDirectory) + '/' +
                                             resultsFileName_,

@@ -163,8 +163,9 @@ TEST_F(TraceRunnerTest, WhatCannotStartIsLoggedAndYieldsNothing) {
 
 TEST_F(TraceRunnerTest, ADirectoryThatCannotBeMadeIsLogged) {
     platform_.files.createError = Error{"posix", 13, "Permission denied"};
+    platform_.files.place = "/var/log";
     runAndStop();
-    EXPECT_TRUE(logged(LogLevel::Error, std::string("can't create logging directory at ") +
+    EXPECT_TRUE(logged(LogLevel::Error, std::string("can't create logging directory at /var/log") +
                                             HYReportingTracingLogsDirectory +
                                             ": Permission denied"));
     EXPECT_TRUE(results().closed);

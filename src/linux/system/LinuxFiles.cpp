@@ -42,6 +42,10 @@ std::string LinuxFiles::currentDirectory() const {
     return error ? "/" : path.string();
 }
 
+std::string LinuxFiles::located(std::string_view path) const {
+    return directories_.mapped(path).string();
+}
+
 MaybeError LinuxFiles::createDirectories(std::string_view path, std::uint32_t mode) {
     fs::path made;
     for (const fs::path& part : directories_.mapped(path)) {

@@ -16,6 +16,7 @@ public:
     std::variant<std::string, Error> readFile(std::string_view path,
                                               std::size_t most) const override;
     std::string currentDirectory() const override;
+    std::string located(std::string_view path) const override;
     MaybeError createDirectories(std::string_view path, std::uint32_t mode) override;
     MaybeError writeFileAtomically(std::string_view path, std::string_view contents) override;
 

@@ -40,14 +40,35 @@ TEST_F(LinuxFilesTest, ReadsWholeFilesUpToABound) {
     EXPECT_EQ(read(""), "Is a directory");
 }
 
-TEST_F(LinuxFilesTest, MakesDirectoriesWithTheirParents) {
-    const ::mode_t mask = ::umask(0);
-    EXPECT_EQ(files_.createDirectories((tree_ / "a/b/c/").string(), 0777), std::nullopt);
-    ::umask(mask);
-    EXPECT_EQ(fs::status(tree_ / "a/b/c").permissions(), fs::perms::all);
+TEST_F(LinuxFilesTest, MakesDirectoriesWithTheirParentsLessTheMask) {
+    for (const auto& [mask, mode] : {std::pair{0U, 0777U}, {0022U, 0755U}, {0027U, 0750U}}) {
+        const std::string top = "a" + std::to_string(mask);
+        const ::mode_t before = ::umask(mask);
+        EXPECT_EQ(files_.createDirectories((tree_ / top / "b/c/").string(), 0777), std::nullopt);
+        ::umask(before);
+        for (const auto& made : {tree_ / top, tree_ / top / "b", tree_ / top / "b/c"}) {
+            EXPECT_EQ(fs::status(made).permissions(), fs::perms(mode)) << made;
+        }
+    }
+}
+
+TEST_F(LinuxFilesTest, DirectoriesThatAreThereStayAsTheyAre) {
+    fs::create_directories(tree_ / "a/b");
+    fs::permissions(tree_ / "a/b", fs::perms::owner_all);
     EXPECT_EQ(files_.createDirectories((tree_ / "a/b").string(), 0777), std::nullopt);
+    EXPECT_EQ(fs::status(tree_ / "a/b").permissions(), fs::perms::owner_all);
+}
+
+TEST_F(LinuxFilesTest, AFileWhereADirectoryShouldBeIsToldAsItIs) {
     tree_.write("file", "");
     EXPECT_EQ(files_.createDirectories((tree_ / "file/x").string(), 0777)->message, "File exists");
+}
+
+TEST_F(LinuxFilesTest, TellsWhereTheAudioLogsLie) {
+    EXPECT_EQ(files_.located(
+                  "/private/var/mobile/Library/Logs/FaultDepot/DiagnosticLogs/Audio/Reporting/x"),
+              (tree_ / "logs/Reporting/x").string());
+    EXPECT_EQ(files_.located("/etc/x"), "/etc/x");
 }
 
 TEST_F(LinuxFilesTest, TheAudioLogsLieInTheLogsDirectory) {
