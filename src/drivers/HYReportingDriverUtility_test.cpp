@@ -147,6 +147,22 @@ TEST_F(HYReportingDriverUtilityTest, EachMessageAlsoGoesToAnalytics) {
     platform_.analytics.events.clear(); // They hold the session.
 }
 
+TEST_F(HYReportingDriverUtilityTest, EachMessageGoesToTheSessionBeforeItGoesToAnalytics) {
+    group("Speaker-(null)").delta = {simple("Underruns", 3), states({})};
+    const auto session = sessionWithSnapshot();
+    platform_.logMarksAndQuestions();
+    platform_.log.clear();
+    utility().sendDriverLogsForSession(session);
+    std::vector<std::string> order;
+    for (const std::string& text : platform_.log.texts()) {
+        if (text == "mark 21044838" || text.starts_with("asked com.kestrel.halyard.")) {
+            order.push_back(text);
+        }
+    }
+    EXPECT_THAT(order, ElementsAre("mark 21044838", "asked com.kestrel.halyard.HWReporting.Simple",
+                                   "mark 21044838", "asked com.kestrel.halyard.HWReporting.State"));
+}
+
 TEST_F(HYReportingDriverUtilityTest, ReportsTheChangeSinceTheSnapshotEveryTime) {
     const auto session = sessionWithSnapshot();
     const auto snapshot = session->driverSnapShot();

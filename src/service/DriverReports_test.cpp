@@ -43,6 +43,20 @@ TEST_F(DriverReportsTest, AStartTakesASnapshotOfTheDriversAndSendsNothing) {
     EXPECT_THAT(session(7)->nestedAggregatedPayloadData(), IsEmpty());
 }
 
+TEST_F(DriverReportsTest, AStartTakesItsSnapshotOnceTheSessionHasStarted) {
+    client().create(7);
+    platform_.logMarksAndQuestions();
+    platform_.log.clear();
+    client().start(7);
+    auto texts = platform_.log.texts();
+    texts.resize(7);
+    EXPECT_THAT(texts, ElementsAre("starting session for reporter 7", "mark 21044818",
+                                   "starting session owned by 7", "mark 2104482c",
+                                   "sampling driver Speaker-(null)", "getting features",
+                                   "sessions for client 100 : (\n    \"" +
+                                       session(7)->description() + "\"\n)"));
+}
+
 TEST_F(DriverReportsTest, AStopReportsTheDriversThenTakesASnapshot) {
     client().createAndStart(7);
     const auto atStart = session(7)->driverSnapShot();
@@ -52,6 +66,17 @@ TEST_F(DriverReportsTest, AStopReportsTheDriversThenTakesASnapshot) {
         platform_.hwReport.calls,
         ElementsAre("sample Speaker-(null)", "delta Speaker-(null) 1 2", "sample Speaker-(null)"));
     EXPECT_NE(session(7)->driverSnapShot(), atStart);
+}
+
+TEST_F(DriverReportsTest, AStopDoesBothBeforeTheSessionEnds) {
+    client().createAndStart(7);
+    platform_.log.clear();
+    client().stop(7);
+    auto texts = platform_.log.texts();
+    texts.resize(6);
+    EXPECT_THAT(texts, ElementsAre("stopping session for reporter 7", "getting latest samples",
+                                   "done getting latest samples", "sampling driver Speaker-(null)",
+                                   "ending session 7", "ending session 7"));
 }
 
 TEST_F(DriverReportsTest, TheReportReachesTheUploadSessionBeforeItEnds) {

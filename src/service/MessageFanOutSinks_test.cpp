@@ -3,6 +3,7 @@
 #include "service/ServiceFixture.h"
 
 #include <algorithm>
+#include <limits>
 
 namespace halyard {
 namespace {
@@ -34,12 +35,6 @@ protected:
         return send(peer, kAudioEventTypeEnergyLedger,
                     {{"Haptic_Active_Hardware_Time_Seconds", seconds}}, ReporterIDs{7});
     }
-    void expectNoSinkSawAnything() {
-        EXPECT_THAT(platform_.analytics.asked, IsEmpty());
-        EXPECT_THAT(platform_.energyLedger.events, IsEmpty());
-        EXPECT_THAT(platform_.metrics.metrics, IsEmpty());
-        EXPECT_THAT(platform_.incidentReporter.requests, IsEmpty());
-    }
     // The place of a line in the log.
     std::ptrdiff_t lineOf(const std::string& text) const {
         const auto texts = platform_.log.texts();
@@ -65,36 +60,12 @@ TEST_F(MessageFanOutSinksTest, ABroadcastReachesTheSessionBeforeTheSinks) {
     EXPECT_LT(lineOf(kSessionLine), lineOf(kSinkLine));
 }
 
-TEST_F(MessageFanOutSinksTest, WithThreeStartedSessionsEachSinkSeesThreeMessages) {
-    for (const std::int64_t id : {7, 8, 9}) {
-        client_.createAndStart(id);
-    }
-    sendIssue(std::nullopt);
-    EXPECT_THAT(platform_.metrics.metrics, SizeIs(3));
-    EXPECT_THAT(platform_.analytics.events, SizeIs(6)); // under two names each
-    for (const std::int64_t id : {7, 8, 9}) {
-        EXPECT_EQ(session(id)->messageIdentifierCount("Playback_IssueDetector"), 1U);
-    }
-}
-
 TEST_F(MessageFanOutSinksTest, AnIDNamedTwiceIsOfferedTwice) {
     client_.createAndStart(7);
     sendIssue(ReporterIDs{7, 7});
     EXPECT_THAT(platform_.metrics.metrics, SizeIs(2));
     EXPECT_EQ(session(7)->messageIdentifierCount("Playback_IssueDetector"), 1U)
         << "the sinks see repeats, the batch does not";
-}
-
-TEST_F(MessageFanOutSinksTest, AStandaloneMessageReachesEachSinkOnce) {
-    sendIssue(std::nullopt);
-    EXPECT_THAT(platform_.metrics.metrics, SizeIs(1));
-    ASSERT_THAT(platform_.analytics.events, SizeIs(2));
-    EXPECT_EQ(platform_.analytics.events[0].name, "com.kestrel.halyard.Playback.IssueDetector");
-    EXPECT_EQ(platform_.analytics.events[1].name, "com.kestrel.standalone.Playback.IssueDetector");
-    EXPECT_EQ(platform_.analytics.events[0].builder(),
-              (Dictionary{{"HostApplicationDisplayID", "Unknown"}}));
-    platform_.queues.advance(1s);
-    EXPECT_THAT(platform_.relayReporting.singles, SizeIs(1));
 }
 
 TEST_F(MessageFanOutSinksTest, TheStandaloneSessionIsATemporaryOfIDOne) {
@@ -108,21 +79,6 @@ TEST_F(MessageFanOutSinksTest, TheStandaloneSessionIsATemporaryOfIDOne) {
     EXPECT_EQ(service_->activeSessionCount(), 0);
 }
 
-TEST_F(MessageFanOutSinksTest, WithReportingDisabledNoSinkSeesTheMessage) {
-    client_.createAndStart(7);
-    service_->setReportingEnabled(false);
-    sendIssue(ReporterIDs{7});
-    sendIssue(std::nullopt);
-    expectNoSinkSawAnything();
-}
-
-TEST_F(MessageFanOutSinksTest, ZeroUnknownAndEmptyListsReachNoSink) {
-    client_.createAndStart(7);
-    EXPECT_TRUE(sendIssue(ReporterIDs{0, 99})->succeeded());
-    EXPECT_TRUE(sendIssue(ReporterIDs{})->succeeded());
-    expectNoSinkSawAnything();
-}
-
 TEST_F(MessageFanOutSinksTest, OtherBuildsThanInternalOnesCaptureNoIssues) {
     client_.createAndStart(7);
     for (const int seconds : {1, 2, 3, 4}) {
@@ -132,15 +88,96 @@ TEST_F(MessageFanOutSinksTest, OtherBuildsThanInternalOnesCaptureNoIssues) {
     EXPECT_THAT(platform_.incidentReporter.requests, IsEmpty());
 }
 
+// All four sinks are at work, and one leak is enough for a trace of it: not a number
+// equals nothing, so no report is taken for a repeat.
 class InternalFanOutTest : public MessageFanOutSinksTest {
 protected:
     InternalFanOutTest() : MessageFanOutSinksTest(true) { client_.createAndStart(7); }
+
+    // One message for analytics and metrics, one for analytics, ledger and capture.
+    void sendForAllSinks(const std::optional<ReporterIDs>& ids) {
+        EXPECT_EQ(sendIssue(ids)->count, 1);
+        send(client_, kAudioEventTypeEnergyLedger,
+             {{"Haptic_Active_Hardware_Time_Seconds", std::numeric_limits<double>::quiet_NaN()}},
+             ids);
+    }
+    // Each second report is one of the requests.
+    std::size_t captured() const {
+        return platform_.log.count("Incrementing IBX counter. player") +
+               platform_.incidentReporter.requests.size();
+    }
+    void expectEachSinkSaw(std::size_t times) {
+        EXPECT_THAT(platform_.metrics.metrics, SizeIs(times));
+        EXPECT_THAT(platform_.energyLedger.events, SizeIs(times));
+        EXPECT_EQ(captured(), times);
+        EXPECT_THAT(platform_.analytics.events, SizeIs(4 * times)); // two messages, two names
+    }
 };
+
+TEST_F(InternalFanOutTest, WithThreeStartedSessionsEachSinkSeesThreeMessages) {
+    client_.createAndStart(8);
+    connect(200).createAndStart(9);
+    client_.create(10);
+    sendForAllSinks(std::nullopt);
+    expectEachSinkSaw(3);
+    EXPECT_EQ(session(7)->messageIdentifierCount("Playback_IssueDetector"), 1U);
+    EXPECT_EQ(session(8)->messageIdentifierCount("Playback_IssueDetector"), 1U);
+    EXPECT_EQ(session(9, 1)->messageIdentifierCount("Playback_IssueDetector"), 1U);
+}
+
+TEST_F(InternalFanOutTest, AnAddressedMessageReachesEachSinkOnce) {
+    client_.createAndStart(8);
+    sendForAllSinks(ReporterIDs{7});
+    expectEachSinkSaw(1);
+}
+
+TEST_F(InternalFanOutTest, AStandaloneMessageReachesEachSinkOnce) {
+    client_.stop(7);
+    sendForAllSinks(std::nullopt);
+    expectEachSinkSaw(1);
+    EXPECT_EQ(platform_.analytics.events[0].name, "com.kestrel.halyard.Playback.IssueDetector");
+    EXPECT_EQ(platform_.analytics.events[1].name, "com.kestrel.standalone.Playback.IssueDetector");
+    EXPECT_EQ(platform_.analytics.events[0].builder(),
+              (Dictionary{{"HostApplicationDisplayID", "Unknown"}}));
+    platform_.queues.advance(1s);
+    EXPECT_THAT(platform_.relayReporting.singles, SizeIs(2)) << "one for each of the two";
+}
+
+TEST_F(InternalFanOutTest, WithReportingDisabledNoSinkSeesTheMessage) {
+    service_->setReportingEnabled(false);
+    sendForAllSinks(ReporterIDs{7});
+    sendForAllSinks(std::nullopt);
+    expectEachSinkSaw(0);
+    EXPECT_THAT(platform_.analytics.asked, IsEmpty());
+}
+
+TEST_F(InternalFanOutTest, ZeroUnknownAndEmptyListsReachNoSink) {
+    sendForAllSinks(ReporterIDs{0, 99});
+    sendForAllSinks(ReporterIDs{});
+    expectEachSinkSaw(0);
+    EXPECT_THAT(platform_.analytics.asked, IsEmpty());
+}
 
 TEST_F(InternalFanOutTest, IssuesAreCapturedUnderTheSendersName) {
     const Peer sender = connect(200, "leaker");
     sendLeak(sender, 1);
     sendLeak(sender, 2);
+    ASSERT_THAT(platform_.incidentReporter.requests, SizeIs(1));
+    EXPECT_EQ(platform_.incidentReporter.requests[0].signature["detectedProcess"], Value("leaker"));
+}
+
+TEST_F(InternalFanOutTest, TheSendersNameIsThatOfTheTimeOfSending) {
+    const Peer sender = connect(200, "leaker");
+    for (const int seconds : {1, 2}) {
+        sender.connection().notify(
+            protocol::Method::SendMessage,
+            {.dictionary = {{"Haptic_Active_Hardware_Time_Seconds", seconds}},
+             .category = kAudioEventCategoryPlayback,
+             .type = kAudioEventTypeEnergyLedger,
+             .reporterIDs = ReporterIDs{7}});
+    }
+    platform_.processTable.names[200] = "another";
+    run();
     ASSERT_THAT(platform_.incidentReporter.requests, SizeIs(1));
     EXPECT_EQ(platform_.incidentReporter.requests[0].signature["detectedProcess"], Value("leaker"));
 }

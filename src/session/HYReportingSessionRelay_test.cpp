@@ -181,6 +181,17 @@ TEST_F(SessionRelayTest, AnAnswerForAGoneSessionDoesNothing) {
     EXPECT_THAT(platform_.log.lines(), IsEmpty());
 }
 
+TEST_F(SessionRelayTest, AnUploadSessionThatLosesItsBackendsGetsNothingMore) {
+    const auto session = startWaitingSession();
+    upload().answer(List{Value("store")});
+    run();
+    upload().answer(std::nullopt);
+    sendNumber(*session, 1);
+    run();
+    EXPECT_TRUE(session->hasRelayReportingSession());
+    EXPECT_THAT(upload().messages, IsEmpty());
+}
+
 TEST_F(SessionRelayTest, MessagesSentRightAfterTheStartWaitForTheOpeningInOrder) {
     const auto session = startWaitingSession();
     for (const int number : {1, 2, 3}) {

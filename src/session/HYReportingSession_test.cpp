@@ -138,12 +138,27 @@ TEST_F(HYReportingSessionTest, ARestartBeginsWithAnEmptyBatchAndEmptyCounts) {
     EXPECT_THAT(identifiers(*session), ElementsAre("Playback_Start_1"));
 }
 
-TEST_F(HYReportingSessionTest, DestructionIsMarkedAndLogged) {
+TEST_F(HYReportingSessionTest, EachMilestoneIsMarkedWhereItsTurnIs) {
+    platform_.logMarksAndQuestions();
     auto session = makeSession();
-    platform_.traceMarks.codes.clear();
+    session->start();
+    send(*session, {});
+    send(*session, {});
+    session->stop();
     session = nullptr;
+    auto texts = platform_.log.texts();
+    EXPECT_THAT(std::vector(texts.begin(), texts.begin() + 9),
+                ElementsAre("created reporting session for ID: 7", "mark 21044828",
+                            "starting session owned by 7", "mark 2104482c",
+                            "sending message for session owned by 7", "mark 21044838",
+                            "sending message for session owned by 7", "dropping redundant event",
+                            "mark 21044838"));
+    EXPECT_THAT(std::vector(texts.begin() + 9, texts.begin() + 12),
+                ElementsAre("ending session 7", "ending session 7", "mark 21044830"));
+    EXPECT_THAT(std::vector(texts.end() - 2, texts.end()),
+                ElementsAre("mark 21044834", "deallocing this session 7"));
     EXPECT_TRUE(logged(LogLevel::Info, "deallocing this session 7"));
-    EXPECT_THAT(platform_.traceMarks.codes, ElementsAre(0x21044834));
+    EXPECT_TRUE(platform_.traceMarks.argumentsAllZero);
 }
 
 TEST_F(HYReportingSessionTest, MakesItsRelayQueueOnFirstUseAndOnce) {

@@ -81,6 +81,75 @@ TEST_F(SessionEventsTest, AMessagesOwnContextCountsForTheStretchThatItEnds) {
     EXPECT_EQ(event["session_selected_format"], Value("F32LE"));
 }
 
+TEST_F(SessionEventsTest, AnyMessageTellsTheContext) {
+    add(Dictionary{{"session_selected_format", "S16LE"},
+                   {"active_devices", "speaker"},
+                   {"VQSessionVolumeOperationProcess", "mixer"}});
+    addVolume(0.5, true, 10);
+    add(Dictionary{{"VQSessionVolumeOperationProcess", "remote"}});
+    addVolume(0.5, false, 11);
+
+    const Dictionary event = volumeEvents(0.5).at(0);
+    EXPECT_EQ(event["session_selected_format"], Value("S16LE"));
+    EXPECT_EQ(event["active_devices"], Value("speaker"));
+    EXPECT_EQ(event["VQSessionVolumeOperationProcess"], Value("remote"));
+}
+
+TEST_F(SessionEventsTest, WhatComesAfterAStretchIsNotItsContext) {
+    addVolume(0.5, true, 10);
+    addVolume(0.5, false, 11);
+    add(Dictionary{{"session_selected_format", "S16LE"},
+                   {"active_devices", "speaker"},
+                   {"VQSessionVolumeOperationProcess", "mixer"}});
+
+    const Dictionary event = volumeEvents(0.5).at(0);
+    EXPECT_EQ(event["session_selected_format"], Value("Unknown"));
+    EXPECT_EQ(event["active_devices"], Value("Unknown"));
+    EXPECT_EQ(event["VQSessionVolumeOperationProcess"], Value("Unknown"));
+}
+
+TEST_F(SessionEventsTest, AStretchEndsWhenThePlayingStops) {
+    addVolume(0.5, true, 10);
+    addVolume(0.5, false, 12);
+    addVolume(0.5, false, 20);
+    addVolume(0.5, true, 50);
+    addVolume(0.5, false, 53);
+
+    const auto events = volumeEvents(0.5);
+    ASSERT_EQ(events.size(), 2u);
+    EXPECT_EQ(events[0]["play_seconds"], Value(2));
+    EXPECT_EQ(events[1]["play_seconds"], Value(3));
+}
+
+TEST_F(SessionEventsTest, AStretchBeginsOnlyWhereSomethingPlays) {
+    addVolume(0.5, false, 10);
+    addVolume(0.75, false, 20);
+    EXPECT_TRUE(volumeEvents(0.5).empty());
+    addVolume(0.75, true, 30);
+    addVolume(0.75, false, 34);
+
+    const auto events = volumeEvents(0.5);
+    ASSERT_EQ(events.size(), 1u);
+    EXPECT_EQ(events[0]["play_seconds"], Value(4));
+}
+
+TEST_F(SessionEventsTest, APlayingStateIsTrueWhenItIsNoZero) {
+    for (const Value& state : {Value(-1), Value(2), Value("1"), Value(true)}) {
+        messages_.clear();
+        add(Dictionary{{"VQSessionVolume", 0.5},
+                       {"VQSessionVolumePlayingState", state},
+                       {"hyreporting_timestamp", 10}});
+        addVolume(0.5, false, 12);
+        EXPECT_EQ(volumeEvents(0.5).size(), 1u) << describe(state);
+    }
+}
+
+TEST_F(SessionEventsTest, AVolumeWithoutAPlayingStateDoesNotPlay) {
+    add(Dictionary{{"VQSessionVolume", 0.5}, {"hyreporting_timestamp", 10}});
+    addVolume(0.5, false, 12);
+    EXPECT_TRUE(volumeEvents(0.5).empty());
+}
+
 TEST_F(SessionEventsTest, NumbersAreBucketed) {
     addVolume(0.3, true, 10);
     addVolume(0.3, false, 13);

@@ -58,6 +58,31 @@ TEST_F(SessionStopTest, VolumeEventsThenFileThenSummaryThenClosing) {
                                    "sending summary event for reporter 7"));
 }
 
+TEST_F(SessionStopTest, StretchesOfHalfASecondAreTooShortForAnEvent) {
+    for (const auto& [end, events] : {std::pair(10.5, 0U), std::pair(10.75, 1U)}) {
+        const auto session = makeSession();
+        session->start();
+        sendVolume(*session, 0.5, true, 10);
+        sendVolume(*session, 0.5, false, end);
+        EXPECT_THAT(session->createVolumeMessages(), SizeIs(events));
+    }
+}
+
+TEST_F(SessionStopTest, VolumeEventsGoToTheSessionBeforeTheyGoToAnalytics) {
+    const auto session = playedSession();
+    platform_.logMarksAndQuestions();
+    platform_.log.clear();
+    session->stop();
+
+    auto texts = platform_.log.texts();
+    texts.resize(8);
+    EXPECT_THAT(texts, ElementsAre("ending session 7", "ending session 7", "mark 21044830",
+                                   "sending volume event for reporter 7",
+                                   "sending message for session owned by 7", "mark 21044838",
+                                   "asked com.kestrel.halyard.Volume.Summary",
+                                   "asked com.kestrel.longformaudio.Volume.Summary"));
+}
+
 TEST_F(SessionStopTest, VolumeEventsGoToAnalyticsToo) {
     platform_.analytics.usesAll = true;
     const auto session = playedSession();

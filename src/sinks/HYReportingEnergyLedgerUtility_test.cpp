@@ -24,6 +24,21 @@ TEST_F(HYReportingEnergyLedgerUtilityTest, RegistersTheEnginesOnTime) {
     EXPECT_TRUE(log_.lines().empty());
 }
 
+TEST_F(HYReportingEnergyLedgerUtilityTest, PayloadsHaveTheirKeysInAFixedOrder) {
+    handle({{"hyreporting_timestamp", 1.5}, {"EngineOnTime", 2.5}});
+    handle({{"Active_Clients", 3}, {"Haptic_Active_Hardware_Time_Seconds", 12}});
+    std::vector<std::vector<std::string>> keys;
+    for (const auto& event : ledger_.events) {
+        keys.emplace_back();
+        for (const auto& [key, value] : event.payload) {
+            keys.back().emplace_back(key.text());
+        }
+    }
+    EXPECT_EQ(keys, (std::vector<std::vector<std::string>>{
+                        {"EngineOnDuration", "ApplicationName", "TimestampEnd"},
+                        {"Haptic_Active_Hardware_Time_Seconds", "Active_Clients"}}));
+}
+
 TEST_F(HYReportingEnergyLedgerUtilityTest, CopiesValuesAsTheyStand) {
     handle({{"EngineOnTime", "soon"}, {"hyreporting_timestamp", List{Value(1)}}});
     EXPECT_EQ(ledger_.events[0].payload["EngineOnDuration"], Value("soon"));

@@ -1,8 +1,10 @@
 // Event services that record what they are given.
 #pragma once
 
+#include <functional>
 #include <set>
 #include <string>
+#include <string_view>
 #include <utility>
 #include <vector>
 
@@ -21,6 +23,9 @@ public:
 
     bool isEventUsed(std::string_view name) const override {
         asked.emplace_back(name);
+        if (onAsked) {
+            onAsked(name);
+        }
         return usesAll || used.count(std::string(name)) != 0;
     }
     void sendEventLazily(std::string_view name, PayloadBuilder builder) override {
@@ -30,6 +35,7 @@ public:
     std::set<std::string> used;
     bool usesAll = false;
     mutable std::vector<std::string> asked;
+    std::function<void(std::string_view name)> onAsked;
     std::vector<Event> events;
 };
 

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <functional>
 #include <mutex>
 #include <vector>
 
@@ -13,13 +14,19 @@ class FakeTraceMarks final : public platform::TraceMarks {
 public:
     void mark(std::uint32_t code, std::uint64_t arg1, std::uint64_t arg2, std::uint64_t arg3,
               std::uint64_t arg4) override {
-        const std::lock_guard lock(mutex_);
-        codes.push_back(code);
-        argumentsAllZero = argumentsAllZero && (arg1 | arg2 | arg3 | arg4) == 0;
+        {
+            const std::lock_guard lock(mutex_);
+            codes.push_back(code);
+            argumentsAllZero = argumentsAllZero && (arg1 | arg2 | arg3 | arg4) == 0;
+        }
+        if (onMark) {
+            onMark(code);
+        }
     }
 
     std::vector<std::uint32_t> codes;
     bool argumentsAllZero = true;
+    std::function<void(std::uint32_t code)> onMark;
 
 private:
     std::mutex mutex_;

@@ -2,6 +2,8 @@
 // object lives. Member of a fixture, ahead of what uses the platform.
 #pragma once
 
+#include <fmt/core.h>
+
 #include "platform/Platform.h"
 #include "testing/FakeCondition.h"
 #include "testing/FakeDevice.h"
@@ -62,6 +64,13 @@ public:
     TestPlatform(const TestPlatform&) = delete;
     TestPlatform& operator=(const TestPlatform&) = delete;
 
+    // From now on the log shows marks and questions to the analytics, too, as "mark
+    // 2104482c" and "asked NAME": what came before what can be read there.
+    void logMarksAndQuestions() {
+        traceMarks.onMark = [this](std::uint32_t code) { note(fmt::format("mark {:x}", code)); };
+        analytics.onAsked = [this](std::string_view name) { note(fmt::format("asked {}", name)); };
+    }
+
     RecordingLog log;
     FakeTraceMarks traceMarks;
     ManualClock clock;
@@ -85,6 +94,11 @@ public:
     FakeIncidentReporter incidentReporter;
     FakeOperations operations;
     FakeHWReport hwReport;
+
+private:
+    void note(std::string_view text) {
+        log.write({LogLevel::Debug, LogCategory(), {}, 0, {}, text});
+    }
 };
 
 } // namespace halyard::testing

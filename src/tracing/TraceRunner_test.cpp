@@ -109,9 +109,13 @@ TEST_F(TraceRunnerTest, EventsThatWaitedInTheQueueCountWhenItStops) {
     runner_->runTraces();
     session(0).deliver(tracePoint(1, 10));
     session(0).deliver(tracePoint(2, 20));
-    EXPECT_EQ(platform_.queues.pending("Tracing Queue"), 2U);
+    session(0).deliver(tracePoint(1, 30));
+    session(0).deliver(tracePoint(2, 45));
+    ASSERT_EQ(platform_.queues.pending("Tracing Queue"), 4U);
     runner_->stopTracingandProcessResults();
-    EXPECT_THAT(results().values, SizeIs(1));
+    EXPECT_EQ(platform_.queues.pending("Tracing Queue"), 0U);
+    EXPECT_THAT(results().values, ElementsAre(FakeResultsFiles::NamedValue{"b", 10},
+                                              FakeResultsFiles::NamedValue{"b", 15}));
 }
 
 TEST_F(TraceRunnerTest, AStoppedTracesSessionIsEndedOnceAndDestroyed) {
