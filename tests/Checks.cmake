@@ -15,3 +15,4 @@ halyard_check(includes ${HALYARD_PYTHON} ${scripts}/check-includes.py ${PROJECT_
 halyard_check(includes_self_test ${HALYARD_PYTHON} ${scripts}/check-includes.py --self-test)
 halyard_check(docs ${HALYARD_PYTHON} ${scripts}/check-docs.py ${PROJECT_SOURCE_DIR})
 halyard_check(docs_self_test ${HALYARD_PYTHON} ${scripts}/check-docs.py --self-test)
+halyard_check(mutate_self_test ${scripts}/mutate --self-test)
