@@ -12,16 +12,19 @@
 #include <thread>
 
 #include "client/Client.h"
-#include "client/FakeDaemon.h"
 #include "halyard/halyard.hpp"
+#include "testing/FakeDaemon.h"
+#include "testing/TempTree.h"
 
 namespace halyard::client {
 namespace {
 
+using halyard::testing::FakeDaemon;
+using halyard::testing::TempTree;
 using protocol::Call;
 using protocol::Method;
 using Calls = FakeDaemon::Calls;
-using testing::ElementsAre;
+using ::testing::ElementsAre;
 
 // Values that callbacks leave, for the test to wait for.
 template <class T> class Mailbox {
@@ -67,18 +70,12 @@ std::int64_t codeOf(const reporting::Failure* failure) {
     return failure ? failure->code : 0;
 }
 
-class ClientTest : public testing::Test {
+class ClientTest : public ::testing::Test {
 protected:
-    ClientTest() {
-        char pattern[] = "/tmp/halyard-client-XXXXXX";
-        directory_ = ::mkdtemp(pattern);
-        socket_ = directory_ + "/reporting.sock";
-        daemon_ = std::make_unique<FakeDaemon>(socket_);
-    }
+    ClientTest() { daemon_ = std::make_unique<FakeDaemon>(socket_); }
     ~ClientTest() override {
         client_.reset();
         daemon_.reset();
-        std::filesystem::remove_all(directory_);
     }
 
     void connect(std::size_t memoryLimit = 0) {
@@ -118,8 +115,8 @@ protected:
         return [&box](const reporting::Failure* failure) { box.put(codeOf(failure)); };
     }
 
-    std::string directory_;
-    std::string socket_;
+    TempTree directory_;
+    std::string socket_ = directory_ / "reporting.sock";
     std::uint32_t flushTimeoutMs_ = 60'000;
     std::unique_ptr<FakeDaemon> daemon_;
     // Outlive the client, whose callbacks write to them.

@@ -22,7 +22,7 @@
 
 #include "protocol/Wire.h"
 
-namespace halyard::client {
+namespace halyard::testing {
 
 class FakeDaemon {
 public:
@@ -199,4 +199,4 @@ private:
     std::map<protocol::Method, std::pair<MaybeError, Value>> answers_;
 };
 
-} // namespace halyard::client
+} // namespace halyard::testing
