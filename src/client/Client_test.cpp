@@ -404,6 +404,20 @@ TEST_F(ClientTest, SendsAMessageThatAFrameJustTakes) {
     EXPECT_EQ(daemon_->calls()[0].arguments.dictionary.size(), 4U);
 }
 
+TEST_F(ClientTest, ARangeIsSentAsAList) {
+    startAndConnect();
+    const std::vector<std::string> names{"speaker", "headphones"};
+    const std::vector<std::vector<int>> rows{{1, 2}, {}};
+    client_->broadcast(reporting::Dictionary().set("names", names).set("rows", rows).set("n", 1),
+                       HALYARD_CATEGORY_IO, HALYARD_TYPE_START);
+
+    ASSERT_TRUE(daemon_->waitForCalls(1));
+    const Dictionary sent = daemon_->calls()[0].arguments.dictionary;
+    EXPECT_EQ(sent["names"], Value(List{"speaker", "headphones"}));
+    EXPECT_EQ(sent["rows"], Value(List{List{1, 2}, List{}}));
+    EXPECT_EQ(sent["n"], Value(1));
+}
+
 TEST_F(ClientTest, RefusesABrokenDictionary) {
     connect();
     reporting::Dictionary message;

@@ -10,6 +10,7 @@
 #include <cstdint>
 #include <functional>
 #include <memory>
+#include <ranges>
 #include <span>
 #include <string>
 #include <string_view>
@@ -127,6 +128,16 @@ public:
     template <std::unsigned_integral T> Dictionary& set(const char* key, T value) {
         halyard_dictionary_set_uint(get(), key, value);
         return *this;
+    }
+    // A list of what a range has: texts, numbers, or ranges of them.
+    template <std::ranges::input_range Range>
+        requires(!std::convertible_to<const Range&, std::string_view>)
+    Dictionary& set(const char* key, const Range& values) {
+        beginList(key);
+        for (const auto& value : values) {
+            set(nullptr, value);
+        }
+        return end();
     }
     Dictionary& setDate(const char* key, std::int64_t seconds, std::uint32_t nanoseconds) {
         halyard_dictionary_set_date(get(), key, seconds, nanoseconds);
