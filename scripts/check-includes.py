@@ -51,8 +51,9 @@ EXTRA = {
 # nothing but tests sees what they share.
 TEST_FILES = ("_test.cpp", "Fixture.h", "TestSupport.h", "Testing.h")
 TEST_EXTRA = {"testing"}
-# Programs beside the daemon are clients of it.
-TOOLS = {"common", "protocol", "client"}
+# Programs beside the daemon are clients of it like anybody's: they see libhalyard's
+# public headers. Their tests play the daemon's side.
+TOOLS_TEST_EXTRA = {"common", "protocol", "testing"}
 # The client's public headers, included as <halyard/...> or "halyard/...".
 PUBLIC = {"halyard": "client"}
 
@@ -109,16 +110,17 @@ class File:
         self.folder = folder_of(inner) if top == "src" else None
         self.is_core = self.folder in CORE and inner not in EXTRA
         if self.folder is None:
-            self.sees = set(TOOLS)
+            self.sees = TOOLS_TEST_EXTRA if self.is_test else set()
         else:
             self.sees = FOLDERS[self.folder] | {self.folder} | EXTRA.get(inner, set())
-        if self.is_test:
-            self.sees = self.sees | TEST_EXTRA
+            self.sees |= TEST_EXTRA if self.is_test else set()
 
     def include_error(self, name, quoted):
         """Why this file may not include `name`; None when it may."""
         first = folder_of(name)
         if first in PUBLIC:
+            if self.folder is None:
+                return None
             first = PUBLIC[first]
             quoted = True
         if quoted:
@@ -217,7 +219,8 @@ ALLOWED = {
     "src/linux/B.cpp": '#include "linux/queues/A.h"\n',
     "src/client/A.cpp": '#include <halyard/halyard.h>\n#include "protocol/Wire.h"\n',
     "src/tracing/A.cpp": 'const char* text = "sleep(1)"; /* now() */\nint asleep(int);\n',
-    "tools/ctl/A.cpp": '#include "Table.h"\n#include "protocol/Wire.h"\n#include <unistd.h>\n',
+    "tools/ctl/A.cpp": '#include "Table.h"\n#include "halyard/halyard.hpp"\n#include <unistd.h>\n',
+    "tools/ctl/A_test.cpp": '#include "protocol/Wire.h"\n#include "testing/FakeDaemon.h"\n',
 }
 FORBIDDEN = {
     "src/common/A.cpp": '#include "platform/Clock.h"\n',
@@ -242,6 +245,10 @@ FORBIDDEN = {
     "src/testing/A.h": '#include "session/HYReportingSession.h"\n',
     "src/novel/A.h": "\n",
     "tools/ctl/A.cpp": '#include "service/Registry.h"\n',
+    "tools/ctl/B.cpp": '#include "common/Value.h"\n',
+    "tools/ctl/C.cpp": '#include "client/Client.h"\n',
+    "tools/ctl/D.cpp": '#include "testing/FakeDaemon.h"\n',
+    "tools/ctl/E_test.cpp": '#include "service/Registry.h"\n',
 }
 
 

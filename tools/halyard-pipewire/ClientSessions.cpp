@@ -1,64 +1,21 @@
 #include "ClientSessions.h"
 
-#include <string>
 #include <utility>
+#include <variant>
 
 namespace halyard::pipewire {
 
 namespace {
 
-// `key` is null in a list. Sets what the tracker's messages are made of.
-void write(reporting::Dictionary& to, const char* key, const Value& value) {
-    switch (value.kind()) {
-    case Value::Kind::None:
-        break;
-    case Value::Kind::Bool:
-        to.set(key, value.boolValue());
-        break;
-    case Value::Kind::Int:
-        to.set(key, value.integerValue());
-        break;
-    case Value::Kind::UInt:
-        to.set(key, value.unsignedValue());
-        break;
-    case Value::Kind::Float:
-        to.set(key, value.floatValue());
-        break;
-    case Value::Kind::Double:
-        to.set(key, value.doubleValue());
-        break;
-    case Value::Kind::String:
-        to.set(key, value.text());
-        break;
-    case Value::Kind::Date:
-        to.setDate(key, value.date().seconds, value.date().nanoseconds);
-        break;
-    case Value::Kind::List:
-        to.beginList(key);
-        for (const Value& element : value.list()) {
-            write(to, nullptr, element);
-        }
-        to.end();
-        break;
-    case Value::Kind::Dictionary:
-        to.beginDictionary(key);
-        for (const Dictionary::Entry& entry : value.dictionary()) {
-            write(to, std::string(entry.key.text()).c_str(), entry.value);
-        }
-        to.end();
-        break;
-    }
-}
-
-} // namespace
-
-reporting::Dictionary toReporting(const Dictionary& dictionary) {
+reporting::Dictionary toReporting(const Contents& contents) {
     reporting::Dictionary result;
-    for (const Dictionary::Entry& entry : dictionary) {
-        write(result, std::string(entry.key.text()).c_str(), entry.value);
+    for (const auto& [key, value] : contents) {
+        std::visit([&](const auto& fact) { result.set(key.c_str(), fact); }, value);
     }
     return result;
 }
+
+} // namespace
 
 void ClientSessions::count(reporting::Result result) {
     if (result != HALYARD_OK) {
@@ -67,7 +24,7 @@ void ClientSessions::count(reporting::Result result) {
 }
 
 void ClientSessions::open(std::int64_t reporterID, std::uint16_t serviceType,
-                          const Dictionary& configuration) {
+                          const Contents& configuration) {
     reporting::Session session = client_.createSession(reporterID);
     if (!session) {
         ++refused_;

@@ -18,7 +18,7 @@ public:
     explicit ClientSessions(reporting::Client& client) : client_(client) {}
 
     void open(std::int64_t reporterID, std::uint16_t serviceType,
-              const Dictionary& configuration) override;
+              const Contents& configuration) override;
     void send(std::int64_t reporterID, const Message& message) override;
     void close(std::int64_t reporterID) override;
 
@@ -32,8 +32,5 @@ private:
     std::map<std::int64_t, reporting::Session> sessions_;
     std::uint64_t refused_ = 0;
 };
-
-// The same entries, as libhalyard takes them.
-[[nodiscard]] reporting::Dictionary toReporting(const Dictionary& dictionary);
 
 } // namespace halyard::pipewire

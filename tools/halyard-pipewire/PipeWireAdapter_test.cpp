@@ -10,7 +10,6 @@
 
 #include "PrivatePipeWire.h"
 #include "StreamTracker.h"
-#include "common/Description.h"
 #include "halyard/halyard.h"
 
 namespace halyard::pipewire {
@@ -20,8 +19,8 @@ using namespace std::chrono_literals;
 
 class KeepingSink final : public SessionSink {
 public:
-    void open(std::int64_t, std::uint16_t service, const Dictionary& configuration) override {
-        opened.push_back(std::string(configuration["HostApplicationDisplayID"].text()) + "/" +
+    void open(std::int64_t, std::uint16_t service, const Contents& configuration) override {
+        opened.push_back(configuration.get<std::string>("HostApplicationDisplayID") + "/" +
                          std::to_string(service));
         configurations.push_back(configuration);
     }
@@ -33,15 +32,15 @@ public:
             return message.category == category && message.type == type;
         });
     }
-    bool hasVolume(double volume, int playing) const {
+    bool hasVolume(double volume, std::int64_t playing) const {
         return std::any_of(messages.begin(), messages.end(), [&](const Message& message) {
-            return message.contents["VQSessionVolume"] == Value(volume) &&
-                   message.contents["VQSessionVolumePlayingState"] == Value(playing);
+            return message.contents.get<double>("VQSessionVolume") == volume &&
+                   message.contents.get<std::int64_t>("VQSessionVolumePlayingState") == playing;
         });
     }
 
     std::vector<std::string> opened;
-    std::vector<Dictionary> configurations;
+    std::vector<Contents> configurations;
     std::vector<Message> messages;
     int closed = 0;
 };
@@ -98,10 +97,10 @@ TEST_F(PipeWireAdapterTest, APlayersStreamIsASession) {
     auto player = server_.play("Music");
     ASSERT_TRUE(until([this] { return plays(); }));
     EXPECT_EQ(sink_.opened, std::vector<std::string>{"test-player/7"});
-    EXPECT_GT(sink_.configurations[0]["application_pid"].integerValue(), 0);
-    const Dictionary& start = sink_.messages[0].contents;
-    EXPECT_EQ(start["active_devices"], Value(List{"out.speaker"}));
-    EXPECT_EQ(start["session_selected_format"], Value("S16LE 2ch 48000Hz"));
+    EXPECT_GT(sink_.configurations[0].get<std::int64_t>("application_pid"), 0);
+    const Contents& start = sink_.messages[0].contents;
+    EXPECT_EQ(start.get<Names>("active_devices"), Names{"out.speaker"});
+    EXPECT_EQ(start.get<std::string>("session_selected_format"), "S16LE 2ch 48000Hz");
     EXPECT_TRUE(sink_.hasVolume(1, 1));
 
     player.kill();
@@ -129,7 +128,7 @@ TEST_F(PipeWireAdapterTest, AMoveToAnotherDeviceChangesTheRouteOnce) {
     ASSERT_TRUE(until([this] { return sink_.has(HALYARD_CATEGORY_ROUTE_CHANGE, 3); }));
     const Message& last = sink_.messages.back();
     EXPECT_EQ(last.category, std::uint32_t{HALYARD_CATEGORY_VOLUME});
-    EXPECT_EQ(last.contents["active_devices"], Value(List{"out.headphones"}));
+    EXPECT_EQ(last.contents.get<Names>("active_devices"), Names{"out.headphones"});
     EXPECT_FALSE(sink_.has(HALYARD_CATEGORY_PLAYBACK, HALYARD_TYPE_STOP));
 }
 
@@ -137,7 +136,7 @@ TEST_F(PipeWireAdapterTest, ARecorderRecords) {
     const auto recorder = server_.record();
     ASSERT_TRUE(until([this] { return sink_.has(HALYARD_CATEGORY_RECORD, HALYARD_TYPE_START); }));
     EXPECT_EQ(sink_.opened, std::vector<std::string>{"test-recorder/0"});
-    EXPECT_EQ(sink_.messages[0].contents["active_devices"], Value(List{"out.speaker"}));
+    EXPECT_EQ(sink_.messages[0].contents.get<Names>("active_devices"), Names{"out.speaker"});
 }
 
 TEST_F(PipeWireAdapterTest, ADaemonThatComesBackIsFoundAgain) {

@@ -3,14 +3,14 @@
 
 #include <cstdint>
 
-#include "common/Value.h"
+#include "Contents.h"
 
 namespace halyard::pipewire {
 
 struct Message {
     std::uint32_t category = 0;
     std::uint16_t type = 0;
-    Dictionary contents;
+    Contents contents;
 };
 
 // Implementers must neither block nor call back into the tracker.
@@ -20,7 +20,7 @@ public:
 
     // Makes, configures and starts a session.
     virtual void open(std::int64_t reporterID, std::uint16_t serviceType,
-                      const Dictionary& configuration) = 0;
+                      const Contents& configuration) = 0;
     // Requires an open session of this ID, as does close().
     virtual void send(std::int64_t reporterID, const Message& message) = 0;
     // Stops and destroys it.

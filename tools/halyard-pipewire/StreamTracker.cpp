@@ -10,26 +10,22 @@ namespace halyard::pipewire {
 
 namespace {
 
-constexpr std::string_view kFormat = "session_selected_format";
-constexpr std::string_view kActiveDevices = "active_devices";
-constexpr std::string_view kPreviousDevices = "previous_devices";
-constexpr std::string_view kVolume = "VQSessionVolume";
-constexpr std::string_view kPlayingState = "VQSessionVolumePlayingState";
-constexpr std::string_view kVolumeProcess = "VQSessionVolumeOperationProcess";
+constexpr const char* kFormat = "session_selected_format";
+constexpr const char* kActiveDevices = "active_devices";
+constexpr const char* kPreviousDevices = "previous_devices";
+constexpr const char* kVolume = "VQSessionVolume";
+constexpr const char* kPlayingState = "VQSessionVolumePlayingState";
+constexpr const char* kVolumeProcess = "VQSessionVolumeOperationProcess";
 // Counts a session's runs, so that the second start is no repeat of the first.
-constexpr std::string_view kRun = "stream_run";
+constexpr const char* kRun = "stream_run";
 
-List listOf(const std::set<std::string>& names) {
-    List list;
-    for (const std::string& name : names) {
-        list.append(name);
-    }
-    return list;
+Names listOf(const std::set<std::string>& names) {
+    return Names(names.begin(), names.end());
 }
 
-void setText(Dictionary& dictionary, std::string_view key, const std::string& text) {
+void addText(Contents& contents, const char* key, const std::string& text) {
     if (!text.empty()) {
-        dictionary.set(key, text);
+        contents.add(key, text);
     }
 }
 
@@ -39,16 +35,16 @@ std::uint32_t categoryOf(Direction direction) {
 
 // Facts that help to tell streams apart, and none that tell what is listened
 // to: titles and file names stay here.
-Dictionary configurationOf(const Properties& node, const Properties& client, Direction direction) {
-    Dictionary configuration;
-    configuration.set("HostApplicationDisplayID", applicationName(node, client));
+Contents configurationOf(const Properties& node, const Properties& client, Direction direction) {
+    Contents configuration;
+    configuration.add("HostApplicationDisplayID", applicationName(node, client));
     if (const auto pid = processId(node, client)) {
-        configuration.set("application_pid", *pid);
+        configuration.add("application_pid", *pid);
     }
-    setText(configuration, "application_binary", processName(node, client));
-    setText(configuration, "media_role", property(node, "media.role"));
-    setText(configuration, "node_name", property(node, "node.name"));
-    configuration.set("stream_direction",
+    addText(configuration, "application_binary", processName(node, client));
+    addText(configuration, "media_role", property(node, "media.role"));
+    addText(configuration, "node_name", property(node, "node.name"));
+    configuration.add("stream_direction",
                       direction == Direction::Playback ? "playback" : "capture");
     return configuration;
 }
@@ -282,15 +278,15 @@ void StreamTracker::follow(Session& session, const Node& stream, const Route& ro
     }
 }
 
-void StreamTracker::addContext(const Session& session, Dictionary& contents) const {
-    setText(contents, kFormat, session.format);
+void StreamTracker::addContext(const Session& session, Contents& contents) const {
+    addText(contents, kFormat, session.format);
     if (!session.devices.empty()) {
-        contents.set(kActiveDevices, listOf(session.devices));
+        contents.add(kActiveDevices, listOf(session.devices));
     }
 }
 
 void StreamTracker::tellStart(Session& session, Direction direction) {
-    Dictionary contents{{kRun, session.run}};
+    Contents contents{{kRun, session.run}};
     addContext(session, contents);
     sink_.send(session.reporterID, {categoryOf(direction), HALYARD_TYPE_START, contents});
 }
@@ -298,11 +294,11 @@ void StreamTracker::tellStart(Session& session, Direction direction) {
 void StreamTracker::tellStop(Session& session, Direction direction) {
     session.playing = false;
     sink_.send(session.reporterID,
-               {categoryOf(direction), HALYARD_TYPE_STOP, Dictionary{{kRun, session.run}}});
+               {categoryOf(direction), HALYARD_TYPE_STOP, Contents{{kRun, session.run}}});
 }
 
 void StreamTracker::tellRoute(Session& session, const std::set<std::string>& previous) {
-    Dictionary contents{{kPreviousDevices, listOf(previous)}};
+    Contents contents{{kPreviousDevices, listOf(previous)}};
     addContext(session, contents);
     sink_.send(session.reporterID,
                {HALYARD_CATEGORY_ROUTE_CHANGE, HALYARD_TYPE_ACTIVATE, contents});
@@ -314,9 +310,9 @@ void StreamTracker::tellVolume(Session& session, double volume, bool playing) {
     }
     session.toldVolume = volume;
     session.toldPlaying = playing;
-    Dictionary contents{{kVolume, volume},
-                        {kPlayingState, playing ? 1 : 0},
-                        {kVolumeProcess, session.operationProcess}};
+    Contents contents{{kVolume, volume},
+                      {kPlayingState, std::int64_t{playing}},
+                      {kVolumeProcess, session.operationProcess}};
     addContext(session, contents);
     sink_.send(session.reporterID, {HALYARD_CATEGORY_VOLUME, HALYARD_TYPE_ACTIVATE, contents});
 }

@@ -95,7 +95,7 @@ private:
     void tellStop(Session& session, Direction direction);
     void tellRoute(Session& session, const std::set<std::string>& previous);
     void tellVolume(Session& session, double volume, bool playing);
-    void addContext(const Session& session, Dictionary& contents) const;
+    void addContext(const Session& session, Contents& contents) const;
 
     SessionSink& sink_;
     std::int64_t nextReporterID_;

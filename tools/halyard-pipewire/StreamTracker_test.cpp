@@ -1,10 +1,10 @@
 #include "StreamTracker.h"
 
+#include <fmt/core.h>
 #include <gtest/gtest.h>
 #include <string>
 #include <vector>
 
-#include "common/Description.h"
 #include "halyard/halyard.h"
 
 namespace halyard::pipewire {
@@ -19,7 +19,7 @@ constexpr ObjectId kStream = 20;
 // Writes down what the tracker does: "open 1000 7", "Volume 0.4 playing", ...
 class ScriptSink final : public SessionSink {
 public:
-    void open(std::int64_t id, std::uint16_t service, const Dictionary& configuration) override {
+    void open(std::int64_t id, std::uint16_t service, const Contents& configuration) override {
         lines.push_back("open " + std::to_string(id) + " " + std::to_string(service));
         configurations.push_back(configuration);
     }
@@ -33,16 +33,17 @@ public:
     const Message& last() const { return messages.back(); }
 
     std::vector<std::string> lines;
-    std::vector<Dictionary> configurations;
+    std::vector<Contents> configurations;
     std::vector<Message> messages;
 
 private:
     static std::string textOf(const Message& message) {
         switch (message.category) {
         case HALYARD_CATEGORY_VOLUME:
-            return "volume " + describe(message.contents["VQSessionVolume"]) +
-                   (message.contents["VQSessionVolumePlayingState"].boolValue() ? " playing"
-                                                                                : " silent");
+            return "volume " + fmt::format("{}", message.contents.get<double>("VQSessionVolume")) +
+                   (message.contents.get<std::int64_t>("VQSessionVolumePlayingState") != 0
+                        ? " playing"
+                        : " silent");
         case HALYARD_CATEGORY_ROUTE_CHANGE:
             return "route " + devices(message);
         default:
@@ -52,8 +53,8 @@ private:
     }
     static std::string devices(const Message& message) {
         std::string text;
-        for (const Value& name : message.contents["active_devices"].list()) {
-            text += (text.empty() ? "" : "+") + std::string(name.text());
+        for (const std::string& name : message.contents.get<Names>("active_devices")) {
+            text += (text.empty() ? "" : "+") + name;
         }
         return text;
     }
@@ -131,11 +132,11 @@ TEST_F(StreamTrackerTest, TheConfigurationNamesTheApplication) {
     stream();
     state(NodeState::Running);
     settle();
-    const Dictionary expected{{"HostApplicationDisplayID", "Player"},
-                              {"application_pid", 42},
-                              {"media_role", "Music"},
-                              {"node_name", "pw-play"},
-                              {"stream_direction", "playback"}};
+    const Contents expected{{"HostApplicationDisplayID", "Player"},
+                            {"application_pid", 42},
+                            {"media_role", "Music"},
+                            {"node_name", "pw-play"},
+                            {"stream_direction", "playback"}};
     ASSERT_EQ(sink_.configurations.size(), 1U);
     EXPECT_EQ(sink_.configurations.front(), expected);
 }
@@ -146,18 +147,18 @@ TEST_F(StreamTrackerTest, ACaptureStreamRecords) {
     state(NodeState::Running);
     settle();
     EXPECT_EQ(sink_.takeLines(), (Lines{"open 1000 0", "record start", "volume 1 playing"}));
-    EXPECT_EQ(sink_.last().contents["active_devices"], Value(List{"out.speaker"}));
+    EXPECT_EQ(sink_.last().contents.get<Names>("active_devices"), (Names{"out.speaker"}));
 }
 
 TEST_F(StreamTrackerTest, AVolumeMessageCarriesWhatPlaysAndWhere) {
     play();
     volume(0.064F);
     settle();
-    const Dictionary expected{{"VQSessionVolume", 0.4},
-                              {"VQSessionVolumePlayingState", 1},
-                              {"VQSessionVolumeOperationProcess", "Player"},
-                              {"session_selected_format", "F32LE 2ch 48000Hz"},
-                              {"active_devices", List{"out.speaker"}}};
+    const Contents expected{{"VQSessionVolume", 0.4},
+                            {"VQSessionVolumePlayingState", 1},
+                            {"VQSessionVolumeOperationProcess", "Player"},
+                            {"session_selected_format", "F32LE 2ch 48000Hz"},
+                            {"active_devices", Names{"out.speaker"}}};
     EXPECT_EQ(sink_.last().contents, expected);
 }
 
@@ -198,7 +199,7 @@ TEST_F(StreamTrackerTest, OfSeveralDevicesTheLoudestCounts) {
     play();
     link(32, kStream, kHeadphones);
     settle();
-    EXPECT_EQ(sink_.last().contents["VQSessionVolume"], Value(1.0));
+    EXPECT_EQ(sink_.last().contents.get<double>("VQSessionVolume"), 1.0);
 }
 
 TEST_F(StreamTrackerTest, APauseEndsTheStretchAndTheRun) {
@@ -218,8 +219,8 @@ TEST_F(StreamTrackerTest, TheNextRunIsNoRepeatOfTheFirst) {
     settle();
     EXPECT_EQ(sink_.takeLines(), (Lines{"playback start", "volume 1 playing"}));
     const Message& second = sink_.messages[sink_.messages.size() - 2];
-    EXPECT_EQ(first.contents["stream_run"], Value(1));
-    EXPECT_EQ(second.contents["stream_run"], Value(2));
+    EXPECT_EQ(first.contents.get<std::int64_t>("stream_run"), 1);
+    EXPECT_EQ(second.contents.get<std::int64_t>("stream_run"), 2);
 }
 
 TEST_F(StreamTrackerTest, AVolumeChangedInAPauseIsToldAsSilent) {
@@ -267,9 +268,9 @@ TEST_F(StreamTrackerTest, AMoveEndsTheStretchBeforeTheRouteChanges) {
               (Lines{"volume 1 silent", "route out.headphones", "volume 1 playing"}));
     const Message& end = sink_.messages[sink_.messages.size() - 3];
     const Message& route = sink_.messages[sink_.messages.size() - 2];
-    EXPECT_EQ(end.contents["active_devices"], Value(List{"out.speaker"}));
-    EXPECT_EQ(route.contents["previous_devices"], Value(List{"out.speaker"}));
-    EXPECT_EQ(sink_.last().contents["active_devices"], Value(List{"out.headphones"}));
+    EXPECT_EQ(end.contents.get<Names>("active_devices"), (Names{"out.speaker"}));
+    EXPECT_EQ(route.contents.get<Names>("previous_devices"), (Names{"out.speaker"}));
+    EXPECT_EQ(sink_.last().contents.get<Names>("active_devices"), (Names{"out.headphones"}));
 }
 
 TEST_F(StreamTrackerTest, AMoveWhilePausedChangesTheRouteAlone) {
@@ -298,7 +299,8 @@ TEST_F(StreamTrackerTest, ANewFormatBeginsAStretch) {
     format("S16LE 2ch 44100Hz");
     settle();
     EXPECT_EQ(sink_.takeLines(), (Lines{"volume 1 silent", "volume 1 playing"}));
-    EXPECT_EQ(sink_.last().contents["session_selected_format"], Value("S16LE 2ch 44100Hz"));
+    EXPECT_EQ(sink_.last().contents.get<std::string>("session_selected_format"),
+              "S16LE 2ch 44100Hz");
 }
 
 TEST_F(StreamTrackerTest, TheLastMessagesStillKnowTheDeviceAndItsVolume) {
@@ -311,8 +313,8 @@ TEST_F(StreamTrackerTest, TheLastMessagesStillKnowTheDeviceAndItsVolume) {
     settle();
     EXPECT_EQ(sink_.takeLines(), (Lines{"volume 0.5 silent", "playback stop"}));
     const Message& end = sink_.messages[sink_.messages.size() - 2];
-    EXPECT_EQ(end.contents["active_devices"], Value(List{"out.speaker"}));
-    EXPECT_EQ(end.contents["session_selected_format"], Value("F32LE 2ch 48000Hz"));
+    EXPECT_EQ(end.contents.get<Names>("active_devices"), (Names{"out.speaker"}));
+    EXPECT_EQ(end.contents.get<std::string>("session_selected_format"), "F32LE 2ch 48000Hz");
 }
 
 TEST_F(StreamTrackerTest, AStreamThatGoesAwayClosesItsSession) {
@@ -355,7 +357,8 @@ TEST_F(StreamTrackerTest, RestatingSaysWhatPlays) {
     play();
     tracker_.restate();
     EXPECT_EQ(sink_.takeLines(), (Lines{"playback start", "volume 1 playing"}));
-    EXPECT_EQ(sink_.messages[sink_.messages.size() - 2].contents["stream_run"], Value(1));
+    EXPECT_EQ(sink_.messages[sink_.messages.size() - 2].contents.get<std::int64_t>("stream_run"),
+              1);
 }
 
 TEST_F(StreamTrackerTest, RestatingLeavesPausedStreamsAlone) {

@@ -87,11 +87,10 @@ class NotingSink final : public SessionSink {
 public:
     NotingSink(SessionSink& next, bool verbose) : next_(next), verbose_(verbose) {}
 
-    void open(std::int64_t id, std::uint16_t service,
-              const halyard::Dictionary& configuration) override {
+    void open(std::int64_t id, std::uint16_t service, const Contents& configuration) override {
         if (verbose_) {
             note(fmt::format("session {} (service type {}) for {}", id, service,
-                             configuration["HostApplicationDisplayID"].text()));
+                             configuration.get<std::string>("HostApplicationDisplayID")));
         }
         next_.open(id, service, configuration);
     }
