@@ -241,6 +241,8 @@ Dictionary LinuxPlatform::status() const {
                       {"delayed_messages", queues_->delayedTasks()},
                       {"log_lines_dropped", log_.droppedLines()},
                       {"listener", describe(listener_->counters())},
+                      {"incidents", Dictionary{{"refused", incidents_->refusedSnapshots()},
+                                               {"failed", incidents_->failedSnapshots()}}},
                       {"store", describe(store)}};
 }
 

@@ -65,10 +65,7 @@ class EverySink(DaemonTest):
                                    "any_channel_silence_seconds"])
 
     def test_the_second_distinct_leak_takes_a_snapshot(self):
-        self.send({"Haptic_Active_Hardware_Time_Seconds": 1}, 1, ENERGY)
-        self.send({"Haptic_Active_Hardware_Time_Seconds": 1}, 1, ENERGY)
-        self.send({"Haptic_Active_Hardware_Time_Seconds": 2}, 1, ENERGY)
-        self.daemon.wait_for(lambda: "Response from incidentReporter" in self.daemon.log())
+        self.leak_twice()
         [(signature, report)] = self.rows("SELECT signature, report FROM incident")
         self.assertEqual(json.loads(signature),
                          {"domain": "AudioAnalytics", "type": "haptics", "subType": "Generic",
@@ -76,6 +73,20 @@ class EverySink(DaemonTest):
         self.assertTrue(os.path.isdir(report))
         self.assertIn("incident.json", [os.path.basename(name)
                                          for name in glob.glob(report + "/**", recursive=True)])
+
+    def test_a_snapshot_that_cannot_be_written_is_counted(self):
+        with open(os.path.join(self.daemon.root, "state", "incidents"), "w", encoding="utf-8"):
+            pass  # where the folder should be
+        self.leak_twice()
+        self.assertEqual(self.client.result("admin.status")["incidents"],
+                         {"refused": 0, "failed": 1})
+        self.assertEqual(self.rows("SELECT count(*) FROM incident"), [(0,)])
+
+    def leak_twice(self):
+        """Two leaks that differ, which is one more than is put up with."""
+        for seconds in (1, 1, 2):
+            self.send({"Haptic_Active_Hardware_Time_Seconds": seconds}, 1, ENERGY)
+        self.daemon.wait_for(lambda: "Response from incidentReporter" in self.daemon.log())
 
     def test_one_message_in_every_table_and_its_order(self):
         message = {"EngineOnTime": 1}
