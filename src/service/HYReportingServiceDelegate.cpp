@@ -223,12 +223,6 @@ void HYReportingServiceDelegate::handleEventForIBX(const Dictionary& message,
     }
 }
 
-void HYReportingServiceDelegate::stopAllSessions() {
-    for (const Client& client : getAllClients()) {
-        client->handleConnectionError();
-    }
-}
-
 bool HYReportingServiceDelegate::isStopWaiting() const {
     const auto clients = getAllClients();
     return std::any_of(clients.begin(), clients.end(), [](const Client& client) {

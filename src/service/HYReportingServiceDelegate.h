@@ -62,8 +62,6 @@ public:
     Dictionary status() const;
     // Whether a session's stop waits for its trace to complete. Any thread.
     bool isStopWaiting() const;
-    // Ends every session as a lost connection does. On the service work queue.
-    void stopAllSessions();
 
 private:
     HYReportingServiceDelegate();

@@ -252,19 +252,5 @@ TEST_F(HYReportingServiceDelegateTest, RemovingAStrangerIsNoError) {
     EXPECT_THAT(service_->getAllClients(), SizeIs(1));
 }
 
-TEST_F(HYReportingServiceDelegateTest, EndingAllSessionsDoesWhatLostConnectionsDo) {
-    const Peer first = connect(100);
-    const Peer second = connect(200);
-    first.createAndStart(1);
-    second.createAndStart(2);
-    const auto one = session(1, 0);
-    const auto two = session(2, 1);
-    service_->stopAllSessions();
-    run();
-    EXPECT_FALSE(one->started());
-    EXPECT_FALSE(two->started());
-    EXPECT_THAT(service_->getAllClients(), IsEmpty());
-}
-
 } // namespace
 } // namespace halyard

@@ -98,7 +98,6 @@ private:
     Opened classify(int code) const;
     // Keeps what SQLite says about `code`, which it returns.
     int note(int code);
-    void endGroup();
 
     [[nodiscard]] int ensureUpload(const StoreUploadPtr& upload);
     [[nodiscard]] int write(const StoreOpenRow& row);

@@ -103,11 +103,6 @@ bool StoreQueue::crowdedLocked() const {
     return heldRows_ >= marks_.highRows || heldBytes_ >= marks_.highBytes;
 }
 
-bool StoreQueue::isCrowded() const {
-    const MutexLock lock(mutex_);
-    return crowdedLocked();
-}
-
 StoreQueue::Levels StoreQueue::levels() const {
     const MutexLock lock(mutex_);
     return {heldRows_, heldBytes_, lost_};

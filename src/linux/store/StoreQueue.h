@@ -72,7 +72,6 @@ public:
 
     // Whether rows are being dropped beyond the mark, and why.
     void setFailing(std::optional<StoreLoss> reason) HY_EXCLUDES(mutex_);
-    bool isCrowded() const HY_EXCLUDES(mutex_);
     // Whether rows had better come with their final size. Costs next to nothing.
     bool wantsFinishedRows() const { return tight_.load(std::memory_order_relaxed); }
     Levels levels() const HY_EXCLUDES(mutex_);

@@ -60,7 +60,6 @@ public:
 
     std::int64_t integer(int column) const { return sqlite3_column_int64(statement_, column); }
     double real(int column) const { return sqlite3_column_double(statement_, column); }
-    bool isNull(int column) const { return sqlite3_column_type(statement_, column) == SQLITE_NULL; }
     std::string_view text(int column) const {
         const void* bytes = sqlite3_column_blob(statement_, column);
         return {static_cast<const char*>(bytes),
