@@ -84,6 +84,36 @@ TEST(DescriptionTest, ContainedTextIsQuotedWhereItMustBe) {
     EXPECT_EQ(describeInList("\xC3\xA4"), "\"\xC3\xA4\"");
 }
 
+TEST(DescriptionTest, OnlyTheseCharactersStandWithoutQuotes) {
+    const std::string_view plain = "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789"
+                                   "_$.:-/";
+    for (int byte = 0; byte < 256; ++byte) {
+        const char c = static_cast<char>(byte);
+        const bool quoted = describeInList(std::string(1, c)).starts_with('"');
+        EXPECT_EQ(quoted, plain.find(c) == std::string_view::npos) << byte;
+    }
+    EXPECT_EQ(describeInList("/a/"), "/a/");
+    EXPECT_EQ(describeInList("//"), "\"//\"");
+}
+
+TEST(DescriptionTest, ContainedNumbersAreQuotedWhereTheyMustBe) {
+    EXPECT_EQ(describe(List{Value(-1), Value(true), Value(-0.5), Value(1e300)}),
+              "(\n    -1,\n    1,\n    -0.5,\n    \"1e+300\"\n)");
+}
+
+TEST(DescriptionTest, KeysOfLargeDictionariesAreSortedToo) {
+    for (const int size : {16, 17, 40}) {
+        Dictionary dictionary;
+        std::string expected = "{\n";
+        for (int i = 0; i < size; ++i) {
+            dictionary.set("key" + std::to_string(99 - i), i);
+            expected += "    key" + std::to_string(100 - size + i) + " = " +
+                        std::to_string(size - 1 - i) + ";\n";
+        }
+        EXPECT_EQ(describe(dictionary), expected + "}");
+    }
+}
+
 TEST(DescriptionTest, ContainedTextIsEscaped) {
     EXPECT_EQ(describeInList("\"\\\n\r\t"), "\"\\\"\\\\\\n\\r\\t\"");
     EXPECT_EQ(describeInList(std::string_view("\0\x1F\x7F"

@@ -115,6 +115,15 @@ TEST_P(DictionarySizeTest, MergingIntoItselfChangesNothing) {
     EXPECT_EQ(dictionary_, before);
 }
 
+TEST(DictionaryTest, MergingIntoNothingSharesTheContents) {
+    const Dictionary source{{"a", 1}};
+    Dictionary target;
+    target.merge(source);
+    EXPECT_EQ(target.begin(), source.begin());
+    target.merge(Dictionary());
+    EXPECT_EQ(target, source);
+}
+
 TEST(DictionaryTest, SettingNoneErases) {
     Dictionary dictionary{{"a", 1}};
     dictionary.set("a", Value());

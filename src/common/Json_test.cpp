@@ -73,6 +73,22 @@ TEST(JsonTest, PrettyFormIndentsByTwo) {
     EXPECT_EQ(toPrettyJson(Dictionary{{"a", List{Value(1)}}}), "{\n  \"a\": [\n    1\n  ]\n}");
 }
 
+TEST(JsonTest, ThePrettyFormDiffersInItsBlanksOnly) {
+    const double infinity = std::numeric_limits<double>::infinity();
+    const Value everything = Dictionary{
+        {"none", List{Value()}},
+        {"bools", List{true, false}},
+        {"integers", List{-1, std::numeric_limits<std::uint64_t>::max()}},
+        {"reals", List{0.1f, 1e300, 2.0, std::numeric_limits<double>::quiet_NaN()}},
+        {"infinities", List{infinity, -infinity, std::numeric_limits<float>::infinity()}},
+        {"texts", List{"", "\"\\\n\x01", "\xC3\xA4\xFF"}},
+        {"date", Date{0, 500'000'000}},
+        {"\xFF", Dictionary{{"empty", Dictionary()}, {"list", List()}}}};
+    std::string pretty = toPrettyJson(everything);
+    std::erase_if(pretty, [](char c) { return c == ' ' || c == '\n'; });
+    EXPECT_EQ(pretty, toJson(everything));
+}
+
 TEST(JsonTest, OneWriterWritesManyValues) {
     JsonWriter writer;
     EXPECT_EQ(writer.write(Dictionary{{"a", 1}}), "{\"a\":1}");

@@ -27,6 +27,15 @@ TEST(KeyTableTest, TablesShareOneCopyOfALongKey) {
     EXPECT_EQ(first.text().data(), other.intern(key).text().data());
 }
 
+TEST(KeyTableTest, KeysAreKeptUpToTheirLongest) {
+    KeyTable table;
+    for (const std::size_t length : {std::size_t{15}, KeyTable::kMaxKeyLength}) {
+        const std::string key(length, 'm');
+        const Value first = table.intern(key);
+        EXPECT_EQ(first.text().data(), table.intern(key).text().data()) << length;
+    }
+}
+
 TEST(KeyTableTest, TooLongKeysAreNotKept) {
     KeyTable table;
     const std::string key(KeyTable::kMaxKeyLength + 1, 'l');

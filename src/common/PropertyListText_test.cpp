@@ -82,6 +82,48 @@ TEST(PropertyListTextTest, EscapesAreUnderstood) {
     EXPECT_EQ(parsed(R"("\Ud83cx\Udfb5")"), Value("\xEF\xBF\xBDx\xEF\xBF\xBD"));
 }
 
+TEST(PropertyListTextTest, EscapedCodesOfEveryLengthAreUnderstood) {
+    EXPECT_EQ(parsed(R"("\U007f\U0080\U07ff")"), Value("\x7F\xC2\x80\xDF\xBF"));
+    EXPECT_EQ(parsed(R"("\U0800\uffff")"), Value("\xE0\xA0\x80\xEF\xBF\xBF"));
+    EXPECT_EQ(parsed(R"("\Ud800\Udc00\Udbff\udfff")"), Value("\xF0\x90\x80\x80\xF4\x8F\xBF\xBF"));
+    EXPECT_EQ(parsed(R"("\UABCDE")"), Value("\xEA\xAF\x8D"
+                                            "E"));
+    EXPECT_EQ(parsed(R"("\18\377\777\0")"), Value(std::string_view("\x01"
+                                                                   "8\xC3\xBF\xC3\xBF\0",
+                                                                   7)));
+}
+
+TEST(PropertyListTextTest, HalvesOfPairsAloneAreReplaced) {
+    EXPECT_EQ(parsed(R"("\Ud83c\U0041")"), Value("\xEF\xBF\xBD"
+                                                 "A"));
+    EXPECT_EQ(parsed(R"("\Ud83c\Ue000")"), Value("\xEF\xBF\xBD\xEE\x80\x80"));
+    EXPECT_EQ(parsed(R"("\Ud83c\n")"), Value("\xEF\xBF\xBD\n"));
+    EXPECT_EQ(parsed(R"("\Udc00\Udfff")"), Value("\xEF\xBF\xBD\xEF\xBF\xBD"));
+    EXPECT_EQ(parsed(R"("\Ud7ff")"), Value("\xED\x9F\xBF"));
+}
+
+TEST(PropertyListTextTest, BlanksOfEveryKindStandBetween) {
+    EXPECT_EQ(parsed("\t\n\v\f\r (\t1\v,\f2\r)\n"), Value(List{Value("1"), Value("2")}));
+    EXPECT_EQ(errorOf("(\x08)"), "line 1: a character that needs quotes");
+    EXPECT_EQ(errorOf("(\x0E)"), "line 1: a character that needs quotes");
+}
+
+TEST(PropertyListTextTest, WhatPeopleLeaveUnquotedIsTaken) {
+    const std::string plain = "_$.:-+*#@!?&%azAZ09/x";
+    EXPECT_EQ(parsed(plain), Value(plain));
+    for (const char* other : {"`", "{x", "[", "^", ";", ",", "=", "~", "|", ">"}) {
+        EXPECT_NE(errorOf("(" + std::string(other) + ")"), "none") << other;
+    }
+}
+
+TEST(PropertyListTextTest, DataIsHexadecimal) {
+    EXPECT_EQ(parsed("<09afAF\t>"), Value("<09afAF\t>"));
+    EXPECT_EQ(parsed("<>"), Value("<>"));
+    for (const char* other : {"<0g>", "<0G>", "<0`>", "<0@>", "<0:>", "<0/>", "<0"}) {
+        EXPECT_EQ(errorOf(other), "line 1: data that is not hexadecimal") << other;
+    }
+}
+
 TEST(PropertyListTextTest, OfEqualKeysTheLastWins) {
     EXPECT_EQ(parsed("{ a = 1; a = 2; }"), Value(Dictionary{{"a", "2"}}));
 }

@@ -40,6 +40,16 @@ TEST(ValueTest, NumbersCompareByValueAcrossKinds) {
     EXPECT_FALSE(Value(1) == Value("1"));
 }
 
+TEST(ValueTest, ItDoesNotMatterWhichSideIsTheReal) {
+    EXPECT_EQ(Value(1.0), Value(1));
+    EXPECT_EQ(Value(0.0f), Value(false));
+    EXPECT_FALSE(Value(1.5) == Value(1));
+    EXPECT_FALSE(Value(9223372036854775808.0) == Value(kMaxInt64));
+    EXPECT_FALSE(Value(kMaxUInt64) == Value(-1.0));
+    EXPECT_FALSE(Value(-1.0) == Value(kMaxUInt64));
+    EXPECT_FALSE(Value("1") == Value(1.0));
+}
+
 TEST(ValueTest, LargeIntegersAreNotRoundedThroughReals) {
     const std::int64_t odd = (std::int64_t{1} << 53) + 1;
     EXPECT_FALSE(Value(odd) == Value(static_cast<double>(odd)));
@@ -95,11 +105,37 @@ TEST(ValueTest, RealsTruncateTowardZeroAndSaturate) {
     EXPECT_EQ(Value(2.9).integerValue(), 2);
     EXPECT_EQ(Value(-2.9).integerValue(), -2);
     EXPECT_EQ(Value(1e300).integerValue(), kMaxInt64);
+    EXPECT_EQ(Value(9223372036854775808.0).integerValue(), kMaxInt64);
+    EXPECT_EQ(Value(9223372036854774784.0).integerValue(), 9223372036854774784);
+    EXPECT_EQ(Value(-9223372036854775808.0).integerValue(), kMinInt64);
+    EXPECT_EQ(Value(-9223372036854777856.0).integerValue(), kMinInt64);
+    EXPECT_EQ(Value(-2.5f).integerValue(), -2);
     EXPECT_EQ(Value(-kInfinity).integerValue(), kMinInt64);
     EXPECT_EQ(Value(kNaN).integerValue(), 0);
 }
 
+TEST(ValueTest, IntegersAreRealsToo) {
+    EXPECT_EQ(Value(kMaxUInt64).doubleValue(), 18446744073709551616.0);
+    EXPECT_EQ(Value(kMinInt64).doubleValue(), -9223372036854775808.0);
+    EXPECT_EQ(Value(true).doubleValue(), 1);
+    EXPECT_EQ(Value(0.5f).doubleValue(), 0.5);
+}
+
+TEST(ValueTest, WhatIsNoNumberNorTextIsZero) {
+    for (const Value& value :
+         {Value(), Value(Date{5, 7}), Value(List{Value(5)}), Value(Dictionary{{"a", 5}})}) {
+        EXPECT_EQ(value.integerValue(), 0);
+        EXPECT_EQ(value.doubleValue(), 0);
+        EXPECT_EQ(value.text(), "");
+    }
+}
+
 TEST(ValueTest, TextGivesItsLeadingDecimalNumber) {
+    EXPECT_EQ(Value("\t\r\n 5").integerValue(), 5);
+    EXPECT_EQ(Value("\v5").integerValue(), 0);
+    EXPECT_EQ(Value("1E-999").doubleValue(), 0);
+    EXPECT_EQ(Value("-1e999").doubleValue(), std::numeric_limits<double>::lowest());
+    EXPECT_EQ(Value("0x10").integerValue(), 0);
     EXPECT_EQ(Value("42 apples").integerValue(), 42);
     EXPECT_EQ(Value("  -7.9").integerValue(), -7);
     EXPECT_EQ(Value("+3").integerValue(), 3);
@@ -135,7 +171,19 @@ TEST(ValueTest, ContainersOfOtherKindsReadAsEmpty) {
     EXPECT_FALSE(Value(List()) == Value(Dictionary()));
 }
 
+TEST(ValueTest, OtherKindsHaveNoItemsToWalk) {
+    const Value text("text longer than fourteen");
+    EXPECT_TRUE(List::itemsOf(text).empty());
+    EXPECT_TRUE(Dictionary::entriesOf(text).empty());
+    EXPECT_TRUE(List::itemsOf(Value(List())).empty());
+    EXPECT_TRUE(Dictionary::entriesOf(Value(Dictionary())).empty());
+    EXPECT_EQ(List::itemsOf(Value(List{Value(1), Value(2)})).size(), 2U);
+    EXPECT_EQ(Dictionary::entriesOf(Value(Dictionary{{"a", 1}})).size(), 1U);
+}
+
 TEST(ValueTest, DatesCompareByBothParts) {
+    EXPECT_FALSE(Value(Date{5, 7}) == Value(Date{6, 7}));
+    EXPECT_FALSE(Value(Date{5, 0}) == Value(5));
     EXPECT_EQ(Value(Date{5, 7}), Value(Date{5, 7}));
     EXPECT_FALSE(Value(Date{5, 7}) == Value(Date{5, 8}));
     EXPECT_EQ(Value(Date{-1, 999'999'999}).date(), (Date{-1, 999'999'999}));

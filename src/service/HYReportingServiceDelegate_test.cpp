@@ -34,6 +34,16 @@ TEST_F(HYReportingServiceDelegateTest, BeginsEnabledAndEmpty) {
     EXPECT_EQ(platform_.queues.priority(queue), platform::QueuePriority::UserInteractive);
 }
 
+TEST_F(HYReportingServiceDelegateTest, ListensForFeaturesBeforeItAsksTheDrivers) {
+    platform_.log.clear();
+    restartService();
+    auto texts = platform_.log.texts();
+    texts.resize(4);
+    EXPECT_THAT(texts, ElementsAre(::testing::StartsWith("listening for features ("),
+                                   "notify setup result 0 token 3", "notify setup result 0 token 4",
+                                   "creating hwreporting driver utility"));
+}
+
 TEST_F(HYReportingServiceDelegateTest, ANewConnectionIsServedBeforeItIsResumed) {
     const Peer peer = connectOnly(100);
     EXPECT_EQ(peer.connection().resumed, 1);
@@ -152,6 +162,15 @@ TEST_F(HYReportingServiceDelegateTest, AStartDateInTheFutureStillGivesAPositiveU
     EXPECT_TRUE(logged(LogLevel::Default, "clientStartDate is in the past. clientpid=100 "
                                           "clientprocessname=player"));
     EXPECT_EQ(platform_.analytics.events.at(0).builder()["seconds"], Value(10));
+}
+
+TEST_F(HYReportingServiceDelegateTest, AStartDateOfThisMomentLiesInNoFuture) {
+    const Peer peer = connect(100);
+    platform_.log.clear();
+    peer.connection().invalidate();
+    EXPECT_THAT(platform_.log.texts(),
+                ElementsAre("invalidationHandler: connection exited process=player uptime_sec=0"));
+    EXPECT_EQ(platform_.analytics.events.at(0).builder()["seconds"], Value(0));
 }
 
 TEST_F(HYReportingServiceDelegateTest, AConnectionLostAtOnceHasNoStartDate) {

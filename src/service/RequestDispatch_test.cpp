@@ -181,6 +181,29 @@ TEST_F(RequestDispatchTest, TheStatusJoinsTheAdaptersCountersAndTheServices) {
                                                {"repeats_dropped", 1}}));
 }
 
+TEST_F(RequestDispatchTest, TheStatusKeepsTheRepeatsOfSessionsThatAreGone) {
+    const Peer peer = connect(100);
+    const Peer lost = connect(200);
+    const auto repeat = [](const Peer& sender, std::int64_t id) {
+        sender.createAndStart(id);
+        sender.send({{"n", 1}}, protocol::ReporterIDs{id});
+        sender.send({{"n", 1}}, protocol::ReporterIDs{id});
+    };
+    const auto repeats = [&] {
+        return peer.ask(Method::AdminStatus)->result.dictionary()["repeats_dropped"];
+    };
+    repeat(peer, 7);
+    peer.create(7);
+    EXPECT_EQ(repeats(), Value(1)) << "replaced";
+    repeat(peer, 8);
+    peer.destroy(8);
+    EXPECT_EQ(repeats(), Value(2)) << "destroyed";
+    repeat(lost, 9);
+    lost.connection().invalidate();
+    run();
+    EXPECT_EQ(repeats(), Value(3)) << "lost with its client";
+}
+
 TEST_F(RequestDispatchTest, TheStatusShowsAStopThatWaitsForItsTraceWhileAllElseWaits) {
     platform_.featureFlags.flags[{"AudioAnalytics", "Tracing"}] = true;
     platform_.performanceTraces.completes = false;
@@ -191,7 +214,9 @@ TEST_F(RequestDispatchTest, TheStatusShowsAStopThatWaitsForItsTraceWhileAllElseW
         status = other.ask(Method::AdminStatus);
         create = other.create(9);
         EXPECT_FALSE(status->given());
-        platform_.queues.advance(std::chrono::seconds(1));
+        platform_.queues.advance(std::chrono::seconds(1) - std::chrono::nanoseconds(1));
+        EXPECT_FALSE(status->given());
+        platform_.queues.advance(std::chrono::nanoseconds(1));
         EXPECT_TRUE(status->given());
         EXPECT_FALSE(create->given());
         platform_.performanceTraces.sessions[0]->delegate.lock()->performanceTraceDidComplete(

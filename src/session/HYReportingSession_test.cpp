@@ -36,6 +36,24 @@ TEST_F(HYReportingSessionTest, DescribesItself) {
                                       "HostApplicationDisplayID=org.example.clock,started=1");
 }
 
+TEST_F(HYReportingSessionTest, WithoutAProcessItsOwnerIsZero) {
+    EXPECT_EQ(HYReportingSession::initWithID(1, {})->description(),
+              "reporterID=1,serviceName=unknown,ownerPid=0,"
+              "HostApplicationDisplayID=Unknown,started=0");
+}
+
+TEST_F(HYReportingSessionTest, CountsTheRepeatsOfItsWholeLife) {
+    const auto session = makeSession();
+    EXPECT_EQ(session->redundantMessages(), 0U);
+    for (int i = 0; i < 2; ++i) {
+        session->start();
+        send(*session, {{"n", 1}});
+        send(*session, {{"n", 1}});
+        session->stop();
+    }
+    EXPECT_EQ(session->redundantMessages(), 2U);
+}
+
 TEST_F(HYReportingSessionTest, NamesItsServiceType) {
     const auto session = makeSession();
     session->setServiceType(kAudioServiceTypeHaptics);

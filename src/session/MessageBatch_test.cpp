@@ -53,6 +53,32 @@ TEST_F(MessageBatchTest, KindsOfOneNameCountTogether) {
     EXPECT_THAT(identifiers(), ElementsAre("Playback_Generic_1", "Playback_Generic_2"));
 }
 
+TEST_F(MessageBatchTest, KindsThatDifferInOneNumberOnlyAreNotMixedUp) {
+    EXPECT_FALSE(add(a_, kAudioEventCategoryPlayback, kAudioEventTypeStart));
+    EXPECT_FALSE(add(a_, kAudioEventCategoryPlayback, 0));
+    EXPECT_FALSE(add(a_, kAudioEventCategoryUndefined, 0));
+    EXPECT_TRUE(add(a_, kAudioEventCategoryPlayback, 0));
+    EXPECT_TRUE(add(a_, kAudioEventCategoryUndefined, 0));
+    EXPECT_TRUE(add(a_, kAudioEventCategoryPlayback, kAudioEventTypeStart));
+    EXPECT_THAT(identifiers(),
+                ElementsAre("Playback_Start_1", "Playback_Generic_1", "Undefined_Generic_1"));
+}
+
+TEST_F(MessageBatchTest, KeepsMessagesOnlyWhereSomebodyWillReadThem) {
+    MessageBatch batch({.keepsMessages = false, .minimumPlaytime = 0.5});
+    EXPECT_FALSE(batch.addUnlessRedundant(4, 1, a_));
+    EXPECT_TRUE(batch.addUnlessRedundant(4, 1, a_));
+    EXPECT_TRUE(batch.entries().empty());
+    EXPECT_FALSE(batch.empty());
+    EXPECT_EQ(batch.countFor("Playback_Start"), 1U);
+}
+
+TEST_F(MessageBatchTest, ARepeatIsInNoSummary) {
+    EXPECT_FALSE(add(a_));
+    EXPECT_TRUE(add(a_));
+    EXPECT_EQ((*batch_.takeSummary(4))["route"], Value("speaker"));
+}
+
 class TimeStampTest : public MessageBatchTest, public ::testing::WithParamInterface<const char*> {};
 
 TEST_P(TimeStampTest, DoesNotMakeADifference) {
@@ -153,6 +179,9 @@ TEST(EqualButForTimeStamps, SeesAMissingAndAnExtraKey) {
     EXPECT_FALSE(equalButForTimeStamps({{"a", 1}}, {{"a", 1}, {"b", 2}}));
     EXPECT_FALSE(equalButForTimeStamps({{"a", 1}, {"b", 2}}, {{"a", 1}}));
     EXPECT_FALSE(equalButForTimeStamps({{"a", 1}}, {{"b", 1}}));
+    EXPECT_FALSE(equalButForTimeStamps({}, {{"a", 1}}));
+    EXPECT_FALSE(equalButForTimeStamps({{"a", 1}, {"systemuptime_sec", 1}}, {{"b", 1}, {"a", 1}}));
+    EXPECT_TRUE(equalButForTimeStamps({}, {{"processuptime_ms", 1}}));
 }
 
 } // namespace

@@ -203,6 +203,16 @@ TEST_F(SessionEventsTest, TheSummaryJoinsAllValuesOfEachKey) {
                                   {"b", "(\n    1,\n    2\n)"}}));
 }
 
+TEST_F(SessionEventsTest, ASummaryThatWasTakenStartsAnew) {
+    add(Dictionary{{"a", 1}});
+    const auto taken = batch();
+    ASSERT_TRUE(taken->takeSummary(4).has_value());
+    EXPECT_FALSE(taken->takeSummary(4).has_value());
+    EXPECT_TRUE(taken->empty());
+    EXPECT_FALSE(taken->addUnlessRedundant(4, 1, Dictionary{{"b", 2}}));
+    EXPECT_EQ(*taken->takeSummary(5), (Dictionary{{"HY_Session_Summary_Event", "5"}, {"b", "2"}}));
+}
+
 TEST_F(SessionEventsTest, AnEmptyTextIsAValueLikeAnyOther) {
     add(Dictionary{{"a", ""}});
     add(Dictionary{{"a", "x"}});

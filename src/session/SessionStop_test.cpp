@@ -105,6 +105,19 @@ TEST_F(SessionStopTest, TheFileHoldsTheBatchWithItsVolumeEvents) {
     EXPECT_EQ(platform_.files.directories.at(0).mode, 0777u);
 }
 
+TEST_F(SessionStopTest, TheFileIsNamedAfterTheTimeTheApplicationAndTheService) {
+    platform_.clock.offset = std::chrono::hours(2);
+    const auto session = playedSession();
+    session->updateConfigurationWithContentsOfConfiguration({{"HostApplicationDisplayID", "mpv"}});
+    session->stop();
+
+    ASSERT_THAT(platform_.files.files, SizeIs(1));
+    EXPECT_EQ(platform_.files.files.begin()->first,
+              std::string(HYReportingLogsDirectory) +
+                  "/20231115-001320+0200-halyard-mpv-longformaudio.json");
+    EXPECT_EQ(platform_.files.directories.at(0).path, HYReportingLogsDirectory);
+}
+
 TEST_F(SessionStopTest, TheLogNamesTheFileThatWasWritten) {
     platform_.files.place = "/var/log";
     const auto session = playedSession();
@@ -131,9 +144,12 @@ TEST_F(SessionStopTest, AFileThatCannotBeWrittenIsToldAndTheSummaryStillGoes) {
 TEST_F(SessionStopTest, OnlyInternalBuildsWriteAFile) {
     platform_.deviceProperties.booleans["InternalBuild"] = false;
     const auto session = playedSession();
+    EXPECT_THAT(session->nestedAggregatedPayloadData(), IsEmpty()) << "nobody will read them";
     session->stop();
 
     EXPECT_THAT(platform_.files.files, IsEmpty());
+    EXPECT_THAT(platform_.files.directories, IsEmpty());
+    EXPECT_EQ(platform_.log.count("sending summary event for reporter 7"), 1U);
 }
 
 TEST_F(SessionStopTest, AnEmptyBatchLeavesNothing) {

@@ -32,6 +32,7 @@ TEST(SafePathComponent, KeepsOrdinaryNames) {
 
 TEST(SafePathComponent, ReplacesWhatAFileSystemWouldTakeAmiss) {
     EXPECT_EQ(safePathComponent("a/b\n\\c:"), "a_b__c_");
+    EXPECT_EQ(safePathComponent("a\x01\x1F \x7F"), "a__ _");
     EXPECT_EQ(safePathComponent(".hidden"), "_.hidden");
     EXPECT_EQ(safePathComponent(".."), "_..");
     EXPECT_EQ(safePathComponent(""), "_");
@@ -41,6 +42,9 @@ TEST(SafePathComponent, ReplacesWhatAFileSystemWouldTakeAmiss) {
 TEST(SafePathComponent, CutsBetweenCharacters) {
     const std::string text = std::string(79, 'x') + "ü";
     EXPECT_EQ(safePathComponent(std::string(80, 'x')).size(), 80u);
+    EXPECT_EQ(safePathComponent(std::string(81, 'x')).size(), 80u);
+    EXPECT_EQ(safePathComponent(std::string(78, 'x') + "üü"), std::string(78, 'x') + "ü");
+    EXPECT_EQ(safePathComponent(std::string(78, 'x') + "♫"), std::string(78, 'x'));
     EXPECT_EQ(safePathComponent(text), std::string(79, 'x'));
 }
 
