@@ -1,0 +1,71 @@
+// The temporary session for which the sinks see a message that no session takes.
+
+#include "service/MessageFanOut.h"
+#include "service/ServiceFixture.h"
+
+namespace halyard {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+// A service without sessions, which keeps what issue capture is offered.
+class LonelyService final : public HYReportingServiceDelegateProtocol {
+public:
+    Dictionary getDefaults() const override { return {}; }
+    std::optional<Dictionary> getFeaturesState() const override { return std::nullopt; }
+    std::vector<Client> getAllClients() const override { return {}; }
+    bool isReportingEnabled() const override { return true; }
+    std::vector<Session> getAllActiveReportingSessions() const override { return {}; }
+    Session findReportingSessionForID(std::int64_t) const override { return nullptr; }
+    void sessionRetired(const HYReportingSession&) override {}
+    platform::DriverSnapshotRef getSnapShot() override { return nullptr; }
+    void sendDriverLogsForSession(const Session&) override {}
+    void removeClient(const HYReportingClientServerInstance&) override {}
+    void handleEventForIBX(const Dictionary&, AudioEventCategory, std::uint16_t,
+                           const Session& session,
+                           const std::optional<std::string>& processName) override {
+        offeredFor.push_back(session);
+        sender = processName;
+    }
+    std::int64_t activeSessionCount() const override { return 0; }
+    void setActiveSessionCount(std::int64_t) override {}
+
+    std::vector<Session> offeredFor;
+    std::optional<std::string> sender;
+};
+
+class StandaloneSessionTest : public ::testing::Test {
+protected:
+    void broadcast() {
+        MessageFanOut(service_, {{{"n", 1}}, kAudioEventCategoryPlayback, 1, sender_})
+            .route(std::nullopt, [](std::int64_t) { return nullptr; });
+    }
+
+    testing::TestPlatform platform_;
+    LonelyService service_;
+    const std::optional<std::string> sender_ = "player";
+};
+
+TEST_F(StandaloneSessionTest, IsOfTheDaemonsOwnProcessAndOfAnUnknownApplication) {
+    platform_.ownProcess.ownPID = 4711;
+    broadcast();
+    ASSERT_EQ(service_.offeredFor.size(), 1U);
+    const HYReportingSession& session = *service_.offeredFor[0];
+    EXPECT_THAT(session.processIdentifiers(), ElementsAre(4711));
+    EXPECT_EQ(session.reporterID(), 1);
+    EXPECT_EQ(session.serviceType(), kAudioServiceTypeStandalone);
+    EXPECT_EQ(session.configuration(), (Dictionary{{"HostApplicationDisplayID", "Unknown"}}));
+    EXPECT_EQ(service_.sender, sender_);
+}
+
+TEST_F(StandaloneSessionTest, IsNeitherStartedNorFed) {
+    broadcast();
+    EXPECT_FALSE(service_.offeredFor.at(0)->started());
+    EXPECT_EQ(platform_.log.count("starting session owned by 1"), 0U);
+    EXPECT_EQ(platform_.log.count("sending message for session owned by 1"), 0U);
+    EXPECT_THAT(platform_.relayReporting.uploads, IsEmpty());
+}
+
+} // namespace
+} // namespace halyard
