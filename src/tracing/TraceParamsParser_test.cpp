@@ -199,6 +199,18 @@ TEST_F(TraceParamsParserTest, AnUnknownTypeIsKeptWithTheTypeBeforeIt) {
                                   "Loading tracepoint : 0 and 0 \n finished parsing."));
 }
 
+TEST_F(TraceParamsParserTest, TheTypeBeforeAnUnknownOneMayBeAny) {
+    const auto items = loadItems("{ Type = Level; EvtapCodeBegin = 3; },"
+                                 "{ Type = level; EvtapCodeBegin = 4; }, { Name = none; },"
+                                 "{ Type = Impulse; EvtapCodeBegin = 5; }, { Type = Pulse; }");
+    ASSERT_EQ(items.size(), 5U);
+    EXPECT_EQ(items[1].type, TraceDataParams::Level);
+    EXPECT_EQ(items[1].beginCode, 0U);
+    EXPECT_EQ(items[1].endCode, 0U);
+    EXPECT_EQ(items[2].type, TraceDataParams::Level);
+    EXPECT_EQ(items[4].type, TraceDataParams::Impulse);
+}
+
 TEST_F(TraceParamsParserTest, TheFilesOwnTextsAreReadAsListsAndDictionaries) {
     const TraceParams params = load("{ Children = \"({ Name = t; Children = \\\"(\\\\\\\"{ Name = "
                                     "i; Type = Level; }\\\\\\\")\\\"; })\"; }");
