@@ -156,17 +156,15 @@ LinuxHWReport::createSamples(platform::HWReportSubscription* subscription,
         return {nullptr, kInvalid};
     }
     const platform::SteadyTime now = clock_.steadyTime();
-    const auto configured = readConfigured(*own->list, now);
+    auto configured = readConfigured(*own->list, now);
     auto samples = std::make_shared<SampleSet>(own->list, now);
     std::size_t next = 0;
     for (const std::size_t place : own->list->places) {
         Channel& channel = channels_[place];
-        if (channel.configured) {
-            noteFailure(channel, configured[next]);
-            samples->add(configured[next++]);
-        } else {
-            samples->add(channel.source->read(now));
-        }
+        const Reading reading =
+            channel.configured ? std::move(configured[next++]) : channel.source->read(now);
+        noteFailure(channel, reading);
+        samples->add(reading);
     }
     return {samples, std::nullopt};
 }

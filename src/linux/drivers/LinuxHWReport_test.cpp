@@ -92,8 +92,8 @@ protected:
         return library_.emplace(platform_.clock, channels,
                                 LinuxHWReport::Options{tree_.path(), 60s});
     }
-    void subscribe() {
-        const Listing listed = library_->copyChannelsInGroup("Speaker", std::nullopt);
+    void subscribe(const std::string& group = "Speaker") {
+        const Listing listed = library_->copyChannelsInGroup(group, std::nullopt);
         subscribed_ = library_->createSubscription(*listed.value);
     }
     platform::HWReportSamplesRef sample() {
@@ -232,3 +232,23 @@ TEST_F(LinuxHWReportTest, IterationEndsWhenTheCallerSaysSo) {
 
 } // namespace
 } // namespace halyard::linux_
+TEST_F(LinuxHWReportTest, ABuiltInChannelThatCannotBeReadIsToldOnceAnEpisode) {
+    tree_.write("proc/pressure/cpu", "some avg10=0.00 total=5\n");
+    library({});
+    subscribe("Pressure");
+    const auto before = sample();
+    EXPECT_THAT(platform_.log.texts(LogLevel::Default), IsEmpty());
+    tree_.write("proc/pressure/cpu", "nothing\n");
+    sample();
+    EXPECT_THAT(delta(before.get(), *sample()), IsEmpty());
+    const std::string path = (tree_ / "proc/pressure/cpu").native();
+    const std::string told =
+        "driver channel Pressure-HWAudio2 \"cpu some\" cannot be read: " + path +
+        ": not in the expected format";
+    EXPECT_THAT(platform_.log.texts(LogLevel::Default), ElementsAre(told));
+    tree_.write("proc/pressure/cpu", "some avg10=0.00 total=9\n");
+    EXPECT_THAT(delta(before.get(), *sample()), ElementsAre("cpu some=4"));
+    EXPECT_TRUE(logged(LogLevel::Default,
+                       "driver channel Pressure-HWAudio2 \"cpu some\" can be read again"));
+}
+
