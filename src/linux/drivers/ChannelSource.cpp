@@ -12,9 +12,6 @@ namespace {
 
 using Made = std::variant<std::unique_ptr<ChannelSource>, std::string>;
 
-// cpufreq counts in ticks of user space, devfreq in milliseconds.
-constexpr std::uint64_t kTicksPerSecond = 100;
-constexpr std::uint64_t kMillisecondsPerSecond = 1000;
 constexpr std::size_t kMostColumn = 10000;
 
 // One try at making a source out of what follows the kind.
@@ -87,14 +84,14 @@ Made makeRuntimePower(Order order) {
 Made makeCpuFrequency(Order order) {
     const std::string directory(order.rest);
     auto source = std::make_unique<StateTableSource>(order.file(directory + "/time_in_state"),
-                                                     parseTimeInState, kTicksPerSecond);
+                                                     parseTimeInState);
     source->setTransitions(order.file(directory + "/trans_table"));
     return source;
 }
 
 Made makeDeviceFrequency(Order order) {
     return make<StateTableSource>(order.file(std::string(order.rest) + "/trans_stat"),
-                                  parseTransitionStatistics, kMillisecondsPerSecond);
+                                  parseTransitionStatistics);
 }
 
 template <PcmSource::What what> Made makePcm(Order order) {

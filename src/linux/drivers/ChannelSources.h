@@ -76,25 +76,23 @@ private:
     const ReadingShapeRef shape_;
 };
 
-// States out of one file, and their transitions out of another where that is
+// States out of one file, ms, and their transitions out of another where that is
 // there.
 class StateTableSource final : public ChannelSource {
 public:
     using Parse = std::optional<SourceStates> (*)(std::string_view);
 
-    StateTableSource(SampledFile file, Parse parse, std::uint64_t residencyPerSecond)
-        : file_(std::move(file)), parse_(parse), residencyPerSecond_(residencyPerSecond) {}
+    StateTableSource(SampledFile file, Parse parse) : file_(std::move(file)), parse_(parse) {}
     void setTransitions(SampledFile file) { transitions_.emplace(std::move(file)); }
     ChannelFormat format() const override { return ChannelFormat::State; }
     Reading read(platform::SteadyTime now) override;
-    std::uint64_t residencyPerSecond() const override { return residencyPerSecond_; }
+    std::uint64_t residencyPerSecond() const override { return 1000; }
 
 private:
     void addTransitions(SourceStates& states);
 
     SampledFile file_;
     const Parse parse_;
-    const std::uint64_t residencyPerSecond_;
     std::optional<SampledFile> transitions_;
     ReadingShapeRef shape_;
 };

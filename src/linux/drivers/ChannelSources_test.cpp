@@ -73,7 +73,7 @@ TEST_F(ChannelSourcesTest, ReadsThePowerOfADeviceByEitherDirectory) {
 TEST_F(ChannelSourcesTest, ReadsFrequencies) {
     const Reading processor = read("cpufreq:/sys/devices/system/cpu/cpufreq/policy0/stats");
     EXPECT_THAT(processor.shape->states, ElementsAre("600000", "1200000", "1800000"));
-    EXPECT_THAT(processor.numbers, ElementsAre(12345, 15, 678, 14, 90, 7));
+    EXPECT_THAT(processor.numbers, ElementsAre(123450, 15, 6780, 14, 900, 7));
     const Reading bus = read("devfreq:/sys/class/devfreq/17000010.devfreq_mif");
     EXPECT_THAT(bus.numbers, ElementsAre(5123401, 43, 23110, 37, 8800, 21));
 }

@@ -130,6 +130,25 @@ TEST_F(LinuxHWReportTest, ListsByGroupAndSubgroupAnAbsentOneMatchingAny) {
     subgroupOnly.group.reset();
     subgroupOnly.subgroup = "QLX";
     auto& all = library({channel("group", "file:/x"), both, subgroupOnly});
+    // "channel state residency duty-cycle" of the resident states.
+    std::vector<std::string> states(const platform::HWReportSamples& before,
+                                    const platform::HWReportSamples& after) {
+        std::vector<std::string> result;
+        library_->iterate(*library_->createSamplesDelta(&before, after).value,
+                          [&](const platform::HWReportChannel& each) {
+                              for (int i = 0; i < each.stateGetCount(); ++i) {
+                                  if (each.stateGetResidency(i) != 0) {
+                                      result.push_back(
+                                          std::string(*each.getChannelName()) + " " +
+                                          std::string(*each.stateGetNameForIndex(i)) + " " +
+                                          std::to_string(each.stateGetResidency(i)) + " " +
+                                          std::to_string(each.stateGetDutyCycle(i)));
+                                  }
+                              }
+                              return 0;
+                          });
+        return result;
+    }
     const auto count = [&](std::optional<std::string> group, std::optional<std::string> subgroup) {
         const Listing listed = all.copyChannelsInGroup(group, subgroup);
         EXPECT_FALSE(listed.error);
@@ -250,5 +269,31 @@ TEST_F(LinuxHWReportTest, ABuiltInChannelThatCannotBeReadIsToldOnceAnEpisode) {
     EXPECT_THAT(delta(before.get(), *sample()), ElementsAre("cpu some=4"));
     EXPECT_TRUE(logged(LogLevel::Default,
                        "driver channel Pressure-HWAudio2 \"cpu some\" can be read again"));
+}
+
+TEST_F(LinuxHWReportTest, EveryKindOfStatesHasItsSharesOfTheTimeBetween) {
+    const auto write = [&](const std::string& milliseconds, const std::string& ticks) {
+        tree_.write("power/runtime_active_time", milliseconds);
+        tree_.write("power/runtime_suspended_time", "0");
+        tree_.write("idle/state0/time", milliseconds + "000");
+        tree_.write("idle/state0/usage", "1");
+        tree_.write("time_in_state", "6 " + ticks);
+        tree_.write("trans_stat", "From : To\n : 6 time(ms)\n6: 1 " + milliseconds + "\n");
+        tree_.write("status", "state: PREPARED\n");
+    };
+    library({channel("power", "runtime_pm:/", ChannelFormat::State),
+             channel("idle", "cpuidle:/idle", ChannelFormat::State),
+             channel("cpu", "cpufreq:/", ChannelFormat::State),
+             channel("bus", "devfreq:/", ChannelFormat::State),
+             channel("pcm", "alsa_states:/", ChannelFormat::State)});
+    subscribe();
+    write("1000", "100");
+    const auto before = sample();
+    platform_.clock.advance(4s);
+    write("3000", "300");
+    EXPECT_THAT(states(*before, *sample()),
+                ElementsAre("power active 2000 0.500000", "idle state0 2000000 0.500000",
+                            "cpu 6 2000 0.500000", "bus 6 2000 0.500000",
+                            "pcm PREPARED 4000000 1.000000"));
 }
 

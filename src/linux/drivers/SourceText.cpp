@@ -8,6 +8,8 @@ namespace halyard::linux_ {
 namespace {
 
 constexpr std::string_view kBlanks = " \t\r";
+// In which the kernel tells times to user space, whatever it counts in itself.
+constexpr std::uint64_t kMillisecondsPerTick = 10;
 
 // Takes the part up to the next `separator`, and that, off `rest`.
 std::string_view takeUntil(std::string_view& rest, char separator) {
@@ -133,11 +135,13 @@ std::optional<SourceStates> parseTimeInState(std::string_view text) {
         if (name.empty()) {
             continue;
         }
-        const auto time = takeNumber<std::uint64_t>(line);
-        if (!time || states.size() == kMaxSourceStates) {
+        const auto ticks = takeNumber<std::uint64_t>(line);
+        std::uint64_t time = 0;
+        if (!ticks || __builtin_mul_overflow(*ticks, kMillisecondsPerTick, &time) ||
+            states.size() == kMaxSourceStates) {
             return std::nullopt;
         }
-        states.push_back({std::string(name), *time, 0});
+        states.push_back({std::string(name), time, 0});
     }
     return states.empty() ? std::nullopt : std::optional(std::move(states));
 }

@@ -60,12 +60,15 @@ TEST(SourceTextTest, PerProcessorCountsAreSummed) {
     }
 }
 
-TEST(SourceTextTest, TimeInStateNamesEachFrequency) {
+TEST(SourceTextTest, TimeInStateNamesEachFrequencyWithItsMilliseconds) {
     EXPECT_THAT(
         parseTimeInState("600000 12345\n1200000 678\n"),
-        Optional(ElementsAre(SourceState{"600000", 12345, 0}, SourceState{"1200000", 678, 0})));
+        Optional(ElementsAre(SourceState{"600000", 123450, 0}, SourceState{"1200000", 6780, 0})));
     EXPECT_EQ(parseTimeInState(""), std::nullopt);
     EXPECT_EQ(parseTimeInState("600000\n"), std::nullopt);
+    EXPECT_THAT(parseTimeInState("1 1844674407370955161\n"),
+                Optional(ElementsAre(SourceState{"1", 18446744073709551610U, 0})));
+    EXPECT_EQ(parseTimeInState("1 1844674407370955162\n"), std::nullopt);
 }
 
 TEST(SourceTextTest, TheTransitionTableCountsWhatLedIntoAState) {
