@@ -45,9 +45,9 @@ void settle(ReadingShapeRef& shape, ReadingShape now) {
     }
 }
 
-// Appends the file's one number to the reading; false when there is none, and
-// then the reading says why.
-bool appendNumber(SampledFile& file, Reading& reading) {
+// Adds the file's one number to the reading's at `place`; false when there is
+// none, and then the reading says why.
+bool addNumber(SampledFile& file, Reading& reading, std::size_t place) {
     std::string& text = scratch();
     if (const std::errc error = file.read(text); error != std::errc{}) {
         reading = missing(file, error);
@@ -58,7 +58,7 @@ bool appendNumber(SampledFile& file, Reading& reading) {
         reading = malformed(file);
         return false;
     }
-    reading.numbers.push_back(static_cast<std::uint64_t>(*value));
+    reading.numbers[place] += static_cast<std::uint64_t>(*value);
     return true;
 }
 
@@ -160,9 +160,14 @@ std::string firstLine(const std::filesystem::path& path, std::string otherwise) 
 bool CpuIdleSource::findStates() {
     ReadingShape shape;
     for (const auto& state : stateDirectories(directory_)) {
-        shape.states.push_back(firstLine(state / "name", state.filename().native()));
+        std::string name = firstLine(state / "name", state.filename().native());
+        const auto same = std::find(shape.states.begin(), shape.states.end(), name);
         states_.push_back({SampledFile(state / "time", root_.descriptors),
-                           SampledFile(state / "usage", root_.descriptors)});
+                           SampledFile(state / "usage", root_.descriptors),
+                           2 * static_cast<std::size_t>(same - shape.states.begin())});
+        if (same == shape.states.end()) {
+            shape.states.push_back(std::move(name));
+        }
     }
     settle(shape_, std::move(shape));
     return !states_.empty();
@@ -175,8 +180,10 @@ Reading CpuIdleSource::read(platform::SteadyTime) {
         reading.fault = fmt::format("{}: no idle states", directory_.native());
         return reading;
     }
+    reading.numbers.resize(2 * shape_->states.size());
     for (State& state : states_) {
-        if (!appendNumber(state.time, reading) || !appendNumber(state.usage, reading)) {
+        if (!addNumber(state.time, reading, state.place) ||
+            !addNumber(state.usage, reading, state.place + 1)) {
             states_.clear(); // Others may be there next time.
             return reading;
         }
@@ -195,11 +202,9 @@ RuntimePowerSource::RuntimePowerSource(const std::filesystem::path& directory, S
 
 Reading RuntimePowerSource::read(platform::SteadyTime) {
     Reading reading;
-    for (SampledFile* file : {&active_, &suspended_}) {
-        if (!appendNumber(*file, reading)) {
-            return reading;
-        }
-        reading.numbers.push_back(0);
+    reading.numbers.resize(4);
+    if (!addNumber(active_, reading, 0) || !addNumber(suspended_, reading, 2)) {
+        return reading;
     }
     reading.status = ReadStatus::Read;
     reading.shape = shape_;

@@ -51,6 +51,7 @@ private:
     struct State {
         SampledFile time;
         SampledFile usage;
+        std::size_t place; // of its residency in a reading
     };
     // False when there are none.
     bool findStates();

@@ -127,6 +127,22 @@ TEST_F(ChannelSourcesTest, IdleStatesMayComeLater) {
     EXPECT_THAT(reading.numbers, ElementsAre(5, 2, 7, 1));
 }
 
+TEST_F(ChannelSourcesTest, IdleStatesOfOneNameAreOne) {
+    for (const auto& [state, name] :
+         {std::pair("state0", "C1"), {"state1", "C2"}, {"state2", "C1"}}) {
+        const std::string directory = std::string("cpuidle/") + state;
+        tree_.write(directory + "/name", name);
+        tree_.write(directory + "/time", "10");
+        tree_.write(directory + "/usage", "3");
+    }
+    const auto source = make("cpuidle:/cpuidle", own_);
+    for (int i = 0; i < 2; ++i) {
+        const Reading reading = source->read(now_);
+        EXPECT_THAT(reading.shape->states, ElementsAre("C1", "C2"));
+        EXPECT_THAT(reading.numbers, ElementsAre(20, 6, 10, 3));
+    }
+}
+
 TEST_F(ChannelSourcesTest, RefusesSourcesThatMakeNoSense) {
     EXPECT_EQ(refusal("pie:/x"), "\"pie\" is no kind of source");
     EXPECT_EQ(refusal("file"), "needs a path that begins with \"/\"");

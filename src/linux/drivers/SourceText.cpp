@@ -67,6 +67,25 @@ bool add(std::uint64_t& sum, std::uint64_t value) {
     return !__builtin_add_overflow(sum, value, &sum);
 }
 
+SourceState* findState(SourceStates& states, std::string_view name) {
+    const auto at = std::find_if(states.begin(), states.end(),
+                                 [&](const SourceState& state) { return state.name == name; });
+    return at != states.end() ? &*at : nullptr;
+}
+
+// Adds the state, to the one of its name if that is there; false when it does not
+// fit.
+bool join(SourceStates& states, const SourceState& state) {
+    if (SourceState* const same = findState(states, state.name)) {
+        return add(same->residency, state.residency) && add(same->transitions, state.transitions);
+    }
+    if (states.size() == kMaxSourceStates) {
+        return false;
+    }
+    states.push_back(state);
+    return true;
+}
+
 } // namespace
 
 std::optional<std::int64_t> parseInteger(std::string_view text) {
@@ -138,10 +157,9 @@ std::optional<SourceStates> parseTimeInState(std::string_view text) {
         const auto ticks = takeNumber<std::uint64_t>(line);
         std::uint64_t time = 0;
         if (!ticks || __builtin_mul_overflow(*ticks, kMillisecondsPerTick, &time) ||
-            states.size() == kMaxSourceStates) {
+            !join(states, {std::string(name), time, 0})) {
             return std::nullopt;
         }
-        states.push_back({std::string(name), time, 0});
     }
     return states.empty() ? std::nullopt : std::optional(std::move(states));
 }
@@ -176,14 +194,17 @@ bool addRow(SourceStates& states, SourceState& from, std::string_view row, bool 
         return true;
     }
     const auto time = takeNumber<std::uint64_t>(row);
-    from.residency = time.value_or(0);
-    return time.has_value();
+    return time && add(from.residency, *time);
 }
 
-SourceState* findState(SourceStates& states, std::string_view name) {
-    const auto at = std::find_if(states.begin(), states.end(),
-                                 [&](const SourceState& state) { return state.name == name; });
-    return at != states.end() ? &*at : nullptr;
+std::optional<SourceStates> joined(const SourceStates& states) {
+    SourceStates result;
+    for (const SourceState& state : states) {
+        if (!join(result, state)) {
+            return std::nullopt;
+        }
+    }
+    return result;
 }
 
 // Both tables: a line "From : To", one of the states after ":", then a row for
@@ -211,7 +232,7 @@ std::optional<SourceStates> parseTransitions(std::string_view text, bool withTim
             return std::nullopt;
         }
     }
-    return states && rows == states->size() ? states : std::nullopt;
+    return states && rows == states->size() ? joined(*states) : std::nullopt;
 }
 
 } // namespace
@@ -223,6 +244,36 @@ std::optional<SourceStates> parseTransitionTable(std::string_view text) {
 std::optional<SourceStates> parseTransitionStatistics(std::string_view text) {
     return parseTransitions(text, true);
 }
+
+namespace {
+
+std::pair<std::int64_t, std::int64_t> boundsOf(const SourceBucket& bucket) {
+    return {bucket.lower, bucket.upper};
+}
+
+// Those of the same bounds as one, where the first of them stood.
+std::optional<SourceBuckets> joined(SourceBuckets buckets) {
+    const auto notAscending = [](const SourceBucket& left, const SourceBucket& right) {
+        return boundsOf(left) >= boundsOf(right);
+    };
+    if (std::adjacent_find(buckets.begin(), buckets.end(), notAscending) == buckets.end()) {
+        return buckets; // As nearly all are, and so none is there twice.
+    }
+    SourceBuckets result;
+    for (const SourceBucket& bucket : buckets) {
+        const auto same = std::find_if(result.begin(), result.end(), [&](const SourceBucket& each) {
+            return boundsOf(each) == boundsOf(bucket);
+        });
+        if (same == result.end()) {
+            result.push_back(bucket);
+        } else if (!add(same->hits, bucket.hits)) {
+            return std::nullopt;
+        }
+    }
+    return result;
+}
+
+} // namespace
 
 std::optional<SourceBuckets> parseBuckets(std::string_view text) {
     SourceBuckets buckets;
@@ -241,7 +292,7 @@ std::optional<SourceBuckets> parseBuckets(std::string_view text) {
         }
         buckets.push_back({*lower, *upper, *hits});
     }
-    return buckets.empty() ? std::nullopt : std::optional(std::move(buckets));
+    return buckets.empty() ? std::nullopt : joined(std::move(buckets));
 }
 
 namespace {
@@ -308,10 +359,10 @@ std::optional<SourceBuckets> parseTraceHistogram(std::string_view text) {
     }
     std::sort(buckets.begin(), buckets.end(),
               [](const SourceBucket& left, const SourceBucket& right) {
-                  return std::pair(left.lower, left.upper) < std::pair(right.lower, right.upper);
+                  return boundsOf(left) < boundsOf(right);
               });
     // One without hits yet is a histogram all the same.
-    return isHistogram ? std::optional(std::move(buckets)) : std::nullopt;
+    return isHistogram ? joined(std::move(buckets)) : std::nullopt;
 }
 
 namespace {

@@ -55,6 +55,9 @@ std::optional<std::int64_t> parsePressure(std::string_view text, std::string_vie
 // The sum of "1,2,3", a count per processor.
 std::optional<std::uint64_t> parsePerCpuCount(std::string_view text);
 
+// States and buckets: each name and each pair of bounds once, because changes are
+// found by them. What an odd file has twice is one, with the sum of the numbers.
+
 // cpufreq's time_in_state: "FREQUENCY TICKS" in each line; ms.
 std::optional<SourceStates> parseTimeInState(std::string_view text);
 // cpufreq's trans_table ("From : To", counts from the row's to the column's

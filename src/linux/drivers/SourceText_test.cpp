@@ -71,6 +71,15 @@ TEST(SourceTextTest, TimeInStateNamesEachFrequencyWithItsMilliseconds) {
     EXPECT_EQ(parseTimeInState("1 1844674407370955162\n"), std::nullopt);
 }
 
+TEST(SourceTextTest, StatesOfOneNameAreOne) {
+    EXPECT_THAT(parseTimeInState("6 1\n12 2\n6 3\n"),
+                Optional(ElementsAre(SourceState{"6", 40, 0}, SourceState{"12", 20, 0})));
+    EXPECT_EQ(parseTimeInState("1 1844674407370955161\n1 1\n"), std::nullopt);
+    EXPECT_THAT(parseTransitionStatistics("From : To\n : 6 12 6 time(ms)\n"
+                                          "6: 0 1 2 10\n12: 3 0 4 20\n6: 5 6 0 30\n"),
+                Optional(ElementsAre(SourceState{"6", 40, 14}, SourceState{"12", 20, 7})));
+}
+
 TEST(SourceTextTest, TheTransitionTableCountsWhatLedIntoAState) {
     EXPECT_THAT(parseTransitionTable("   From  :    To\n"
                                      "         :    600000   1200000   1800000 \n"
@@ -110,10 +119,20 @@ TEST(SourceTextTest, BucketsAreLinesOfBoundsAndHits) {
     }
 }
 
+TEST(SourceTextTest, BucketsOfTheSameBoundsAreOne) {
+    EXPECT_THAT(parseBuckets("10 20 1\n0 10 2\n10 20 3\n10 30 4\n0 10 5\n"),
+                Optional(ElementsAre(SourceBucket{10, 20, 4}, SourceBucket{0, 10, 7},
+                                     SourceBucket{10, 30, 4})));
+    EXPECT_EQ(parseBuckets("0 1 18446744073709551615\n0 1 1\n"), std::nullopt);
+    EXPECT_THAT(parseTraceHistogram("# event histogram\n{ lat: 7 } hitcount: 1\n"
+                                    "{ lat: 5 } hitcount: 2\n{ lat: 7 } hitcount: 4\n"),
+                Optional(ElementsAre(SourceBucket{5, 5, 2}, SourceBucket{7, 7, 5})));
+}
+
 TEST(SourceTextTest, MoreBucketsThanAnyHistogramHasAreNone) {
     std::string text;
     for (std::size_t i = 0; i < kMaxSourceBuckets; ++i) {
-        text += "0 1 1\n";
+        text += std::to_string(i) + " 9999 1\n";
     }
     ASSERT_TRUE(parseBuckets(text));
     EXPECT_EQ(parseBuckets(text + "0 1 1\n"), std::nullopt);
