@@ -66,6 +66,13 @@ std::vector<std::string> numbered(const fs::path& directory, std::string_view pr
     return names;
 }
 
+// What is left of a name where statistics are reported: "Pad 2" and "Pad2" are one
+// there.
+std::string asInKeys(std::string name) {
+    std::erase_if(name, [](char character) { return character == ' ' || character == '_'; });
+    return name;
+}
+
 class Finder {
 public:
     explicit Finder(const SourceRoot& root) : root_(root) {}
@@ -102,11 +109,26 @@ private:
             channel.subgroup = group.subgroup;
         }
         channel.driver = std::move(driver);
-        channel.name = std::move(name);
+        channel.name = distinctName(channel, name);
         channel.unit = std::move(unit);
         channel.format = format;
         channel.source = std::move(source);
         found_.push_back(std::move(channel));
+    }
+    // The name, with a number where a like device has it already.
+    std::string distinctName(DriverChannel channel, const std::string& name) const {
+        channel.name = name;
+        for (int number = 2; isFound(channel); ++number) {
+            channel.name = fmt::format("{} {}", name, number);
+        }
+        return channel.name;
+    }
+    bool isFound(const DriverChannel& channel) const {
+        return std::any_of(found_.begin(), found_.end(), [&](const DriverChannel& each) {
+            return each.group == channel.group && each.subgroup == channel.subgroup &&
+                   asInKeys(each.driver) == asInKeys(channel.driver) &&
+                   asInKeys(each.name) == asInKeys(channel.name);
+        });
     }
     // Unless nothing manages the device's power.
     void addPower(const Group& group, const std::string& device, const std::string& name) {

@@ -49,6 +49,23 @@ TEST(BuiltInChannelsTest, ADeviceHasChannelsInEveryGroup) {
     EXPECT_EQ(all.size(), 29U);
 }
 
+TEST(BuiltInChannelsTest, LikeDevicesAreNumbered) {
+    const testing::TempTree tree;
+    for (const auto& [input, name] :
+         {std::pair("input3", "Pad"), {"input4", "Pad"}, {"input5", "Pad2"}, {"input20", "Pad"}}) {
+        const std::string device = std::string("sys/class/input/") + input;
+        tree.write(device + "/capabilities/ff", "1\n");
+        tree.write(device + "/name", std::string(name) + "\n");
+        tree.write(device + "/device/power/runtime_status", "active\n");
+    }
+    const std::string source = " = runtime_pm:/sys/class/input/";
+    EXPECT_THAT(builtIn(tree.path()),
+                ElementsAre("Haptics/Stats//Pad" + source + "input3/device",
+                            "Haptics/Stats//Pad 2" + source + "input4/device",
+                            "Haptics/Stats//Pad2 2" + source + "input5/device",
+                            "Haptics/Stats//Pad 3" + source + "input20/device"));
+}
+
 TEST(BuiltInChannelsTest, ASystemWithoutDevicesHasNone) {
     const testing::TempTree tree;
     EXPECT_THAT(builtIn(tree.path()), IsEmpty());
@@ -113,23 +130,6 @@ protected:
                           });
         return result;
     }
-    bool logged(LogLevel level, std::string_view text) const {
-        return platform_.log.has(level, HYReportingPlatformCategory, text);
-    }
-
-    testing::TestPlatform platform_;
-    testing::TempTree tree_;
-    std::optional<LinuxHWReport> library_;
-    platform::HWReportSubscribed subscribed_;
-};
-
-TEST_F(LinuxHWReportTest, ListsByGroupAndSubgroupAnAbsentOneMatchingAny) {
-    DriverChannel both = channel("both", "file:/x");
-    both.subgroup = "QLX";
-    DriverChannel subgroupOnly = channel("subgroup", "file:/x");
-    subgroupOnly.group.reset();
-    subgroupOnly.subgroup = "QLX";
-    auto& all = library({channel("group", "file:/x"), both, subgroupOnly});
     // "channel state residency duty-cycle" of the resident states.
     std::vector<std::string> states(const platform::HWReportSamples& before,
                                     const platform::HWReportSamples& after) {
@@ -149,6 +149,23 @@ TEST_F(LinuxHWReportTest, ListsByGroupAndSubgroupAnAbsentOneMatchingAny) {
                           });
         return result;
     }
+    bool logged(LogLevel level, std::string_view text) const {
+        return platform_.log.has(level, HYReportingPlatformCategory, text);
+    }
+
+    testing::TestPlatform platform_;
+    testing::TempTree tree_;
+    std::optional<LinuxHWReport> library_;
+    platform::HWReportSubscribed subscribed_;
+};
+
+TEST_F(LinuxHWReportTest, ListsByGroupAndSubgroupAnAbsentOneMatchingAny) {
+    DriverChannel both = channel("both", "file:/x");
+    both.subgroup = "QLX";
+    DriverChannel subgroupOnly = channel("subgroup", "file:/x");
+    subgroupOnly.group.reset();
+    subgroupOnly.subgroup = "QLX";
+    auto& all = library({channel("group", "file:/x"), both, subgroupOnly});
     const auto count = [&](std::optional<std::string> group, std::optional<std::string> subgroup) {
         const Listing listed = all.copyChannelsInGroup(group, subgroup);
         EXPECT_FALSE(listed.error);
@@ -227,30 +244,6 @@ TEST_F(LinuxHWReportTest, AFileThatGoesCostsItsChannelAndIsToldOnceAnEpisode) {
     EXPECT_TRUE(logged(LogLevel::Default, "driver channel Speaker-(null) \"A\" can be read again"));
 }
 
-TEST_F(LinuxHWReportTest, StrangeHandlesAreErrors) {
-    auto& all = library({channel("A", "file:/a")});
-    subscribe();
-    EXPECT_EQ(all.createSamples(nullptr, subscribed_.channels.get()).error->code, 22);
-    EXPECT_EQ(all.createSamples(subscribed_.subscription, nullptr).error->code, 22);
-    const platform::HWReportChannels strangeChannels;
-    EXPECT_EQ(all.createSubscription(strangeChannels).subscription, nullptr);
-    EXPECT_EQ(all.getChannelCount(strangeChannels), 0);
-    const platform::HWReportSamples strange;
-    EXPECT_EQ(all.createSamplesDelta(nullptr, strange).error->code, 22);
-    EXPECT_EQ(all.createSamplesDelta(&strange, *sample()).error->code, 22);
-}
-
-TEST_F(LinuxHWReportTest, IterationEndsWhenTheCallerSaysSo) {
-    tree_.write("a", "1\n");
-    library({channel("A", "file:/a"), channel("B", "file:/a")});
-    subscribe();
-    int calls = 0;
-    library_->iterate(*sample(), [&](const platform::HWReportChannel&) { return ++calls; });
-    EXPECT_EQ(calls, 1);
-}
-
-} // namespace
-} // namespace halyard::linux_
 TEST_F(LinuxHWReportTest, ABuiltInChannelThatCannotBeReadIsToldOnceAnEpisode) {
     tree_.write("proc/pressure/cpu", "some avg10=0.00 total=5\n");
     library({});
@@ -269,6 +262,19 @@ TEST_F(LinuxHWReportTest, ABuiltInChannelThatCannotBeReadIsToldOnceAnEpisode) {
     EXPECT_THAT(delta(before.get(), *sample()), ElementsAre("cpu some=4"));
     EXPECT_TRUE(logged(LogLevel::Default,
                        "driver channel Pressure-HWAudio2 \"cpu some\" can be read again"));
+}
+
+TEST_F(LinuxHWReportTest, StrangeHandlesAreErrors) {
+    auto& all = library({channel("A", "file:/a")});
+    subscribe();
+    EXPECT_EQ(all.createSamples(nullptr, subscribed_.channels.get()).error->code, 22);
+    EXPECT_EQ(all.createSamples(subscribed_.subscription, nullptr).error->code, 22);
+    const platform::HWReportChannels strangeChannels;
+    EXPECT_EQ(all.createSubscription(strangeChannels).subscription, nullptr);
+    EXPECT_EQ(all.getChannelCount(strangeChannels), 0);
+    const platform::HWReportSamples strange;
+    EXPECT_EQ(all.createSamplesDelta(nullptr, strange).error->code, 22);
+    EXPECT_EQ(all.createSamplesDelta(&strange, *sample()).error->code, 22);
 }
 
 TEST_F(LinuxHWReportTest, EveryKindOfStatesHasItsSharesOfTheTimeBetween) {
@@ -297,3 +303,14 @@ TEST_F(LinuxHWReportTest, EveryKindOfStatesHasItsSharesOfTheTimeBetween) {
                             "pcm PREPARED 4000000 1.000000"));
 }
 
+TEST_F(LinuxHWReportTest, IterationEndsWhenTheCallerSaysSo) {
+    tree_.write("a", "1\n");
+    library({channel("A", "file:/a"), channel("B", "file:/a")});
+    subscribe();
+    int calls = 0;
+    library_->iterate(*sample(), [&](const platform::HWReportChannel&) { return ++calls; });
+    EXPECT_EQ(calls, 1);
+}
+
+} // namespace
+} // namespace halyard::linux_
