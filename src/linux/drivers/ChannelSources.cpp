@@ -277,8 +277,10 @@ Reading BucketSource::read(platform::SteadyTime) {
 
 namespace {
 
+constexpr std::string_view kRunning = "RUNNING";
 constexpr const char* kPcmStates[] = {"CLOSED", "OPEN",     "SETUP",  "PREPARED",  "RUNNING",
                                       "XRUN",   "DRAINING", "PAUSED", "SUSPENDED", "DISCONNECTED"};
+constexpr std::size_t kPcmStateCount = std::size(kPcmStates);
 
 ReadingShapeRef pcmShape() {
     static const auto shape = std::make_shared<const ReadingShape>(
@@ -300,11 +302,27 @@ std::uint64_t microseconds(std::chrono::nanoseconds time) {
         std::chrono::duration_cast<std::chrono::microseconds>(time).count());
 }
 
+std::uint64_t framesOf(const PcmStatus& status) {
+    return static_cast<std::uint64_t>(std::max<std::int64_t>(status.frames.value_or(0), 0));
+}
+
 } // namespace
 
 PcmSource::PcmSource(SampledFile status, What what)
-    : file_(std::move(status)), what_(what), shape_(pcmShape()),
-      residencies_(2 * std::size(kPcmStates), 0) {}
+    : file_(std::move(status)), what_(what), shape_(pcmShape()) {}
+
+// A stream that was only paused goes on counting where it was. One that had to be
+// prepared again, as after an xrun, counts from 0. Where both may have been, the
+// lesser is taken.
+std::uint64_t PcmSource::framesSinceLast(const PcmStatus& status) const {
+    const std::uint64_t frames = framesOf(status);
+    const std::uint64_t before = framesOf(*last_);
+    const bool preparedAgain = status.state == kRunning && status.triggered != last_->triggered &&
+                               last_->state != kRunning && last_->state != "PAUSED" &&
+                               last_->state != "SUSPENDED";
+    const bool anew = preparedAgain || status.owner != last_->owner || frames < before;
+    return anew ? frames : frames - before;
+}
 
 void PcmSource::addResidency(const PcmStatus& status, bool restarted, platform::SteadyTime now) {
     const auto before = placeOf(last_->state);
@@ -312,57 +330,61 @@ void PcmSource::addResidency(const PcmStatus& status, bool restarted, platform::
     const bool entered = restarted || status.state != last_->state;
     std::chrono::nanoseconds elapsed = std::max(now - lastTime_, std::chrono::nanoseconds(0));
     if (after && entered) {
-        ++residencies_[*after + 1];
-        if (status.state == "RUNNING" && status.triggered && status.stamped) {
+        ++seen_.residencies[*after + 1];
+        if (status.state == kRunning && status.triggered && status.stamped) {
             const auto running = std::clamp(*status.stamped - *status.triggered,
                                             std::chrono::nanoseconds(0), elapsed);
-            residencies_[*after] += microseconds(running);
+            seen_.residencies[*after] += microseconds(running);
             elapsed -= running;
         }
     }
     if (before) {
-        residencies_[*before] += microseconds(elapsed);
+        seen_.residencies[*before] += microseconds(elapsed);
     }
 }
 
 void PcmSource::advance(const PcmStatus& status, platform::SteadyTime now) {
-    const bool restarted = status.state == "RUNNING" && status.owner == last_->owner &&
+    const bool restarted = status.state == kRunning && status.owner == last_->owner &&
                            last_->triggered && status.triggered != last_->triggered;
-    restarts_ += restarted ? 1 : 0;
-    xruns_ += status.state == "XRUN" && last_->state != "XRUN" ? 1 : 0;
+    seen_.restarts += restarted ? 1 : 0;
+    seen_.xruns += status.state == "XRUN" && last_->state != "XRUN" ? 1 : 0;
+    seen_.frames += framesSinceLast(status);
     addResidency(status, restarted, now);
 }
 
 Reading PcmSource::read(platform::SteadyTime now) {
     std::string& text = scratch();
     if (const std::errc error = file_.read(text); error != std::errc{}) {
-        last_.reset();
+        if (meansAbsent(error)) { // And its history with it.
+            last_.reset();
+        }
         return missing(file_, error);
     }
     auto status = parsePcmStatus(text);
     if (!status) {
-        last_.reset();
         return malformed(file_);
     }
     if (last_) {
         advance(*status, now);
+    } else {
+        seen_ = Seen{framesOf(*status), 0, 0, std::vector<std::uint64_t>(2 * kPcmStateCount)};
     }
     last_ = std::move(*status);
     lastTime_ = now;
     switch (what_) {
     case What::Frames:
-        return simple(static_cast<std::uint64_t>(last_->frames.value_or(0)));
+        return simple(seen_.frames);
     case What::Xruns:
-        return simple(xruns_);
+        return simple(seen_.xruns);
     case What::Restarts:
-        return simple(restarts_);
+        return simple(seen_.restarts);
     case What::States:
         break;
     }
     Reading reading;
     reading.status = ReadStatus::Read;
     reading.shape = shape_;
-    reading.numbers = residencies_;
+    reading.numbers = seen_.residencies;
     return reading;
 }
 

@@ -115,7 +115,8 @@ private:
 
 // What a PCM stream can be seen doing. ALSA keeps its state but no history, so
 // the history is made of what each read sees: a state lasts from the read that
-// saw it, or from the stream's own trigger time, to the next read.
+// saw it, or from the stream's own trigger time, to the next read, and frames add
+// up over closing and starting again. It ends with the device.
 class PcmSource final : public ChannelSource {
 public:
     enum class What {
@@ -132,18 +133,24 @@ public:
     Reading read(platform::SteadyTime now) override;
 
 private:
+    // Since the device is there.
+    struct Seen {
+        std::uint64_t frames = 0;
+        std::uint64_t xruns = 0;
+        std::uint64_t restarts = 0;
+        std::vector<std::uint64_t> residencies; // as in a reading
+    };
     // Requires that `status` is the next after `last_`.
     void advance(const PcmStatus& status, platform::SteadyTime now);
     void addResidency(const PcmStatus& status, bool restarted, platform::SteadyTime now);
+    std::uint64_t framesSinceLast(const PcmStatus& status) const;
 
     SampledFile file_;
     const What what_;
     const ReadingShapeRef shape_;
     std::optional<PcmStatus> last_;
     platform::SteadyTime lastTime_;
-    std::uint64_t xruns_ = 0;
-    std::uint64_t restarts_ = 0;
-    std::vector<std::uint64_t> residencies_; // as in a reading
+    Seen seen_;
 };
 
 } // namespace halyard::linux_

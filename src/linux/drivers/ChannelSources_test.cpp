@@ -157,10 +157,18 @@ TEST_F(ChannelSourcesTest, RefusesSourcesThatMakeNoSense) {
 
 class PcmSourceTest : public ChannelSourcesTest {
 protected:
-    void status(const std::string& state, const std::string& trigger, const std::string& stamp) {
+    void status(const std::string& state, const std::string& trigger, const std::string& stamp,
+                int frames = 480, int owner = 10) {
         tree_.write("sub0/status",
-                    "state: " + state + "\nowner_pid   : 10\ntrigger_time: " + trigger +
-                        ".000000000\ntstamp      : " + stamp + ".000000000\nhw_ptr      : 480\n");
+                    "state: " + state + "\nowner_pid   : " + std::to_string(owner) +
+                        "\ntrigger_time: " + trigger + ".000000000\ntstamp      : " + stamp +
+                        ".000000000\nhw_ptr      : " + std::to_string(frames) + "\n");
+    }
+    // What the stream's counter says next.
+    std::uint64_t count(ChannelSource& source) {
+        const Reading reading = readAfter(source, 1s);
+        EXPECT_EQ(reading.status, ReadStatus::Read) << reading.fault;
+        return reading.numbers.at(0);
     }
     Reading readAfter(ChannelSource& source, std::chrono::seconds time) {
         now_ += time;
@@ -184,6 +192,74 @@ TEST_F(PcmSourceTest, ReadsTheFrames) {
     EXPECT_THAT(read("alsa_frames:/proc/asound/card0/pcm0c/sub0").numbers, ElementsAre(0));
 }
 
+TEST_F(PcmSourceTest, FramesStayWhenTheStreamIsClosed) {
+    const auto source = make("alsa_frames:/sub0", own_);
+    status("RUNNING", "500", "504", 1000);
+    EXPECT_EQ(count(*source), 1000U);
+    status("RUNNING", "500", "505", 1480);
+    EXPECT_EQ(count(*source), 1480U);
+    tree_.write("sub0/status", "closed\n");
+    EXPECT_EQ(count(*source), 1480U);
+    status("PREPARED", "0", "0", 0);
+    EXPECT_EQ(count(*source), 1480U);
+    status("RUNNING", "600", "601", 2000);
+    EXPECT_EQ(count(*source), 3480U);
+}
+
+TEST_F(PcmSourceTest, FramesOfARestartedStreamAddUp) {
+    const auto source = make("alsa_frames:/sub0", own_);
+    status("RUNNING", "500", "504", 1000);
+    EXPECT_EQ(count(*source), 1000U);
+    status("RUNNING", "510", "511", 480); // It went back.
+    EXPECT_EQ(count(*source), 1480U);
+    status("XRUN", "512", "512", 500);
+    EXPECT_EQ(count(*source), 1500U);
+    status("RUNNING", "520", "521", 700); // No xrun goes on.
+    EXPECT_EQ(count(*source), 2200U);
+    status("RUNNING", "530", "531", 800, 11); // Somebody else's.
+    EXPECT_EQ(count(*source), 3000U);
+}
+
+TEST_F(PcmSourceTest, FramesOfAPausedStreamGoOn) {
+    const auto source = make("alsa_frames:/sub0", own_);
+    status("RUNNING", "500", "504", 1000);
+    EXPECT_EQ(count(*source), 1000U);
+    status("PAUSED", "505", "506", 1200);
+    EXPECT_EQ(count(*source), 1200U);
+    status("RUNNING", "507", "508", 1300);
+    EXPECT_EQ(count(*source), 1300U);
+    status("RUNNING", "510", "511", 1400); // Paused between two reads.
+    EXPECT_EQ(count(*source), 1400U);
+}
+
+TEST_F(PcmSourceTest, AReadThatFailsLosesNothing) {
+    const auto source = make("alsa_frames:/sub0", own_);
+    status("RUNNING", "500", "504", 1000);
+    EXPECT_EQ(count(*source), 1000U);
+    tree_.write("sub0/status", "?\n");
+    EXPECT_EQ(readAfter(*source, 1s).status, ReadStatus::Failed);
+    status("RUNNING", "500", "506", 1480);
+    EXPECT_EQ(count(*source), 1480U);
+}
+
+TEST_F(PcmSourceTest, AStreamWhoseDeviceHasGoneBeginsAnew) {
+    for (const char* kind : {"alsa_frames", "alsa_xruns", "alsa_restarts"}) {
+        const auto source = make(std::string(kind) + ":/sub0", own_);
+        status("RUNNING", "500", "504", 1000);
+        const std::uint64_t atFirst = count(*source);
+        status("XRUN", "505", "506", 1480);
+        count(*source);
+        status("RUNNING", "507", "508", 480);
+        count(*source);
+        status("RUNNING", "509", "510", 240);
+        EXPECT_GT(count(*source), atFirst) << kind;
+        std::filesystem::remove(tree_ / "sub0/status");
+        EXPECT_EQ(readAfter(*source, 1s).status, ReadStatus::Absent);
+        status("RUNNING", "600", "601", 1000);
+        EXPECT_EQ(count(*source), atFirst) << kind;
+    }
+}
+
 TEST_F(PcmSourceTest, AStateLastsFromReadToRead) {
     tree_.write("sub0/status", "closed\n");
     const auto source = make("alsa_states:/sub0", own_);
@@ -194,6 +270,18 @@ TEST_F(PcmSourceTest, AStateLastsFromReadToRead) {
     EXPECT_EQ(residency(reading, "CLOSED"), 3'000'000U);
     EXPECT_EQ(residency(reading, "PREPARED"), 2'000'000U);
     EXPECT_EQ(transitions(reading, "PREPARED"), 1U);
+}
+
+TEST_F(PcmSourceTest, StatesBeginAnewWhenTheDeviceHasGone) {
+    status("PREPARED", "0", "0");
+    const auto source = make("alsa_states:/sub0", own_);
+    source->read(now_);
+    EXPECT_EQ(residency(readAfter(*source, 2s), "PREPARED"), 2'000'000U);
+    std::filesystem::remove(tree_ / "sub0/status");
+    EXPECT_EQ(readAfter(*source, 1s).status, ReadStatus::Absent);
+    status("PREPARED", "0", "0");
+    EXPECT_EQ(residency(readAfter(*source, 1s), "PREPARED"), 0U);
+    EXPECT_EQ(residency(readAfter(*source, 3s), "PREPARED"), 3'000'000U);
 }
 
 TEST_F(PcmSourceTest, ARunningStreamTellsSinceWhen) {
