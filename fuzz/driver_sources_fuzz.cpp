@@ -7,7 +7,7 @@
 #include <variant>
 
 #include "Require.h"
-#include "linux/drivers/ChannelSource.h"
+#include "linux/drivers/SourceKinds.h"
 #include "linux/drivers/SourceText.h"
 
 using halyard::fuzz::require;
@@ -35,6 +35,7 @@ void checkSource(std::string_view text) {
     const auto made = makeChannelSource(text, root);
     const auto* const fault = std::get_if<std::string>(&made);
     require(fault == nullptr || !fault->empty());
+    require(fault != nullptr || findSourceKind(text) != nullptr);
 }
 
 } // namespace

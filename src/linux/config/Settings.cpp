@@ -7,6 +7,7 @@
 
 #include "linux/config/Quantities.h"
 #include "linux/config/TomlValue.h"
+#include "linux/drivers/SourceKinds.h"
 
 namespace halyard::linux_ {
 namespace {
@@ -19,26 +20,8 @@ constexpr std::pair<std::string_view, LogLevel> kLevels[] = {{"debug", LogLevel:
                                                              {"info", LogLevel::Info},
                                                              {"default", LogLevel::Default},
                                                              {"error", LogLevel::Error}};
-constexpr std::pair<std::string_view, ChannelFormat> kFormats[] = {
-    {"simple", ChannelFormat::Simple},
-    {"state", ChannelFormat::State},
-    {"histogram", ChannelFormat::Histogram}};
 
 template <class T> using Names = std::span<const std::pair<std::string_view, T>>;
-
-// The kinds of source that do not give counters, with what they give.
-constexpr std::pair<std::string_view, ChannelFormat> kUsualFormats[] = {
-    {"cpuidle:", ChannelFormat::State},         {"runtime_pm:", ChannelFormat::State},
-    {"cpufreq:", ChannelFormat::State},         {"devfreq:", ChannelFormat::State},
-    {"alsa_states:", ChannelFormat::State},     {"histogram:", ChannelFormat::Histogram},
-    {"tracefs_hist:", ChannelFormat::Histogram}};
-
-ChannelFormat usualFormat(std::string_view source) {
-    const auto* const at =
-        std::find_if(std::begin(kUsualFormats), std::end(kUsualFormats),
-                     [&](const auto& usual) { return source.starts_with(usual.first); });
-    return at != std::end(kUsualFormats) ? at->second : ChannelFormat::Simple;
-}
 
 bool isSource(std::string_view text) {
     const std::size_t colon = text.find(':');
@@ -127,7 +110,7 @@ private:
     }
     void readChannelFormat(const toml::node& node, const std::string& name) {
         channelHasFormat_ = true;
-        readNamed<ChannelFormat>(node, name, kFormats, channel_.format);
+        readNamed<ChannelFormat>(node, name, kChannelFormats, channel_.format);
     }
 
     Settings& settings() { return result_.settings; }
@@ -395,7 +378,8 @@ void SettingsReader::checkChannel(const toml::node& node, const std::string& nam
         fail(node, fmt::format("{} needs a source such as \"file:/sys/...\"", name));
     }
     if (!channelHasFormat_) {
-        channel_.format = usualFormat(channel_.source);
+        const SourceKind* const kind = findSourceKind(channel_.source);
+        channel_.format = kind != nullptr ? kind->format : ChannelFormat::Simple;
     }
 }
 

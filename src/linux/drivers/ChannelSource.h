@@ -9,12 +9,9 @@
 #include <filesystem>
 #include <memory>
 #include <string>
-#include <string_view>
 #include <utility>
-#include <variant>
 #include <vector>
 
-#include "linux/drivers/DriverChannel.h"
 #include "linux/drivers/SampledFile.h"
 #include "platform/Clock.h"
 
@@ -48,10 +45,7 @@ struct Reading {
 class ChannelSource {
 public:
     virtual ~ChannelSource() = default;
-    virtual ChannelFormat format() const = 0;
     virtual Reading read(platform::SteadyTime now) = 0;
-    // How many of its units make up a second of residency.
-    virtual std::uint64_t residencyPerSecond() const { return 1'000'000; }
 };
 
 // The file system that paths are resolved in. Borrowed by the sources.
@@ -64,11 +58,5 @@ struct SourceRoot {
         return path / absolute.relative_path();
     }
 };
-
-// Understands "KIND:REST", as docs/drivers.md lists them; the text says what is
-// wrong. Nothing needs to be there yet, but interrupts (irq:), which are looked
-// for now.
-[[nodiscard]] std::variant<std::unique_ptr<ChannelSource>, std::string>
-makeChannelSource(std::string_view source, SourceRoot& root);
 
 } // namespace halyard::linux_

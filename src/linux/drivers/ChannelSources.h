@@ -19,7 +19,6 @@ public:
 
     CounterSource(SampledFile file, Parse parse)
         : file_(std::move(file)), parse_(std::move(parse)) {}
-    ChannelFormat format() const override { return ChannelFormat::Simple; }
     Reading read(platform::SteadyTime now) override;
 
 private:
@@ -32,7 +31,6 @@ class InterruptSource final : public ChannelSource {
 public:
     // Counts the lines in /sys/kernel/irq one of whose actions is `action`.
     InterruptSource(const std::string& action, SourceRoot& root);
-    ChannelFormat format() const override { return ChannelFormat::Simple; }
     Reading read(platform::SteadyTime now) override;
 
 private:
@@ -44,7 +42,6 @@ class CpuIdleSource final : public ChannelSource {
 public:
     CpuIdleSource(std::filesystem::path directory, SourceRoot& root)
         : directory_(std::move(directory)), root_(root) {}
-    ChannelFormat format() const override { return ChannelFormat::State; }
     Reading read(platform::SteadyTime now) override;
 
 private:
@@ -67,9 +64,7 @@ class RuntimePowerSource final : public ChannelSource {
 public:
     // The device's directory or its "power" directory.
     RuntimePowerSource(const std::filesystem::path& directory, SourceRoot& root);
-    ChannelFormat format() const override { return ChannelFormat::State; }
     Reading read(platform::SteadyTime now) override;
-    std::uint64_t residencyPerSecond() const override { return 1000; }
 
 private:
     SampledFile active_;
@@ -85,9 +80,7 @@ public:
 
     StateTableSource(SampledFile file, Parse parse) : file_(std::move(file)), parse_(parse) {}
     void setTransitions(SampledFile file) { transitions_.emplace(std::move(file)); }
-    ChannelFormat format() const override { return ChannelFormat::State; }
     Reading read(platform::SteadyTime now) override;
-    std::uint64_t residencyPerSecond() const override { return 1000; }
 
 private:
     void addTransitions(SourceStates& states);
@@ -104,7 +97,6 @@ public:
     using Parse = std::optional<SourceBuckets> (*)(std::string_view);
 
     BucketSource(SampledFile file, Parse parse) : file_(std::move(file)), parse_(parse) {}
-    ChannelFormat format() const override { return ChannelFormat::Histogram; }
     Reading read(platform::SteadyTime now) override;
 
 private:
@@ -127,9 +119,6 @@ public:
     };
 
     PcmSource(SampledFile status, What what);
-    ChannelFormat format() const override {
-        return what_ == What::States ? ChannelFormat::State : ChannelFormat::Simple;
-    }
     Reading read(platform::SteadyTime now) override;
 
 private:

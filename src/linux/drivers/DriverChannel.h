@@ -6,10 +6,16 @@
 #include <cstdint>
 #include <optional>
 #include <string>
+#include <string_view>
+#include <utility>
 
 namespace halyard::linux_ {
 
 enum class ChannelFormat : std::uint8_t { Simple, State, Histogram };
+inline constexpr std::pair<std::string_view, ChannelFormat> kChannelFormats[] = {
+    {"simple", ChannelFormat::Simple},
+    {"state", ChannelFormat::State},
+    {"histogram", ChannelFormat::Histogram}};
 
 // Beside the built-in ones. At least one of group and subgroup is there.
 struct DriverChannel {

@@ -11,7 +11,6 @@ using namespace std::chrono_literals;
 
 class FixedSource final : public ChannelSource {
 public:
-    ChannelFormat format() const override { return ChannelFormat::Simple; }
     Reading read(platform::SteadyTime) override {
         Reading reading;
         reading.status = ReadStatus::Read;
@@ -24,7 +23,6 @@ public:
 class BlockingSource final : public ChannelSource {
 public:
     ~BlockingSource() override { gone_->set_value(); }
-    ChannelFormat format() const override { return ChannelFormat::Simple; }
     Reading read(platform::SteadyTime) override {
         released_.wait();
         Reading reading;

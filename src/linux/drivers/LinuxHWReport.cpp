@@ -5,6 +5,7 @@
 #include <tuple>
 
 #include "linux/drivers/BuiltInChannels.h"
+#include "linux/drivers/SourceKinds.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {
@@ -12,10 +13,8 @@ namespace {
 
 const platform::HWReportError kInvalid{static_cast<std::int64_t>(std::errc::invalid_argument)};
 
-constexpr const char* kFormatNames[] = {"simple", "state", "histogram"};
-
-const char* nameOf(ChannelFormat format) {
-    return kFormatNames[static_cast<std::size_t>(format)];
+std::string_view nameOf(ChannelFormat format) {
+    return kChannelFormats[static_cast<std::size_t>(format)].first;
 }
 
 auto identity(const DriverChannel& names) {
@@ -60,12 +59,13 @@ LinuxHWReport::LinuxHWReport(const platform::Clock& clock,
 void LinuxHWReport::add(const DriverChannel& names, bool configured) {
     auto made = makeChannelSource(names.source, *root_);
     auto* const source = std::get_if<std::unique_ptr<ChannelSource>>(&made);
+    const SourceKind* const kind = findSourceKind(names.source);
     std::string fault;
     if (source == nullptr) {
         fault = std::get<std::string>(made);
-    } else if ((*source)->format() != names.format) {
-        fault = fmt::format("gives the format {}, not {}", nameOf((*source)->format()),
-                            nameOf(names.format));
+    } else if (kind->format != names.format) {
+        fault =
+            fmt::format("gives the format {}, not {}", nameOf(kind->format), nameOf(names.format));
     }
     if (!fault.empty()) {
         HY_LOG_ERROR(HYReportingPlatformCategory,
@@ -76,7 +76,7 @@ void LinuxHWReport::add(const DriverChannel& names, bool configured) {
     }
     Channel channel;
     channel.facts =
-        std::make_shared<const ChannelFacts>(ChannelFacts{names, (*source)->residencyPerSecond()});
+        std::make_shared<const ChannelFacts>(ChannelFacts{names, kind->residencyPerSecond});
     channel.source = withRoot(std::move(*source), root_);
     channel.configured = configured;
     const auto same = std::find_if(channels_.begin(), channels_.end(), [&](const Channel& each) {

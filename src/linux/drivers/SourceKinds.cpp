@@ -1,7 +1,9 @@
-#include "linux/drivers/ChannelSource.h"
+#include "linux/drivers/SourceKinds.h"
 
+#include <algorithm>
 #include <charconv>
 #include <fmt/format.h>
+#include <iterator>
 #include <optional>
 
 #include "linux/drivers/ChannelSources.h"
@@ -106,45 +108,63 @@ Made makeTraceHistogram(Order order) {
     return make<BucketSource>(order.file(), parseTraceHistogram);
 }
 
-constexpr struct {
-    std::string_view name;
+struct Kind : SourceKind {
     Made (*make)(Order order);
-    bool takesPath;
-} kKinds[] = {{"file", makeFile, true},
-              {"field", makeField, true},
-              {"pressure", makePressure, true},
-              {"irq", makeInterrupt, false},
-              {"cpuidle", makeCpuIdle, true},
-              {"runtime_pm", makeRuntimePower, true},
-              {"cpufreq", makeCpuFrequency, true},
-              {"devfreq", makeDeviceFrequency, true},
-              {"alsa_frames", makePcm<PcmSource::What::Frames>, true},
-              {"alsa_xruns", makePcm<PcmSource::What::Xruns>, true},
-              {"alsa_restarts", makePcm<PcmSource::What::Restarts>, true},
-              {"alsa_states", makePcm<PcmSource::What::States>, true},
-              {"histogram", makeHistogram, true},
-              {"tracefs_hist", makeTraceHistogram, true}};
+    bool takesPath = true;
+};
+
+constexpr std::uint64_t kNoTime = 1;
+constexpr std::uint64_t kMilliseconds = 1'000;
+constexpr std::uint64_t kMicroseconds = 1'000'000;
+
+constexpr Kind kKinds[] = {
+    {{"file", ChannelFormat::Simple, kNoTime}, makeFile},
+    {{"field", ChannelFormat::Simple, kNoTime}, makeField},
+    {{"pressure", ChannelFormat::Simple, kNoTime}, makePressure},
+    {{"irq", ChannelFormat::Simple, kNoTime}, makeInterrupt, false},
+    {{"cpuidle", ChannelFormat::State, kMicroseconds}, makeCpuIdle},
+    {{"runtime_pm", ChannelFormat::State, kMilliseconds}, makeRuntimePower},
+    {{"cpufreq", ChannelFormat::State, kMilliseconds}, makeCpuFrequency},
+    {{"devfreq", ChannelFormat::State, kMilliseconds}, makeDeviceFrequency},
+    {{"alsa_frames", ChannelFormat::Simple, kNoTime}, makePcm<PcmSource::What::Frames>},
+    {{"alsa_xruns", ChannelFormat::Simple, kNoTime}, makePcm<PcmSource::What::Xruns>},
+    {{"alsa_restarts", ChannelFormat::Simple, kNoTime}, makePcm<PcmSource::What::Restarts>},
+    {{"alsa_states", ChannelFormat::State, kMicroseconds}, makePcm<PcmSource::What::States>},
+    {{"histogram", ChannelFormat::Histogram, kNoTime}, makeHistogram},
+    {{"tracefs_hist", ChannelFormat::Histogram, kNoTime}, makeTraceHistogram}};
+
+// What stands before the ":".
+std::string_view kindName(std::string_view source) {
+    return source.substr(0, source.find(':'));
+}
+
+const Kind* findKind(std::string_view source) {
+    const auto* const at =
+        std::find_if(std::begin(kKinds), std::end(kKinds),
+                     [&](const Kind& kind) { return kind.name == kindName(source); });
+    return at != std::end(kKinds) ? at : nullptr;
+}
 
 } // namespace
 
+const SourceKind* findSourceKind(std::string_view source) {
+    return findKind(source);
+}
+
 Made makeChannelSource(std::string_view source, SourceRoot& root) {
-    const std::size_t colon = source.find(':');
-    const std::string_view name = source.substr(0, colon);
-    const std::string_view rest =
-        colon == std::string_view::npos ? std::string_view() : source.substr(colon + 1);
-    for (const auto& kind : kKinds) {
-        if (kind.name != name) {
-            continue;
-        }
-        if (kind.takesPath && !rest.starts_with('/')) {
-            return "needs a path that begins with \"/\"";
-        }
-        if (rest.empty() || rest.find('\0') != std::string_view::npos) {
-            return "needs something behind the \":\"";
-        }
-        return kind.make({rest, root});
+    const Kind* const kind = findKind(source);
+    if (kind == nullptr) {
+        return fmt::format("\"{}\" is no kind of source", kindName(source));
     }
-    return fmt::format("\"{}\" is no kind of source", name);
+    std::string_view rest = source.substr(kind->name.size());
+    rest.remove_prefix(rest.empty() ? 0 : 1);
+    if (kind->takesPath && !rest.starts_with('/')) {
+        return "needs a path that begins with \"/\"";
+    }
+    if (rest.empty() || rest.find('\0') != std::string_view::npos) {
+        return "needs something behind the \":\"";
+    }
+    return kind->make({rest, root});
 }
 
 } // namespace halyard::linux_
