@@ -202,6 +202,7 @@ private:
     void startPerformanceTrace() HY_EXCLUDES(stateMutex_);
     void stopTracing();
     void waitForTrace();
+    void stopEventTrace();
     void setStopWaitsSince(std::optional<platform::SteadyTime> since) HY_EXCLUDES(stateMutex_);
     std::shared_ptr<platform::PerformanceTraceSession> traceSession() const
         HY_EXCLUDES(stateMutex_);
@@ -219,7 +220,7 @@ private:
 
     std::atomic<bool> startedTracing_{false};
     platform::Semaphore mTraceDispatchSemaphore_;
-    // On the service queue only.
+    // On the service queue only; there while an event trace runs.
     std::unique_ptr<TraceParams> traceParams_;
     std::unique_ptr<TraceRunner> traceRunner_;
 

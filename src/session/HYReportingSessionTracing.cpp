@@ -112,13 +112,24 @@ void HYReportingSession::stopTracing() {
 
 void HYReportingSession::waitForTrace() {
     if (tracingFileName()) {
-        traceRunner_->stopTracingandProcessResults();
+        stopEventTrace();
         return;
     }
     if (const auto running = traceSession()) {
         running->stopPerformanceTrace();
     }
     mTraceDispatchSemaphore_.wait();
+}
+
+// The name of the file stays when its trace has ended, the runner does not: it
+// holds every event that was recorded. A performance trace that the session
+// takes later thus has nobody to stop it, and runs until the session goes.
+void HYReportingSession::stopEventTrace() {
+    if (traceRunner_ != nullptr) {
+        traceRunner_->stopTracingandProcessResults();
+    }
+    traceRunner_.reset();
+    traceParams_.reset();
 }
 
 std::optional<platform::SteadyTime> HYReportingSession::stopWaitsSince() const {

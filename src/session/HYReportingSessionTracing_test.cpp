@@ -157,17 +157,28 @@ TEST_F(SessionTracingTest, ASessionMayBeTracedAgain) {
     EXPECT_THAT(platform_.resultsFiles.files, SizeIs(2));
 }
 
-// The file's name stays, so the stop goes to the runner whatever was started.
-TEST_F(SessionTracingTest, OnceAnEventTraceTheStopAlwaysGoesToItsRunner) {
+TEST_F(SessionTracingTest, ARunnerGoesWithItsEventsOnceTheResultsAreWritten) {
+    configure({{HYReportingLoomisPlistFilePath, "/trace.plist"}});
+    session_->start();
+    EXPECT_EQ(platform_.queues.queuesHeld("Tracing Queue"), 1U);
+    session_->stop();
+    EXPECT_EQ(platform_.queues.queuesHeld("Tracing Queue"), 0U);
+    EXPECT_EQ(session_->tracingFileName(), "/trace.plist");
+}
+
+// The file's name stays, so the stop is that of an event trace whatever was
+// started. Its results stay as they are.
+TEST_F(SessionTracingTest, OnceAnEventTraceNoStopGoesToAPerformanceTrace) {
     configure({{HYReportingLoomisPlistFilePath, "/trace.plist"}});
     session_->start();
     session_->stop();
     configure({{HYReportingTraceType, "artrace"}});
     session_->start();
     session_->stop();
+    EXPECT_FALSE(session_->startedTracing());
     ASSERT_THAT(performance(), SizeIs(1));
     EXPECT_EQ(performance()[0]->stopped, 0);
-    EXPECT_THAT(platform_.resultsFiles.files, SizeIs(2));
+    EXPECT_THAT(platform_.resultsFiles.files, SizeIs(1));
 }
 
 TEST_F(SessionTracingTest, ADestroyedSessionGivesItsTracesUp) {

@@ -56,7 +56,10 @@ private:
     public:
         Session(const FakeEventTrace& owner, std::shared_ptr<State> state)
             : owner_(owner), state_(std::move(state)) {}
-        ~Session() override { state_->destroyed = true; }
+        ~Session() override {
+            state_->destroyed = true;
+            state_->queue = nullptr;
+        }
 
         void setCompletionHandler(std::function<void()> handler) override {
             state_->completion = std::move(handler);

@@ -27,7 +27,7 @@ public:
     }
 
     std::vector<std::shared_ptr<State>> sessions;
-    bool completes = true; // when it is stopped; else somebody calls the delegate
+    bool completes = true; // when it is stopped or cannot start; else a test says so
     MaybeError startError; // completes, too
     MaybeError stopError;
     MaybeError completeError;
@@ -46,7 +46,7 @@ private:
             ++state_->started;
             const auto delegate = state_->delegate.lock();
             delegate->performanceTraceDidStart(owner_.startError);
-            if (owner_.startError) {
+            if (owner_.startError && owner_.completes) {
                 delegate->performanceTraceDidComplete("", "", owner_.startError);
             }
         }

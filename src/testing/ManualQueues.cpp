@@ -60,8 +60,9 @@ ManualQueues::~ManualQueues() = default;
 
 std::shared_ptr<platform::SerialQueue>
 ManualQueues::makeSerialQueue(std::string_view name, platform::QueuePriority priority) {
-    made_.push_back({std::string(name), priority});
-    return std::make_shared<Queue>(*this, std::string(name));
+    auto queue = std::make_shared<Queue>(*this, std::string(name));
+    made_.push_back({std::string(name), priority, queue});
+    return queue;
 }
 
 platform::WorkQueue& ManualQueues::backgroundQueue() {
@@ -111,6 +112,13 @@ void ManualQueues::advance(std::chrono::nanoseconds by) {
 std::size_t ManualQueues::queuesMade(std::string_view name) const {
     return static_cast<std::size_t>(std::count_if(
         made_.begin(), made_.end(), [&](const Made& made) { return made.name == name; }));
+}
+
+std::size_t ManualQueues::queuesHeld(std::string_view name) const {
+    return static_cast<std::size_t>(
+        std::count_if(made_.begin(), made_.end(), [&](const Made& made) {
+            return made.name == name && !made.queue.expired();
+        }));
 }
 
 std::optional<platform::QueuePriority> ManualQueues::priority(std::string_view name) const {

@@ -35,6 +35,8 @@ public:
     void advance(std::chrono::nanoseconds by);
 
     std::size_t queuesMade(std::string_view name) const;
+    // Those of them that somebody still holds.
+    std::size_t queuesHeld(std::string_view name) const;
     // Of the queue made last under this name; none when there is none.
     std::optional<platform::QueuePriority> priority(std::string_view name) const;
     // Tasks submitted to queues of this name that have not run.
@@ -58,6 +60,7 @@ private:
     struct Made {
         std::string name;
         platform::QueuePriority priority;
+        std::weak_ptr<Queue> queue;
     };
     std::vector<Made> made_;
     std::shared_ptr<Queue> background_;
