@@ -25,13 +25,45 @@ protected:
     void configure(const Dictionary& configuration) {
         session_->updateConfigurationWithContentsOfConfiguration(configuration);
     }
+    auto& events() { return platform_.eventTrace.sessions; }
+    auto& performance() { return platform_.performanceTraces.sessions; }
+    // With a parameter file, and without.
+    static std::vector<Dictionary> kindsOfTrace() {
+        return {{{HYReportingLoomisPlistFilePath, "/trace.plist"}}, {}};
+    }
+    void expectNoTrace(AudioServiceType type, const Dictionary& configuration) {
+        const auto session = makeSession();
+        session->setServiceType(type);
+        session->updateConfigurationWithContentsOfConfiguration(configuration);
+        session->start();
+        EXPECT_FALSE(session->startedTracing()) << type;
+        session->stop();
+        EXPECT_EQ(session->tracingFileName(), std::nullopt) << type;
+        EXPECT_THAT(events(), IsEmpty()) << type;
+        EXPECT_THAT(performance(), IsEmpty()) << type;
+        EXPECT_THAT(platform_.resultsFiles.files, IsEmpty()) << type;
+    }
+    // Makes a stop that waits see the trace complete: `waits_` counts.
+    void completeWhenWaitedFor(std::string_view url, MaybeError error = std::nullopt) {
+        platform_.performanceTraces.completes = false;
+        platform_.conditions.onWait = [this, url, error] {
+            ++waits_;
+            waitedSince_ = session_->stopWaitsSince();
+            heldWhileWaiting_ = !performance()[0]->destroyed;
+            session_->performanceTraceDidComplete(url, "", error);
+            return true;
+        };
+        session_ = makeSession();
+        session_->setServiceType(kAudioServiceTypeTest);
+    }
     bool loggedByTrace(LogLevel level, std::string_view text) const {
         return platform_.log.has(level, HYReportingTraceCategory, text);
     }
-    auto& events() { return platform_.eventTrace.sessions; }
-    auto& performance() { return platform_.performanceTraces.sessions; }
 
     std::shared_ptr<HYReportingSession> session_;
+    int waits_ = 0;
+    std::optional<platform::SteadyTime> waitedSince_;
+    bool heldWhileWaiting_ = false; // the trace session
 };
 
 TEST_F(SessionTracingTest, AParameterFileWithoutAKindRunsTheEventTrace) {
@@ -87,20 +119,65 @@ TEST_F(SessionTracingTest, NotEvenTheConstantsOwnTextMatchesOnceItIsAValue) {
 }
 
 TEST_F(SessionTracingTest, OtherServiceTypesNeverTrace) {
-    session_->setServiceType(kAudioServiceTypeLongFormAudio);
-    configure({{HYReportingLoomisPlistFilePath, "/trace.plist"}});
-    session_->start();
-    session_->stop();
-    EXPECT_THAT(events(), IsEmpty());
-    EXPECT_THAT(performance(), IsEmpty());
+    std::vector<AudioServiceType> others{kAudioServiceTypeUnknown};
+    for (AudioServiceType type = 0; type <= kAudioServiceTypeSystemSounds + 1; ++type) {
+        if (type != kAudioServiceTypeTest) {
+            others.push_back(type);
+        }
+    }
+    for (const Dictionary& configuration : kindsOfTrace()) {
+        for (const AudioServiceType type : others) {
+            expectNoTrace(type, configuration);
+        }
+    }
 }
 
 TEST_F(SessionTracingTest, WithTheFeatureOffNothingTraces) {
-    platform_.featureFlags.flags.clear();
+    for (const bool configuredAsOff : {true, false}) {
+        platform_.featureFlags.flags.clear();
+        if (configuredAsOff) {
+            platform_.featureFlags.flags[{"AudioAnalytics", "Tracing"}] = false;
+        }
+        // Another flag of that name, and another of that domain.
+        platform_.featureFlags.flags[{"Audio", "Tracing"}] = true;
+        platform_.featureFlags.flags[{"AudioAnalytics", "Trace"}] = true;
+        for (const Dictionary& configuration : kindsOfTrace()) {
+            expectNoTrace(kAudioServiceTypeTest, configuration);
+        }
+    }
+}
+
+TEST_F(SessionTracingTest, ATraceThatMayNotBeStoppedRunsOn) {
+    configure({{HYReportingLoomisPlistFilePath, "/trace.plist"}});
     session_->start();
+    platform_.featureFlags.flags.clear();
     session_->stop();
-    EXPECT_THAT(performance(), IsEmpty());
+    EXPECT_TRUE(session_->startedTracing());
+    EXPECT_THAT(platform_.resultsFiles.files, IsEmpty());
+    EXPECT_EQ(events()[0]->ended, 0);
+
+    platform_.featureFlags.flags[{"AudioAnalytics", "Tracing"}] = true;
+    session_->start();
+    EXPECT_THAT(events(), SizeIs(1)); // It still runs.
+    session_->stop();
+    EXPECT_THAT(platform_.resultsFiles.files, SizeIs(1));
+}
+
+TEST_F(SessionTracingTest, WhatIsSetUpHasNotStarted) {
+    session_->start();
+    ASSERT_TRUE(session_->startedTracing());
+    const std::string fileName = "/trace.plist";
+    session_->setupTracing(&fileName);
     EXPECT_FALSE(session_->startedTracing());
+    EXPECT_THAT(events(), IsEmpty());
+}
+
+TEST_F(SessionTracingTest, ATraceOfASessionThatHasAnotherTypeByThenRunsOn) {
+    session_->start();
+    session_->setServiceType(kAudioServiceTypeGeneric);
+    session_->stop();
+    EXPECT_TRUE(session_->startedTracing());
+    EXPECT_EQ(performance()[0]->stopped, 0);
 }
 
 TEST_F(SessionTracingTest, AStartOfAStartedSessionStartsNoSecondTrace) {
@@ -136,6 +213,49 @@ TEST_F(SessionTracingTest, ATraceThatCannotStartDoesNotHoldUpTheStop) {
     EXPECT_TRUE(
         loggedByTrace(LogLevel::Error, "performanceTraceDidComplete No such file or directory"));
     EXPECT_EQ(session_->getPSTraceFileURL(), "");
+}
+
+// Only the completion ends the wait: an error of the start, or of the stop, does not.
+TEST_F(SessionTracingTest, TheStopOfATraceThatCouldNotStartWaitsForItsCompletion) {
+    platform_.performanceTraces.startError = Error{"posix", 2, "No such file or directory"};
+    completeWhenWaitedFor("", platform_.performanceTraces.startError);
+    session_->start();
+    session_->stop();
+    EXPECT_EQ(waits_, 1);
+    EXPECT_EQ(performance()[0]->stopped, 0);
+}
+
+TEST_F(SessionTracingTest, TheStopOfATraceThatCannotStopWaitsForItsCompletion) {
+    platform_.performanceTraces.stopError = Error{"posix", 5, "Input/output error"};
+    completeWhenWaitedFor("", platform_.performanceTraces.stopError);
+    session_->start();
+    session_->stop();
+    EXPECT_EQ(waits_, 1);
+    EXPECT_EQ(performance()[0]->stopped, 1);
+    EXPECT_FALSE(heldWhileWaiting_);
+}
+
+TEST_F(SessionTracingTest, AStopWaitsForTheCompletionAndTellsSinceWhen) {
+    completeWhenWaitedFor("/traces/two.dat");
+    session_->start();
+    EXPECT_EQ(session_->stopWaitsSince(), std::nullopt);
+    platform_.clock.advance(std::chrono::seconds(5));
+    session_->stop();
+    EXPECT_EQ(waits_, 1);
+    EXPECT_TRUE(heldWhileWaiting_);
+    EXPECT_EQ(waitedSince_, platform_.clock.steadyTime());
+    EXPECT_EQ(session_->stopWaitsSince(), std::nullopt);
+    EXPECT_EQ(session_->getPSTraceFileURL(), "/traces/two.dat");
+}
+
+TEST_F(SessionTracingTest, ATraceThatCompletesWithAnErrorLeavesTheURLOfTheLast) {
+    session_->start();
+    session_->stop();
+    ASSERT_EQ(session_->getPSTraceFileURL(), "/traces/one.dat");
+    session_->performanceTraceDidComplete("/traces/broken.dat", "", Error{"posix", 5, "broken"});
+    EXPECT_EQ(session_->getPSTraceFileURL(), "/traces/one.dat");
+    EXPECT_TRUE(loggedByTrace(LogLevel::Error, "performanceTraceDidComplete broken"));
+    EXPECT_FALSE(loggedByTrace(LogLevel::Info, "Performance Trace Completed: /traces/broken.dat"));
 }
 
 TEST_F(SessionTracingTest, ATraceThatCannotStopDropsItsSession) {
