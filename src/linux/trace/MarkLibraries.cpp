@@ -19,33 +19,29 @@ namespace fs = std::filesystem;
 constexpr const char* kFunction = "evmark_trace";
 constexpr const char* kLibraryPrefix = "libhalyard.so";
 constexpr std::size_t kMostMapBytes = 4 * 1024 * 1024;
+// A file whose tables are longer is no library of ours.
+constexpr std::size_t kMostSections = 1024;
+constexpr std::size_t kMostSegments = 256;
 constexpr std::size_t kMostSymbols = 65536;
+constexpr std::size_t kMostNameBytes = 1024 * 1024;
 
+// Reads the tables of an ELF file that may hold anything: each with one read, and
+// none that is too long or ends behind the file. Borrows the descriptor.
 class ElfFile {
 public:
-    explicit ElfFile(const fs::path& path)
-        : fd_(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY)) {
-        struct stat facts {};
-        valid_ = fd_ >= 0 && ::fstat(fd_, &facts) == 0 && S_ISREG(facts.st_mode) &&
-                 read(0, header_) && std::memcmp(header_.e_ident, ELFMAG, SELFMAG) == 0 &&
-                 header_.e_ident[EI_CLASS] == ELFCLASS64 &&
-                 header_.e_shentsize == sizeof(Elf64_Shdr) &&
-                 header_.e_phentsize == sizeof(Elf64_Phdr);
-    }
-    ~ElfFile() {
-        if (fd_ >= 0) {
-            ::close(fd_);
+    explicit ElfFile(int file) : file_(file) {
+        const auto header = table<Elf64_Ehdr>(0, 1, 1);
+        if (!header.empty() && std::memcmp(header[0].e_ident, ELFMAG, SELFMAG) == 0 &&
+            header[0].e_ident[EI_CLASS] == ELFCLASS64 &&
+            header[0].e_shentsize == sizeof(Elf64_Shdr) &&
+            header[0].e_phentsize == sizeof(Elf64_Phdr)) {
+            sections_ = table<Elf64_Shdr>(header[0].e_shoff, header[0].e_shnum, kMostSections);
+            segments_ = table<Elf64_Phdr>(header[0].e_phoff, header[0].e_phnum, kMostSegments);
         }
     }
-    ElfFile(const ElfFile&) = delete;
-    ElfFile& operator=(const ElfFile&) = delete;
 
     std::optional<std::uint64_t> offsetOf(std::string_view function) const {
-        for (std::size_t i = 0; valid_ && i < header_.e_shnum; ++i) {
-            Elf64_Shdr section{};
-            if (!readSection(i, section)) {
-                break;
-            }
+        for (const Elf64_Shdr& section : sections_) {
             if (section.sh_type == SHT_DYNSYM) {
                 return fileOffset(address(section, function));
             }
@@ -54,36 +50,36 @@ public:
     }
 
 private:
-    bool readBytes(std::uint64_t at, void* to, std::size_t size) const {
-        return at <= INT64_MAX &&
-               ::pread(fd_, to, size, static_cast<off_t>(at)) == static_cast<ssize_t>(size);
+    // Empty when it has more entries than `most` or cannot be read as a whole.
+    template <class T>
+    std::vector<T> table(std::uint64_t at, std::uint64_t entries, std::size_t most) const {
+        std::vector<T> read(entries <= most ? entries : 0);
+        const std::size_t size = read.size() * sizeof(T);
+        if (at > INT64_MAX || ::pread(file_, read.data(), size, static_cast<off_t>(at)) !=
+                                  static_cast<ssize_t>(size)) {
+            read.clear();
+        }
+        return read;
     }
-    template <class T> bool read(std::uint64_t at, T& to) const {
-        return readBytes(at, &to, sizeof to);
-    }
-    bool readSection(std::size_t index, Elf64_Shdr& section) const {
-        return read(header_.e_shoff + index * sizeof(Elf64_Shdr), section);
-    }
-    bool nameIs(const Elf64_Shdr& names, std::uint64_t at, std::string_view expected) const {
-        char name[64];
-        return expected.size() < sizeof name && at < names.sh_size &&
-               readBytes(names.sh_offset + at, name, expected.size() + 1) &&
-               name[expected.size()] == '\0' && std::string_view(name, expected.size()) == expected;
+    // The text that begins there; none when the names end before it does.
+    static std::optional<std::string_view> nameAt(const std::vector<char>& names,
+                                                  std::uint64_t at) {
+        const auto begin =
+            names.begin() + static_cast<std::ptrdiff_t>(std::min<std::uint64_t>(at, names.size()));
+        const auto end = std::find(begin, names.end(), '\0');
+        return end != names.end() ? std::optional(std::string_view(begin, end)) : std::nullopt;
     }
 
     std::optional<std::uint64_t> address(const Elf64_Shdr& symbols,
                                          std::string_view function) const {
-        Elf64_Shdr names{};
-        if (!readSection(symbols.sh_link, names)) {
+        if (symbols.sh_link >= sections_.size()) {
             return std::nullopt;
         }
-        const std::size_t count = std::min(symbols.sh_size / sizeof(Elf64_Sym), kMostSymbols);
-        for (std::size_t i = 0; i < count; ++i) {
-            Elf64_Sym symbol{};
-            if (!read(symbols.sh_offset + i * sizeof symbol, symbol)) {
-                break;
-            }
-            if (symbol.st_shndx != SHN_UNDEF && nameIs(names, symbol.st_name, function)) {
+        const Elf64_Shdr& section = sections_[symbols.sh_link];
+        const auto names = table<char>(section.sh_offset, section.sh_size, kMostNameBytes);
+        for (const Elf64_Sym& symbol : table<Elf64_Sym>(
+                 symbols.sh_offset, symbols.sh_size / sizeof(Elf64_Sym), kMostSymbols)) {
+            if (symbol.st_shndx != SHN_UNDEF && nameAt(names, symbol.st_name) == function) {
                 return symbol.st_value;
             }
         }
@@ -91,12 +87,8 @@ private:
     }
 
     std::optional<std::uint64_t> fileOffset(std::optional<std::uint64_t> address) const {
-        for (std::size_t i = 0; address && i < header_.e_phnum; ++i) {
-            Elf64_Phdr segment{};
-            if (!read(header_.e_phoff + i * sizeof segment, segment)) {
-                break;
-            }
-            if (segment.p_type == PT_LOAD && *address >= segment.p_vaddr &&
+        for (const Elf64_Phdr& segment : segments_) {
+            if (address && segment.p_type == PT_LOAD && *address >= segment.p_vaddr &&
                 *address - segment.p_vaddr < segment.p_filesz) {
                 return *address - segment.p_vaddr + segment.p_offset;
             }
@@ -104,13 +96,16 @@ private:
         return std::nullopt;
     }
 
-    const int fd_;
-    bool valid_ = false;
-    Elf64_Ehdr header_{};
+    const int file_;
+    std::vector<Elf64_Shdr> sections_;
+    std::vector<Elf64_Phdr> segments_;
 };
 
 // The path of a line of /proc/PID/maps that maps code of our library.
 std::optional<std::string> libraryPath(const std::string& line) {
+    if (line.find(kLibraryPrefix) == std::string::npos) {
+        return std::nullopt; // There may be tens of thousands.
+    }
     std::istringstream fields(line);
     std::string range, permissions, offset, device, inode, path;
     fields >> range >> permissions >> offset >> device >> inode >> path;
@@ -125,30 +120,52 @@ std::optional<std::string> libraryPath(const std::string& line) {
     return path;
 }
 
-using FileKey = std::pair<std::uint64_t, std::uint64_t>;
-
-std::optional<FileKey> keyOf(const std::string& path) {
+// Only what is a regular file is opened for reading: others may do something when
+// they are opened. The first look opens nothing, the second opens what it saw.
+std::shared_ptr<OpenLibrary> openLibrary(const std::string& path) {
+    const OpenLibrary seen(::open(path.c_str(), O_PATH | O_CLOEXEC));
     struct stat facts {};
-    if (::stat(path.c_str(), &facts) != 0) {
-        return std::nullopt;
+    if (seen.descriptor() < 0 || ::fstat(seen.descriptor(), &facts) != 0 ||
+        !S_ISREG(facts.st_mode)) {
+        return nullptr;
     }
-    return FileKey{facts.st_dev, facts.st_ino};
+    auto file = std::make_shared<OpenLibrary>(
+        ::open(seen.path().c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+    return file->descriptor() >= 0 ? file : nullptr;
 }
 
 } // namespace
 
-std::optional<std::uint64_t> functionOffset(const fs::path& library, std::string_view function) {
-    return ElfFile(library).offsetOf(function);
+OpenLibrary::~OpenLibrary() {
+    if (descriptor_ >= 0) {
+        ::close(descriptor_);
+    }
 }
 
+std::string OpenLibrary::path() const {
+    return fmt::format("/proc/self/fd/{}", descriptor_);
+}
+
+std::optional<std::uint64_t> functionOffset(const fs::path& library, std::string_view function) {
+    const auto file = openLibrary(library);
+    return file ? ElfFile(file->descriptor()).offsetOf(function) : std::nullopt;
+}
+
+// What a client maps is its own to choose, and so are the bounds that it meets
+// first: so many paths of one process are looked at, and each look reads a bounded
+// number of bytes. A process that has gone is forgotten, so that those who come and
+// go use nothing up. What all of them together can use up are the probes.
 std::vector<MarkLibraries::Library>
 MarkLibraries::newLibrariesOf(const std::vector<std::int32_t>& pids) {
     std::vector<Library> found;
+    std::set<std::int32_t> present;
     for (const std::int32_t pid : pids) {
-        if (seenProcesses_.size() < kMostProcesses && seenProcesses_.insert(pid).second) {
+        if (present.size() < kMostProcesses && present.insert(pid).second &&
+            !seenProcesses_.contains(pid)) {
             addLibrariesOf(pid, found);
         }
     }
+    seenProcesses_ = std::move(present);
     return found;
 }
 
@@ -156,21 +173,30 @@ void MarkLibraries::addLibrariesOf(std::int32_t pid, std::vector<Library>& found
     const auto maps = readSmallFile(fmt::format("/proc/{}/maps", pid), kMostMapBytes);
     const auto* const text = std::get_if<std::string>(&maps);
     std::istringstream lines(text != nullptr ? *text : std::string());
-    for (std::string line; std::getline(lines, line);) {
+    std::set<std::string> paths;
+    for (std::string line; paths.size() < kMostOfProcess && std::getline(lines, line);) {
         const auto path = libraryPath(line);
-        if (!path) {
-            continue;
+        if (path && paths.insert(*path).second) {
+            addLibrary(pid, *path, found);
         }
-        // A process may live in another root than ours.
-        const std::string theirs = fmt::format("/proc/{}/root{}", pid, *path);
-        const auto key = keyOf(theirs);
-        if (!key || seenFiles_.size() >= kMostLibraries || !seenFiles_.insert(*key).second) {
-            continue;
-        }
-        const std::string& usable = keyOf(*path) == key ? *path : theirs;
-        if (const auto offset = functionOffset(usable, kFunction)) {
-            found.push_back({usable, *offset});
-        }
+    }
+}
+
+void MarkLibraries::addLibrary(std::int32_t pid, const std::string& path,
+                               std::vector<Library>& found) {
+    // A process may live in another root than ours.
+    const auto file = openLibrary(fmt::format("/proc/{}/root{}", pid, path));
+    struct stat facts {};
+    if (!file || ::fstat(file->descriptor(), &facts) != 0) {
+        return;
+    }
+    const std::pair<std::uint64_t, std::uint64_t> key{facts.st_dev, facts.st_ino};
+    if (seenFiles_.size() >= kMostLibraries || seenFiles_.contains(key)) {
+        return;
+    }
+    if (const auto offset = ElfFile(file->descriptor()).offsetOf(kFunction)) {
+        seenFiles_.insert(key);
+        found.push_back({path, *offset, file});
     }
 }
 

@@ -6,6 +6,7 @@
 
 #include <cstdint>
 #include <filesystem>
+#include <memory>
 #include <optional>
 #include <set>
 #include <string>
@@ -19,24 +20,47 @@ namespace halyard::linux_ {
 [[nodiscard]] std::optional<std::uint64_t> functionOffset(const std::filesystem::path& library,
                                                           std::string_view function);
 
+// A file that is held open, by its descriptor.
+class OpenLibrary {
+public:
+    explicit OpenLibrary(int descriptor) : descriptor_(descriptor) {}
+    ~OpenLibrary();
+    OpenLibrary(const OpenLibrary&) = delete;
+    OpenLibrary& operator=(const OpenLibrary&) = delete;
+
+    int descriptor() const { return descriptor_; }
+    // Leads to this file, whatever has become of its name.
+    std::string path() const;
+
+private:
+    const int descriptor_;
+};
+
 class MarkLibraries {
 public:
+    // The offset is one in this very file. Were the kernel given the name, its
+    // owner could put another file there meanwhile, and the kernel would write into
+    // the middle of whatever stands there.
     struct Library {
-        std::string path; // as the kernel can look it up for us
+        std::string name; // for people: the path that the process has it by
         std::uint64_t offset;
+        std::shared_ptr<OpenLibrary> file;
     };
 
-    // More files and more processes are not looked at.
-    static constexpr std::size_t kMostLibraries = 16;
+    // More are left out: libraries of a session, its processes at a time, and paths
+    // of one process.
+    static constexpr std::size_t kMostLibraries = 32;
     static constexpr std::size_t kMostProcesses = 4096;
+    static constexpr std::size_t kMostOfProcess = 4;
 
     // Those that none of the processes asked for before had.
     [[nodiscard]] std::vector<Library> newLibrariesOf(const std::vector<std::int32_t>& pids);
 
 private:
     void addLibrariesOf(std::int32_t pid, std::vector<Library>& found);
+    void addLibrary(std::int32_t pid, const std::string& path, std::vector<Library>& found);
 
-    std::set<std::int32_t> seenProcesses_;
+    std::set<std::int32_t> seenProcesses_;                        // that are still there
     std::set<std::pair<std::uint64_t, std::uint64_t>> seenFiles_; // device and inode
 };
 

@@ -95,6 +95,11 @@ TraceInstance::Failure TraceInstance::create() {
             return failure;
         }
     }
+    // Probes are defined there: that nobody may write to it is no probe's fault.
+    const fs::path definitions = tracefs_ / "uprobe_events";
+    if (const std::errc error = writeTracefs(definitions, "", true); error != std::errc{}) {
+        return {error, definitions.string()};
+    }
     // Helps to tell the process of a thread that has ended; nothing depends on it.
     (void)writeTracefs(directory_ / "options/record-tgid", "1");
     return {};
@@ -108,14 +113,15 @@ TraceInstance::Failure TraceInstance::probe(const MarkLibraries::Library& librar
                                             std::uint32_t first, std::uint32_t last) {
     const std::string probe = fmt::format("mark{}", probes_.size());
     const fs::path definitions = tracefs_ / "uprobe_events";
-    const std::errc error = writeTracefs(definitions,
-                                         fmt::format("p:{}/{} {}:0x{:x} {}\n", name_, probe,
-                                                     library.path, library.offset, kArguments),
-                                         true);
+    const std::errc error =
+        writeTracefs(definitions,
+                     fmt::format("p:{}/{} {}:0x{:x} {}\n", name_, probe, library.file->path(),
+                                 library.offset, kArguments),
+                     true);
     if (error != std::errc{}) {
         return {error, definitions.string()};
     }
-    probes_.push_back(probe);
+    probes_.push_back(probe); // Removed with the others, also when it cannot be used.
     const fs::path event = directory_ / "events" / name_ / probe;
     Failure failure = readFormat(event);
     if (failure.error == std::errc{}) {

@@ -78,7 +78,7 @@ public:
 
 private:
     TraceInstance::Failure open();
-    TraceInstance::Failure probeNewLibraries();
+    void probeNewLibraries();
     void requestStop();
     bool waitForStop();
     void drain();
@@ -93,7 +93,6 @@ private:
     TraceInstance instance_;
     TraceReader reader_; // before its instance goes, its files are closed
     MarkLibraries libraries_;
-    bool probeFailureLogged_ = false;
     std::uint64_t delivered_ = 0;
     std::uint64_t refused_ = 0;
     std::atomic<std::uint64_t> lost_{0};
@@ -107,28 +106,27 @@ private:
 TraceInstance::Failure TracefsSession::open() {
     TraceInstance::Failure failure = instance_.create();
     if (failure.error == std::errc{}) {
-        failure = probeNewLibraries();
-    }
-    if (failure.error == std::errc{}) {
+        probeNewLibraries();
         failure = {reader_.open(), "per_cpu/cpu*/trace_pipe_raw"};
     }
     return failure.error == std::errc{} ? instance_.record() : failure;
 }
 
-TraceInstance::Failure TracefsSession::probeNewLibraries() {
+// The libraries are the clients' own files. One that cannot be probed is its
+// client's loss alone.
+void TracefsSession::probeNewLibraries() {
     std::vector<std::int32_t> pids{::getpid()};
     if (options_.clients) {
         const auto clients = options_.clients();
         pids.insert(pids.end(), clients.begin(), clients.end());
     }
-    TraceInstance::Failure first;
     for (const MarkLibraries::Library& library : libraries_.newLibrariesOf(pids)) {
-        TraceInstance::Failure failure = instance_.probe(library, first_, last_);
-        if (failure.error != std::errc{} && first.error == std::errc{}) {
-            first = std::move(failure);
+        const TraceInstance::Failure failure = instance_.probe(library, first_, last_);
+        if (failure.error != std::errc{}) {
+            HY_LOG_ERROR(HYReportingTraceCategory, "a client's library is not traced: {}: {}: {}",
+                         library.name, failure.step, std::make_error_code(failure.error).message());
         }
     }
-    return first;
 }
 
 int TracefsSession::start(std::shared_ptr<platform::SerialQueue> queue) {
@@ -175,11 +173,7 @@ void TracefsSession::drain() {
     for (int drains = 1; !waitForStop(); ++drains) {
         deliver(reader_.read(false));
         if (drains % kDrainsPerSearch == 0) {
-            const TraceInstance::Failure failure = probeNewLibraries();
-            if (failure.error != std::errc{} && !std::exchange(probeFailureLogged_, true)) {
-                HY_LOG_ERROR(HYReportingTraceCategory, "a client's library is not traced: {}: {}",
-                             failure.step, std::make_error_code(failure.error).message());
-            }
+            probeNewLibraries();
         }
     }
     finish();

@@ -1,12 +1,16 @@
 // Needs tracefs and the right to write there, and is skipped elsewhere.
 #include "linux/trace/TracefsEventTrace.h"
 
+#include <csignal>
 #include <dlfcn.h>
+#include <elf.h>
+#include <fcntl.h>
 #include <fmt/format.h>
 #include <fstream>
 #include <future>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/mman.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <thread>
@@ -69,6 +73,59 @@ std::vector<std::string> ourTraces() {
     }
     return names;
 }
+
+std::string libraryBytes() {
+    std::ifstream file(HALYARD_LIBRARY, std::ios::binary);
+    return {std::istreambuf_iterator<char>(file), {}};
+}
+
+// A library whose function begins with the instruction that probes are made of,
+// which no kernel takes.
+std::string unprobeableBytes() {
+    std::string bytes = libraryBytes();
+    bytes.at(functionOffset(HALYARD_LIBRARY, "evmark_trace").value()) = '\xCC';
+    return bytes;
+}
+
+// Maps a file as code, as a process has its libraries.
+class MappedCode {
+public:
+    explicit MappedCode(const fs::path& path) {
+        const int file = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
+        at_ = ::mmap(nullptr, kSize, PROT_READ | PROT_EXEC, MAP_PRIVATE, file, 0);
+        ::close(file);
+    }
+    ~MappedCode() { ::munmap(at_, kSize); }
+    MappedCode(const MappedCode&) = delete;
+    MappedCode& operator=(const MappedCode&) = delete;
+
+private:
+    static constexpr std::size_t kSize = 1024 * 1024; // all of it
+    void* at_;
+};
+
+// Another process, with what this one has mapped by then.
+class Child {
+public:
+    Child() : pid_(::fork()) {
+        if (pid_ == 0) {
+            for (;;) {
+                ::pause();
+            }
+        }
+    }
+    ~Child() {
+        ::kill(pid_, SIGKILL);
+        ::waitpid(pid_, nullptr, 0);
+    }
+    Child(const Child&) = delete;
+    Child& operator=(const Child&) = delete;
+
+    ::pid_t pid() const { return pid_; }
+
+private:
+    const ::pid_t pid_;
+};
 
 class TracefsEventTraceTest : public ::testing::Test {
 protected:
@@ -192,6 +249,49 @@ TEST_F(TracefsEventTraceTest, EventsBeyondTheBoundAreCountedAsLost) {
                     lost)));
 }
 
+TEST_F(TracefsEventTraceTest, ALibraryThatCannotBeProbedIsLeftOutAndTheOthersAreTraced) {
+    const halyard::testing::TempTree tree;
+    const fs::path bad = tree.write("libhalyard.so.bad", unprobeableBytes());
+    const MappedCode mapped(bad);
+    TracefsEventTrace facility({});
+    const auto traced = start(facility);
+    mark_(kFirst, 7, 0, 0, 0);
+    traced->end();
+    EXPECT_THAT(traced->points, ElementsAre(Field(&trace_point::arg1, 7)));
+    EXPECT_THAT(platform_.log.texts(LogLevel::Error),
+                ElementsAre(AllOf(HasSubstr("a client's library is not traced: "),
+                                  HasSubstr(bad.string()))));
+    traced->session.reset();
+    EXPECT_THAT(ourTraces(), IsEmpty());
+}
+
+TEST_F(TracefsEventTraceTest, LibrariesFoundAfterTheStartAreTracedButForThoseThatCannotBe) {
+    const halyard::testing::TempTree tree;
+    const fs::path good = tree.write("libhalyard.so.good", libraryBytes());
+    std::atomic<::pid_t> client{0};
+    TracefsEventTrace facility({kTracefs, [&] { return std::vector<std::int32_t>{client}; }});
+    const auto traced = start(facility);
+    const MappedCode bad(tree.write("libhalyard.so.bad", unprobeableBytes()));
+    void* const library = ::dlopen(good.c_str(), RTLD_NOW | RTLD_LOCAL);
+    ASSERT_NE(library, nullptr) << ::dlerror();
+    const auto mark = reinterpret_cast<Mark>(::dlsym(library, "evmark_trace"));
+    const Child child;
+    client = child.pid();
+    const auto probes = [] {
+        std::ifstream file(std::string(kTracefs) + "/uprobe_profile");
+        return std::count(std::istreambuf_iterator<char>(file), {}, '\n');
+    };
+    const auto before = probes();
+    while (probes() < before + 2) { // ctest's limit ends a wait in vain
+        std::this_thread::yield();
+    }
+    mark(kFirst, 9, 0, 0, 0); // whichever comes first
+    traced->end();
+    EXPECT_THAT(traced->points, ElementsAre(Field(&trace_point::arg1, 9)));
+    EXPECT_THAT(platform_.log.texts(LogLevel::Error),
+                ElementsAre(HasSubstr("libhalyard.so.bad: ")));
+}
+
 TEST_F(TracefsEventTraceTest, NothingStaysInTheKernel) {
     TracefsEventTrace facility({});
     const auto ended = start(facility);
@@ -214,10 +314,10 @@ TEST_F(TracefsEventTraceTest, WhatAKilledDaemonLeftIsRemoved) {
     const fs::path instance = fs::path(kTracefs) / "instances" / name;
     const auto libraries = MarkLibraries().newLibrariesOf({::getpid()});
     ASSERT_THAT(libraries, SizeIs(1));
-    ASSERT_EQ(writeTracefs(fs::path(kTracefs) / "uprobe_events",
-                           fmt::format("p:{}/mark0 {}:0x{:x}\n", name, libraries[0].path,
-                                       libraries[0].offset),
-                           true),
+    ASSERT_EQ(writeTracefs(
+                  fs::path(kTracefs) / "uprobe_events",
+                  fmt::format("p:{}/mark0 {}:0x{:x}\n", name, HALYARD_LIBRARY, libraries[0].offset),
+                  true),
               std::errc{});
     ASSERT_EQ(::mkdir(instance.c_str(), 0700), 0);
     ASSERT_EQ(writeTracefs(instance / "events" / name / "mark0/enable", "1"), std::errc{});
@@ -259,8 +359,9 @@ TEST(MarkLibrariesTest, FindsTheFunctionInTheLibraryAndOnlyOnce) {
     MarkLibraries libraries;
     const auto found = libraries.newLibrariesOf({::getpid()});
     ASSERT_THAT(found, SizeIs(1));
-    EXPECT_EQ(fs::canonical(found[0].path), fs::canonical(HALYARD_LIBRARY));
-    std::ifstream file(found[0].path, std::ios::binary);
+    EXPECT_EQ(fs::canonical(found[0].name), fs::canonical(HALYARD_LIBRARY));
+    EXPECT_TRUE(fs::equivalent(found[0].file->path(), HALYARD_LIBRARY));
+    std::ifstream file(found[0].name, std::ios::binary);
     file.seekg(static_cast<std::streamoff>(found[0].offset));
     char begin[4];
     file.read(begin, sizeof begin);
@@ -275,6 +376,76 @@ TEST(MarkLibrariesTest, FilesThatAreNoSuchLibraryHaveNoOffset) {
     EXPECT_EQ(functionOffset(tree.write("text", "no library"), "evmark_trace"), std::nullopt);
     EXPECT_EQ(functionOffset(HALYARD_LIBRARY, "evmark_trac"), std::nullopt);
     EXPECT_EQ(functionOffset(HALYARD_LIBRARY, std::string(100, 'e')), std::nullopt);
+}
+
+TEST(MarkLibrariesTest, FurtherPathsOfOneProcessAreNotLookedAt) {
+    ASSERT_NE(markFunction(), nullptr) << ::dlerror();
+    const halyard::testing::TempTree tree;
+    std::vector<std::unique_ptr<MappedCode>> copies;
+    for (std::size_t i = 0; i < MarkLibraries::kMostLibraries * 2; ++i) {
+        const auto copy = tree.write(fmt::format("libhalyard.so.{}", i), libraryBytes());
+        copies.push_back(std::make_unique<MappedCode>(copy));
+        copies.push_back(std::make_unique<MappedCode>(copy));
+    }
+    const Child hostile;
+    copies.clear();
+    MarkLibraries libraries;
+    EXPECT_THAT(libraries.newLibrariesOf({hostile.pid()}), SizeIs(MarkLibraries::kMostOfProcess));
+    EXPECT_THAT(libraries.newLibrariesOf({hostile.pid(), ::getpid()}), SizeIs(1));
+}
+
+TEST(MarkLibrariesTest, AProcessThatHasGoneIsForgotten) {
+    ASSERT_NE(markFunction(), nullptr) << ::dlerror();
+    const halyard::testing::TempTree tree;
+    MarkLibraries libraries;
+    EXPECT_THAT(libraries.newLibrariesOf({::getpid()}), SizeIs(1));
+    const MappedCode copy(tree.write("libhalyard.so.1", libraryBytes()));
+    EXPECT_THAT(libraries.newLibrariesOf({::getpid()}), IsEmpty()); // was looked at
+    EXPECT_THAT(libraries.newLibrariesOf({}), IsEmpty());
+    EXPECT_THAT(libraries.newLibrariesOf({::getpid()}), SizeIs(1)); // is another by that number
+}
+
+TEST(MarkLibrariesTest, ALibraryIsHeldWhateverBecomesOfItsName) {
+    const halyard::testing::TempTree tree;
+    const fs::path path = tree.write("libhalyard.so.1", libraryBytes());
+    const MappedCode copy(path);
+    const auto found = MarkLibraries().newLibrariesOf({::getpid()});
+    ASSERT_FALSE(found.empty());
+    const auto file = found.back().file;
+    fs::remove(path);
+    tree.write("libhalyard.so.1", "another file");
+    EXPECT_EQ(functionOffset(file->path(), "evmark_trace"),
+              functionOffset(HALYARD_LIBRARY, "evmark_trace"));
+}
+
+TEST(MarkLibrariesTest, OnlyRegularFilesAreRead) {
+    const halyard::testing::TempTree tree;
+    const fs::path pipe = tree / "pipe";
+    ASSERT_EQ(::mkfifo(pipe.c_str(), 0600), 0);
+    const int writer = ::open(pipe.c_str(), O_RDWR | O_NONBLOCK | O_CLOEXEC);
+    EXPECT_EQ(functionOffset(pipe, "evmark_trace"), std::nullopt);
+    ::close(writer);
+    EXPECT_EQ(functionOffset("/dev/null", "evmark_trace"), std::nullopt);
+}
+
+// Tables of absurd lengths and places, whatever the rest says.
+TEST(MarkLibrariesTest, ALibraryWithAbsurdTablesIsHarmless) {
+    const halyard::testing::TempTree tree;
+    const auto offsetWith = [&](auto change) {
+        std::string bytes = libraryBytes();
+        Elf64_Ehdr header;
+        std::memcpy(&header, bytes.data(), sizeof header);
+        change(header);
+        std::memcpy(bytes.data(), &header, sizeof header);
+        return functionOffset(tree.write("absurd", bytes), "evmark_trace");
+    };
+    EXPECT_NE(offsetWith([](Elf64_Ehdr&) {}), std::nullopt);
+    EXPECT_EQ(offsetWith([](Elf64_Ehdr& header) { header.e_shnum = 65535; }), std::nullopt);
+    EXPECT_EQ(offsetWith([](Elf64_Ehdr& header) { header.e_phnum = 65535; }), std::nullopt);
+    EXPECT_EQ(offsetWith([](Elf64_Ehdr& header) { header.e_shoff = UINT64_MAX; }), std::nullopt);
+    EXPECT_EQ(offsetWith([](Elf64_Ehdr& header) { header.e_phoff = UINT64_MAX; }), std::nullopt);
+    EXPECT_EQ(offsetWith([](Elf64_Ehdr& header) { header.e_ident[EI_CLASS] = ELFCLASS32; }),
+              std::nullopt);
 }
 
 // Whatever a client maps under our name may be damaged.
