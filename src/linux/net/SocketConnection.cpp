@@ -114,33 +114,34 @@ bool SocketConnection::mayRead() const {
            !shared_.pressure.isOn();
 }
 
+bool SocketConnection::pausesReading() {
+    if (mayRead()) {
+        return false;
+    }
+    paused_.store(true);
+    if (!mayRead()) {
+        return true; // workDone(), writeSome() or the pressure's end calls again.
+    }
+    paused_.store(false);
+    return false;
+}
+
+// Frames may wait in pending_ that came in whole and were not taken. Nothing
+// more has to come from the peer then, so the socket must not be waited for.
 void SocketConnection::readIfAllowed() {
     if (ended_ || waiting_) {
         return;
     }
-    if (!mayRead()) {
-        paused_.store(true);
-        if (!mayRead()) {
-            return; // workDone(), writeSome() or the pressure's end calls again.
+    while (!pausesReading()) {
+        if (!framesWait_) {
+            peerFinished_ ? end(Ending::Closed) : waitReadable();
+            return;
         }
-        paused_.store(false);
-    }
-    if (!pending_.empty()) {
-        const std::size_t taken = takeFrames(pending_);
+        pending_.erase(0, takeFrames(pending_));
         if (ended_) {
             return;
         }
-        pending_.erase(0, taken);
-        if (!mayRead()) {
-            readIfAllowed();
-            return;
-        }
     }
-    if (peerFinished_) {
-        end(Ending::Closed);
-        return;
-    }
-    waitReadable();
 }
 
 void SocketConnection::waitReadable() {
@@ -188,7 +189,12 @@ std::size_t SocketConnection::takeFrames(std::string_view stream) {
     const ChargeScope scope(charge);
     const WakeUpScope wakeUps; // Once for all requests of the read.
     std::size_t taken = 0;
-    while (taken < stream.size() && !ended_ && mayRead()) {
+    framesWait_ = false;
+    while (taken < stream.size() && !ended_) {
+        if (!mayRead()) {
+            framesWait_ = true;
+            break;
+        }
         const std::string_view rest = stream.substr(taken);
         const auto outcome = scanner_.scan(rest);
         if (outcome == FrameScanner::Outcome::Incomplete) {

@@ -91,6 +91,8 @@ private:
     enum class Ending { Closed, Broken };
 
     bool mayRead() const;
+    // Whether it may not; then somebody calls readIfAllowed() once it may again.
+    bool pausesReading();
     void waitReadable();
     void readAvailable();
     // Takes the frames at the front of `stream`; returns how many bytes they had.
@@ -111,7 +113,8 @@ private:
     std::function<void()> invalidationHandler_;
 
     protocol::FrameScanner scanner_;
-    std::string pending_; // The bytes of frames that wait to be taken.
+    std::string pending_;     // The bytes of frames that wait to be taken.
+    bool framesWait_ = false; // They do not wait for more bytes.
     bool waiting_ = false;
     bool ended_ = false;
     bool peerFinished_ = false;

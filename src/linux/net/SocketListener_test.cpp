@@ -296,6 +296,21 @@ TEST_F(SocketListenerTest, StopsReadingWhileTooManyBytesAreUnprocessed) {
     EXPECT_GT(delegate_.object->requests.size(), before);
 }
 
+// The work of these is done when they are handed over, so the connection may
+// read again by the time that it looks why it stopped.
+TEST_F(SocketListenerTest, ABurstThatPassesABoundForAMomentIsTakenWhole) {
+    constexpr std::size_t kBurst = 2 * SocketConnection::kMaxUnprocessedRequests + 500;
+    const int client = connect();
+    std::string burst;
+    for (std::size_t i = 0; i < kBurst; ++i) {
+        burst += call(Method::GetAllReporters, {}, std::nullopt);
+    }
+    ASSERT_LT(burst.size(), ListenerShared::kReadSize) << "is to come in one read";
+    ASSERT_EQ(sendSome(client, burst), burst.size());
+
+    EXPECT_EQ(delegate_.object->requests.size(), kBurst);
+}
+
 TEST_F(SocketListenerTest, NobodyIsReadFromUnderPressure) {
     const int client = connect();
     pressure_.set(Pressure::Store, true);
