@@ -1,0 +1,130 @@
+#include "linux/net/SocketConnection.h"
+
+#include <sys/socket.h>
+
+#include "linux/net/ListenerFixture.h"
+
+namespace halyard::linux_ {
+namespace {
+
+using protocol::Method;
+
+class SocketConnectionTest : public ListenerFixture {};
+
+TEST_F(SocketConnectionTest, ABrokenConnectionIsInterruptedThenInvalidated) {
+    const int client = connect();
+    const int other = connect();
+    send(client, "\xc1");
+
+    EXPECT_EQ(receive(client), "closed");
+    EXPECT_EQ(delegate_.events, (std::vector<std::string>{"interrupted", "invalidated"}));
+    EXPECT_EQ(receive(other), "") << "nobody else notices";
+}
+
+TEST_F(SocketConnectionTest, AClientThatLeavesIsInvalidatedOnly) {
+    const int client = connect();
+    ::shutdown(client, SHUT_RDWR);
+    settle();
+
+    EXPECT_EQ(delegate_.events, std::vector<std::string>{"invalidated"});
+}
+
+TEST_F(SocketConnectionTest, WhatWasSentBeforeLeavingIsStillTaken) {
+    const int client = connect();
+    ASSERT_EQ(::send(client, notification().data(), notification().size(), 0),
+              static_cast<ssize_t>(notification().size()));
+    ::shutdown(client, SHUT_WR);
+    settle();
+
+    EXPECT_EQ(delegate_.object->requests.size(), 1u);
+    EXPECT_EQ(delegate_.events, std::vector<std::string>{"invalidated"});
+}
+
+TEST_F(SocketConnectionTest, StopsReadingWhileTooManyRequestsAreUnprocessed) {
+    delegate_.object->holdCharges = true;
+    const int client = connect();
+    std::string many;
+    for (std::size_t i = 0; i < 2 * SocketConnection::kMaxUnprocessedRequests; ++i) {
+        many += notification();
+    }
+    ASSERT_EQ(sendSome(client, many), many.size());
+    EXPECT_EQ(delegate_.object->requests.size(), SocketConnection::kMaxUnprocessedRequests);
+
+    delegate_.object->charges.clear();
+    settle();
+    EXPECT_EQ(delegate_.object->requests.size(), 2 * SocketConnection::kMaxUnprocessedRequests);
+}
+
+TEST_F(SocketConnectionTest, StopsReadingWhileTooManyBytesAreUnprocessed) {
+    delegate_.object->holdCharges = true;
+    const int client = connect();
+    const std::string large = notification(900'000);
+    std::size_t sent = 0;
+    for (std::size_t got = 1; got > 0; sent += got) {
+        got = sendSome(client, std::string_view(large).substr(sent % large.size()));
+    }
+    EXPECT_GE(sent, SocketConnection::kMaxUnprocessedBytes);
+    EXPECT_LT(sent, SocketConnection::kMaxUnprocessedBytes + 4 * large.size());
+    const std::size_t before = delegate_.object->requests.size();
+
+    delegate_.object->charges.clear();
+    settle();
+    send(client, std::string_view(large).substr(sent % large.size()));
+    EXPECT_GT(delegate_.object->requests.size(), before);
+}
+
+// The work of these is done when they are handed over, so the connection may
+// read again by the time that it looks why it stopped.
+TEST_F(SocketConnectionTest, ABurstThatPassesABoundForAMomentIsTakenWhole) {
+    constexpr std::size_t kBurst = 2 * SocketConnection::kMaxUnprocessedRequests + 500;
+    const int client = connect();
+    std::string burst;
+    for (std::size_t i = 0; i < kBurst; ++i) {
+        burst += call(Method::GetAllReporters, {}, std::nullopt);
+    }
+    ASSERT_LT(burst.size(), ListenerShared::kReadSize) << "is to come in one read";
+    ASSERT_EQ(sendSome(client, burst), burst.size());
+
+    EXPECT_EQ(delegate_.object->requests.size(), kBurst);
+}
+
+TEST_F(SocketConnectionTest, NobodyIsReadFromUnderPressure) {
+    const int client = connect();
+    pressure_.set(Pressure::Store, true);
+    ASSERT_GT(sendSome(client, notification()), 0u);
+    EXPECT_TRUE(delegate_.object->requests.empty());
+
+    pressure_.set(Pressure::Store, false);
+    settle();
+    EXPECT_EQ(delegate_.object->requests.size(), 1u);
+}
+
+TEST_F(SocketConnectionTest, APeerThatLeavesItsAnswersLyingIsClosed) {
+    const int client = connect();
+    send(client, call(Method::GetAllReporters) + call(Method::GetAllReporters));
+    auto& requests = delegate_.object->requests;
+    requests[0].reply(std::nullopt, std::string(SocketConnection::kMaxUnsentBytes / 2, 'x'));
+    settle();
+    ASSERT_GT(sendSome(client, notification()), 0u);
+    EXPECT_EQ(requests.size(), 2u) << "it is not read from meanwhile";
+    EXPECT_TRUE(delegate_.events.empty());
+
+    requests[1].reply(std::nullopt, std::string(SocketConnection::kMaxUnsentBytes, 'x'));
+    settle();
+    EXPECT_EQ(delegate_.events, (std::vector<std::string>{"interrupted", "invalidated"}));
+}
+
+TEST_F(SocketConnectionTest, ReadsOnOnceTheAnswersAreTaken) {
+    const int client = connect();
+    send(client, call(Method::GetAllReporters));
+    delegate_.object->requests[0].reply(std::nullopt, std::string(1'000'000, 'x'));
+    settle();
+    ASSERT_GT(sendSome(client, notification()), 0u);
+    while (!receive(client).empty()) {
+        settle();
+    }
+    EXPECT_EQ(delegate_.object->requests.size(), 2u);
+}
+
+} // namespace
+} // namespace halyard::linux_
