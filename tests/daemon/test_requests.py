@@ -3,6 +3,8 @@
 import json
 import unittest
 
+import msgpack
+
 from harness import DaemonTest
 
 
@@ -173,6 +175,18 @@ class Requests(DaemonTest):
             client.notify("sendMessage", {"n": number}, 4, 1, [1])
         payloads = self.rows("SELECT payload FROM upload_message ORDER BY id")
         self.assertEqual([json.loads(row[0])["n"] for row in payloads], list(range(5000)))
+
+    def test_what_a_client_wrote_before_it_left_is_done(self):
+        client = self.connect()
+        client.session(1)
+        requests = [[0, 10 + number, "sendMessage", [{"n": number}, 4, 1, [1]]]
+                    for number in range(4000)]
+        client.raw(b"".join(map(msgpack.packb, requests)))
+        client.close()
+        operator = self.connect()
+        self.daemon.wait_for(lambda: operator.result("admin.status")["connections"] == 1)
+        payloads = self.rows("SELECT payload FROM upload_message WHERE category = 4 ORDER BY id")
+        self.assertEqual([json.loads(row[0])["n"] for row in payloads], list(range(4000)))
 
     def test_kill_service_ends_with_status_2_and_keeps_what_was_accepted(self):
         client = self.connect()

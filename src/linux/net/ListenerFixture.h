@@ -88,22 +88,24 @@ protected:
         settle();
         return fd;
     }
-    void send(int fd, std::string_view bytes) {
-        while (!bytes.empty()) {
-            const ssize_t sent =
-                ::send(fd, bytes.data(), bytes.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
-            if (sent > 0) {
-                bytes.remove_prefix(static_cast<std::size_t>(sent));
-            }
-            settle();
-            ASSERT_TRUE(sent > 0) << "the listener does not read";
-        }
+    // As when the client's process ends.
+    void leave(int fd) {
+        std::erase(clients_, fd);
+        ::close(fd);
+        settle();
     }
     // As much as the socket takes.
     std::size_t sendSome(int fd, std::string_view bytes) {
         const ssize_t sent = ::send(fd, bytes.data(), bytes.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
         settle();
         return sent > 0 ? static_cast<std::size_t>(sent) : 0;
+    }
+    void send(int fd, std::string_view bytes) {
+        while (!bytes.empty()) {
+            const std::size_t sent = sendSome(fd, bytes);
+            ASSERT_GT(sent, 0u) << "the listener does not read";
+            bytes.remove_prefix(sent);
+        }
     }
     // What has been answered; "closed" once the listener has closed.
     std::string receive(int fd) {

@@ -114,6 +114,29 @@ bool SocketConnection::mayRead() const {
            !shared_.pressure.isOn();
 }
 
+// How a connection stops reading and goes on.
+//
+// Whether it may read depends on four things that end on four threads: its
+// charges (on whichever worker lets go of the last one), its unsent answers
+// (here, or where an answer is made), the pressure (the store's thread, the
+// background one). None of them knows how the others stand. So there is one
+// question, mayRead(), that is asked again each time one of them has ended, and
+// never an answer that is kept.
+//
+// What must not happen is that the last one ends between the question and the
+// pause, so that nobody asks again. Hence `paused_` is set first and the question
+// asked a second time: either this sees the end, or who ends it sees `paused_`.
+//
+// Frames that came in whole may be in hand when a bound stops them, up to a read
+// and the frame that was begun before it. The socket is waited for only once
+// these are taken: the peer may be waiting for their answers and send nothing.
+//
+// A peer that left is noticed in two ways. When there is nothing to read any
+// more, the connection ends. When an answer cannot be written, answers are no
+// longer kept, which may be what reading was stopped by; what the peer wrote is
+// read on, under the same bounds, up to the end of it. That end is certain: what
+// can still come is what fits into a socket's buffer, unless the peer is alive
+// and only takes no answers, and then it is one that costs what any other does.
 bool SocketConnection::pausesReading() {
     if (mayRead()) {
         return false;
@@ -126,15 +149,13 @@ bool SocketConnection::pausesReading() {
     return false;
 }
 
-// Frames may wait in pending_ that came in whole and were not taken. Nothing
-// more has to come from the peer then, so the socket must not be waited for.
 void SocketConnection::readIfAllowed() {
     if (ended_ || waiting_) {
         return;
     }
     while (!pausesReading()) {
         if (!framesWait_) {
-            peerFinished_ ? end(Ending::Closed) : waitReadable();
+            peerFinished_ ? end(ending_) : waitReadable();
             return;
         }
         pending_.erase(0, takeFrames(pending_));
@@ -254,46 +275,48 @@ void SocketConnection::refuseCall(const protocol::Call& call, MaybeError error) 
 
 void SocketConnection::send(std::string_view bytes) {
     const MutexLock lock(outMutex_);
-    if (out_.size() > kMaxUnsentBytes) {
-        return; // On its way to being closed.
+    if (deaf_ || out_.size() > kMaxUnsentBytes) {
+        return; // Gone, or on its way to being closed.
     }
     out_ += bytes;
     unsentBytes_.store(out_.size());
     if (out_.size() > kMaxUnsentBytes) {
         asio::post(socket_.get_executor(),
-                   [self = shared_from_this()] { self->breakOff("answers left lying"); });
+                   [self = shared_from_this()] { self->closeUnlessLeft(); });
     } else if (!writeScheduled_) {
         writeScheduled_ = true;
         asio::post(socket_.get_executor(), [self = shared_from_this()] { self->writeSome(); });
     }
 }
 
+SocketConnection::Written SocketConnection::writeOnce() {
+    const MutexLock lock(outMutex_);
+    if (out_.empty()) {
+        return Written::All; // The peer has become deaf meanwhile.
+    }
+    const ssize_t sent =
+        ::send(socket_.native_handle(), out_.data(), out_.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
+    if (sent < 0 && errno != EAGAIN && errno != EINTR) {
+        return Written::Refused;
+    }
+    out_.erase(0, sent > 0 ? static_cast<std::size_t>(sent) : 0);
+    unsentBytes_.store(out_.size());
+    writeScheduled_ = !out_.empty();
+    if (out_.empty()) {
+        dropSpareCapacity(out_);
+    }
+    return out_.empty() ? Written::All : Written::Some;
+}
+
 void SocketConnection::writeSome() {
     if (ended_) {
         return;
     }
-    bool blocked = false;
-    bool failed = false;
-    {
-        const MutexLock lock(outMutex_);
-        const ssize_t sent =
-            ::send(socket_.native_handle(), out_.data(), out_.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
-        if (sent > 0) {
-            out_.erase(0, static_cast<std::size_t>(sent));
-        }
-        failed = sent < 0 && errno != EAGAIN && errno != EINTR;
-        blocked = !out_.empty();
-        writeScheduled_ = blocked;
-        unsentBytes_.store(out_.size());
-        if (!blocked) {
-            dropSpareCapacity(out_);
-        }
-    }
-    if (failed) {
-        end(Ending::Broken);
-        return;
-    }
-    if (blocked) {
+    const Written written = writeOnce();
+    if (written == Written::Refused) {
+        ending_ = Ending::Broken;
+        stopAnswering();
+    } else if (written == Written::Some) {
         socket_.async_wait(asio::socket_base::wait_write,
                            [self = shared_from_this()](const asio::error_code& error) {
                                if (!error) {
@@ -303,6 +326,20 @@ void SocketConnection::writeSome() {
     }
     if (paused_.load()) {
         readIfAllowed();
+    }
+}
+
+void SocketConnection::stopAnswering() {
+    const MutexLock lock(outMutex_);
+    deaf_ = true;
+    out_ = std::string();
+    unsentBytes_.store(0);
+}
+
+void SocketConnection::closeUnlessLeft() {
+    writeSome();
+    if (ending_ != Ending::Broken) {
+        breakOff("answers left lying");
     }
 }
 
@@ -332,6 +369,7 @@ void SocketConnection::end(Ending ending) {
         return;
     }
     const auto self = shared_from_this();
+    stopAnswering();
     asio::error_code ignored;
     socket_.close(ignored);
     shared_.connections.erase(self);

@@ -8,7 +8,9 @@
 //  - while the peer leaves answers lying, and closes when they pass 4 MiB,
 //  - while the whole daemon is under pressure.
 //
-// A peer that breaks the protocol loses this connection and nothing else.
+// A peer that takes no more answers has usually left; what it wrote before is
+// still read and done. One that breaks the protocol loses this connection and
+// nothing else.
 #pragma once
 
 #include <asio/io_context.hpp>
@@ -89,6 +91,7 @@ private:
     class ReadCharge;
     class SocketResponder;
     enum class Ending { Closed, Broken };
+    enum class Written { All, Some, Refused };
 
     bool mayRead() const;
     // Whether it may not; then somebody calls readIfAllowed() once it may again.
@@ -99,7 +102,10 @@ private:
     std::size_t takeFrames(std::string_view stream);
     bool takeFrame(std::string_view frame, const std::shared_ptr<ReadCharge>& charge);
     void refuseCall(const protocol::Call& call, MaybeError error);
-    void writeSome() HY_EXCLUDES(outMutex_);
+    Written writeOnce() HY_EXCLUDES(outMutex_);
+    void writeSome();
+    void stopAnswering() HY_EXCLUDES(outMutex_);
+    void closeUnlessLeft();
     void breakOff(std::string_view why);
     void end(Ending ending);
 
@@ -118,6 +124,7 @@ private:
     bool waiting_ = false;
     bool ended_ = false;
     bool peerFinished_ = false;
+    Ending ending_ = Ending::Closed; // Once all is read that the peer sent.
 
     std::atomic<std::size_t> unprocessedRequests_{0};
     std::atomic<std::size_t> unprocessedBytes_{0};
@@ -126,6 +133,7 @@ private:
     Mutex outMutex_;
     std::string out_ HY_GUARDED_BY(outMutex_);
     bool writeScheduled_ HY_GUARDED_BY(outMutex_) = false;
+    bool deaf_ HY_GUARDED_BY(outMutex_) = false; // The peer takes no more answers.
     std::atomic<std::size_t> unsentBytes_{0};
 };
 

@@ -126,5 +126,83 @@ TEST_F(SocketConnectionTest, ReadsOnOnceTheAnswersAreTaken) {
     EXPECT_EQ(delegate_.object->requests.size(), 2u);
 }
 
+// What a peer writes before it goes away with its answers unread.
+class LeavingPeerTest : public SocketConnectionTest {
+protected:
+    static constexpr std::size_t kWritten = 2500;
+
+    // Answers what has been handed over so far.
+    void answerAll() {
+        for (const protocol::Request& request : delegate_.object->requests) {
+            request.reply(std::nullopt, true);
+        }
+        settle();
+    }
+    // Writes requests, of which as many are taken as may be unprocessed.
+    int connectAndWrite() {
+        delegate_.object->holdCharges = true;
+        const int client = connect();
+        std::string many;
+        for (std::size_t i = 0; i < kWritten; ++i) {
+            many += call(Method::GetAllReporters);
+        }
+        EXPECT_EQ(sendSome(client, many), many.size());
+        EXPECT_EQ(delegate_.object->requests.size(), SocketConnection::kMaxUnprocessedRequests);
+        return client;
+    }
+    void letGoOfCharges() {
+        while (!delegate_.object->charges.empty()) {
+            delegate_.object->charges.clear();
+            settle();
+        }
+    }
+};
+
+TEST_F(LeavingPeerTest, AllThatItWroteIsTakenThoughItsAnswersCannotBeWritten) {
+    ::shutdown(connectAndWrite(), SHUT_RDWR);
+    answerAll();
+    EXPECT_TRUE(delegate_.events.empty()) << "it has not been heard to the end";
+
+    letGoOfCharges();
+    EXPECT_EQ(delegate_.object->requests.size(), kWritten);
+    EXPECT_EQ(delegate_.events, (std::vector<std::string>{"interrupted", "invalidated"}));
+}
+
+TEST_F(LeavingPeerTest, AllThatItWroteIsTakenThoughItLeftItsAnswersUnread) {
+    const int client = connectAndWrite();
+    answerAll();
+    leave(client);
+
+    letGoOfCharges();
+    EXPECT_EQ(delegate_.object->requests.size(), kWritten);
+    EXPECT_EQ(delegate_.events, (std::vector<std::string>{"interrupted", "invalidated"}));
+}
+
+TEST_F(LeavingPeerTest, AnswersThatItLeftLyingCountForNothingOnceItIsGone) {
+    const int client = connectAndWrite();
+    const auto& requests = delegate_.object->requests;
+    requests[0].reply(std::nullopt, std::string(1'000'000, 'x'));
+    settle();
+    ::shutdown(client, SHUT_RDWR);
+    requests[1].reply(std::nullopt, std::string(SocketConnection::kMaxUnsentBytes, 'x'));
+
+    letGoOfCharges();
+    EXPECT_EQ(requests.size(), kWritten);
+}
+
+TEST_F(LeavingPeerTest, OneThatOnlyTakesNoAnswersIsHeardUntilItLeaves) {
+    const int client = connect();
+    send(client, call(Method::GetAllReporters));
+    ::shutdown(client, SHUT_RD);
+    answerAll();
+    send(client, notification());
+    EXPECT_EQ(delegate_.object->requests.size(), 2u);
+    EXPECT_TRUE(delegate_.events.empty());
+
+    ::shutdown(client, SHUT_WR);
+    settle();
+    EXPECT_EQ(delegate_.events, (std::vector<std::string>{"interrupted", "invalidated"}));
+}
+
 } // namespace
 } // namespace halyard::linux_
