@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <pthread.h>
 
-#include "linux/queues/PooledSerialQueue.h"
+#include "linux/queues/BlockingSection.h"
 
 namespace halyard::linux_ {
 namespace {
@@ -23,6 +23,7 @@ GuardedReader::~GuardedReader() {
             desk_->left = true;
         }
         desk_->changed.notify_all();
+        const BlockingSection blocking;
         thread_.join();
     }
 }
@@ -96,7 +97,7 @@ std::vector<Reading> GuardedReader::read(std::span<const std::shared_ptr<Channel
             desk_->sources.push_back(sources[place]);
         }
         desk_->changed.notify_all();
-        WakeUpScope::flushCurrent(); // Nobody else has to wait for a source.
+        const BlockingSection blocking;
         const bool inTime = desk_->changed.wait_for(
             lock, patience_, [&] { return desk_->readings.size() == waiting.size(); });
         const std::size_t done = desk_->readings.size();

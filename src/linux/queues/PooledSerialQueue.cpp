@@ -4,6 +4,8 @@
 #include <iterator>
 #include <utility>
 
+#include "linux/queues/BlockingSection.h"
+
 namespace halyard::linux_ {
 namespace {
 
@@ -12,11 +14,6 @@ constexpr std::size_t kKeptCapacity = 16;
 // Tasks after which the queues they submitted to are let go, whatever follows.
 constexpr std::size_t kTasksPerWakeUp = 64;
 
-WakeUpScope*& currentScope() {
-    thread_local WakeUpScope* current = nullptr;
-    return current;
-}
-
 } // namespace
 
 ChargePtr& currentCharge() {
@@ -24,10 +21,15 @@ ChargePtr& currentCharge() {
     return current;
 }
 
-WakeUpScope::WakeUpScope() : outer_(std::exchange(currentScope(), this)) {}
+WakeUpScope*& WakeUpScope::current() {
+    thread_local WakeUpScope* innermost = nullptr;
+    return innermost;
+}
+
+WakeUpScope::WakeUpScope() : outer_(std::exchange(current(), this)) {}
 
 WakeUpScope::~WakeUpScope() {
-    currentScope() = outer_;
+    current() = outer_;
     flush();
 }
 
@@ -38,10 +40,14 @@ void WakeUpScope::flush() {
     queues_.clear();
 }
 
-void WakeUpScope::flushCurrent() {
-    for (WakeUpScope* scope = currentScope(); scope != nullptr; scope = scope->outer_) {
+BlockingSection::BlockingSection() : interrupted_(std::exchange(WakeUpScope::current(), nullptr)) {
+    for (WakeUpScope* scope = interrupted_; scope != nullptr; scope = scope->outer_) {
         scope->flush();
     }
+}
+
+BlockingSection::~BlockingSection() {
+    WakeUpScope::current() = interrupted_;
 }
 
 void PooledSerialQueue::async(platform::Task task) {
@@ -57,8 +63,8 @@ void PooledSerialQueue::asyncAfter(std::chrono::nanoseconds delay, platform::Tas
 void PooledSerialQueue::scheduleLocked() {
     if (!scheduled_ && !suspended_) {
         scheduled_ = true;
-        if (currentScope() != nullptr) {
-            currentScope()->queues_.push_back(shared_from_this());
+        if (WakeUpScope* const scope = WakeUpScope::current()) {
+            scope->queues_.push_back(shared_from_this());
         } else {
             wakeWorker();
         }

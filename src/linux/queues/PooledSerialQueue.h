@@ -22,10 +22,7 @@ class PooledSerialQueue;
 // While one lives, queues that the thread submits to are not run before the
 // scope ends: they find all of what it submitted, where each task by itself
 // would wake a worker that goes back to sleep after it. Scopes may be nested;
-// the innermost counts.
-//
-// A thread that blocks within a scope has to flush it first, as the platform's
-// condition does: it may be waiting for what it has submitted.
+// the innermost counts. A thread that blocks within one opens a BlockingSection.
 class WakeUpScope {
 public:
     WakeUpScope();
@@ -35,11 +32,13 @@ public:
 
     // Lets the queues run now; the scope goes on.
     void flush();
-    // The same for the calling thread's scope, if there is one.
-    static void flushCurrent();
 
 private:
+    friend class BlockingSection;
     friend class PooledSerialQueue;
+
+    // The calling thread's innermost scope; null outside of any.
+    static WakeUpScope*& current();
 
     WakeUpScope* const outer_;
     std::vector<std::shared_ptr<PooledSerialQueue>> queues_;

@@ -8,6 +8,7 @@
 #include <mutex>
 #include <thread>
 
+#include "linux/queues/BlockingSection.h"
 #include "linux/system/LinuxFacts.h"
 
 namespace halyard::linux_ {
@@ -128,6 +129,25 @@ TEST_F(QueuesTest, WhatIsSubmittedInAScopeRunsWhenItEnds) {
     drain();
 
     EXPECT_EQ(ran, 1);
+}
+
+TEST_F(QueuesTest, WhatIsSubmittedRunsAtOnceWhereItsThreadBlocks) {
+    std::promise<void> before;
+    std::promise<void> within;
+    std::atomic<bool> after{false};
+    {
+        const WakeUpScope scope;
+        relayQueue()->async([&] { before.set_value(); });
+        {
+            const BlockingSection blocking;
+            before.get_future().wait();
+            relayQueue()->async([&] { within.set_value(); });
+            within.get_future().wait();
+        }
+        relayQueue()->async([&] { after = true; });
+        EXPECT_FALSE(after) << "the scope goes on behind the section";
+    }
+    drain();
 }
 
 TEST_F(QueuesTest, ATaskMayWaitForWhatItSubmits) {

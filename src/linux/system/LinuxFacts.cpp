@@ -5,7 +5,7 @@
 #include <mutex>
 #include <random>
 
-#include "linux/queues/PooledSerialQueue.h"
+#include "linux/queues/BlockingSection.h"
 
 namespace halyard::linux_ {
 namespace {
@@ -15,7 +15,7 @@ public:
     void lock() override { mutex_.lock(); }
     void unlock() override { mutex_.unlock(); }
     bool waitFor(std::chrono::nanoseconds timeout) override {
-        WakeUpScope::flushCurrent(); // It may be what this thread submitted that signals.
+        const BlockingSection blocking;
         return condition_.wait_for(mutex_, timeout) == std::cv_status::no_timeout;
     }
     void signal() override { condition_.notify_one(); }

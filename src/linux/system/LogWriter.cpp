@@ -19,6 +19,8 @@
 #define SD_JOURNAL_SUPPRESS_LOCATION
 #include <systemd/sd-journal.h>
 
+#include "linux/queues/BlockingSection.h"
+
 namespace halyard::linux_ {
 namespace {
 
@@ -238,6 +240,7 @@ void LogWriter::run(const std::shared_ptr<State>& state, const Output& output) {
 }
 
 void LogWriter::flush() {
+    const BlockingSection blocking;
     std::unique_lock lock(state_->mutex);
     (void)state_->changed.wait_for(lock, kFlushLimit,
                                    [&] { return state_->queued.empty() && !state_->writing; });

@@ -12,6 +12,7 @@
 #include <unistd.h>
 #include <utility>
 
+#include "linux/queues/BlockingSection.h"
 #include "linux/system/SmallFile.h"
 #include "linux/trace/MarkLibraries.h"
 #include "linux/trace/TraceDelivery.h"
@@ -51,6 +52,7 @@ public:
         delivery_->close();
         requestStop();
         if (drainer_.joinable()) {
+            const BlockingSection blocking;
             drainer_.join();
         }
     }
