@@ -35,6 +35,24 @@ public:
     // Runs `first` before anything that is held back, then goes on. False, and
     // `first` is dropped, when the limit ran out before. Any thread.
     [[nodiscard]] virtual bool resume(Task first) = 0;
+
+    // The queue whose task the calling thread is running, innermost; null when it
+    // runs none.
+    static const SerialQueue* current();
+    bool isCurrent() const { return current() == this; }
+
+protected:
+    // Whoever implements a queue keeps one while it runs tasks.
+    class Running {
+    public:
+        explicit Running(const SerialQueue& queue);
+        ~Running();
+        Running(const Running&) = delete;
+        Running& operator=(const Running&) = delete;
+
+    private:
+        const SerialQueue* const outer_;
+    };
 };
 
 class QueueFactory {

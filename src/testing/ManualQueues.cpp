@@ -38,6 +38,7 @@ public:
     }
 
     void run(const platform::Task& task) {
+        const Running running(*this);
         running_ = true;
         task();
         running_ = false;

@@ -111,7 +111,7 @@ bool PooledSerialQueue::resumeWait(std::uint64_t wait, platform::Task first) {
 
 bool PooledSerialQueue::isIdle() const {
     const MutexLock lock(mutex_);
-    return items_.empty() && !scheduled_;
+    return items_.empty() && !scheduled_ && !suspended_;
 }
 
 void PooledSerialQueue::drain() {
@@ -141,6 +141,7 @@ void PooledSerialQueue::drain() {
 
 std::size_t PooledSerialQueue::runUntilSuspended(std::vector<Item>& items) {
     suspendCalled_ = false;
+    const Running running(*this);
     WakeUpScope wakeUps;
     std::size_t ran = 0;
     while (ran < items.size() && !suspendCalled_) {

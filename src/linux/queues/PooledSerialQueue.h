@@ -59,7 +59,7 @@ public:
         HY_EXCLUDES(mutex_);
     bool resume(platform::Task first) override HY_EXCLUDES(mutex_);
 
-    // Nothing runs and nothing waits.
+    // Nothing runs and nothing waits, also not for the end of a suspension.
     bool isIdle() const HY_EXCLUDES(mutex_);
 
 private:
