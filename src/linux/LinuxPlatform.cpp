@@ -4,10 +4,12 @@
 #include <asio/post.hpp>
 #include <csignal>
 #include <cstdlib>
+#include <future>
 #include <systemd/sd-daemon.h>
 #include <unistd.h>
 #include <utility>
 
+#include "linux/queues/BlockingSection.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {
@@ -18,6 +20,8 @@ constexpr const char* kSocketFile = "reporting.sock";
 constexpr const char* kStoreFile = "telemetry.db";
 // Sessions may wait nine seconds for their back ends, the store ten for a disk.
 constexpr std::chrono::seconds kShutdownLimit{25};
+// The same without the store's ten, which it keeps to by itself.
+constexpr std::chrono::seconds kSaveLimit{15};
 
 // What waits for the disk is accepted, and accepted means durable within half a
 // second: these rows take a slow machine less than that.
@@ -76,11 +80,7 @@ LinuxPlatform::LinuxPlatform(Directories directories, platform::TraceMarks& trac
     : directories_(std::move(directories)), stopSignals_(context_, SIGTERM, SIGINT),
       reloadSignals_(context_, SIGHUP), watchdog_(context_), shutdownLimit_(context_),
       log_(LogWriter::defaultOutput()), system_(directories_),
-      configuration_(directories_.configuration), ownProcess_([this] {
-          // The service was asked to die at once; what it accepted need not.
-          (void)store_->store.close();
-          log_.flush();
-      }),
+      configuration_(directories_.configuration), ownProcess_([this] { saveWhatWasAccepted(); }),
       startTime_(system_.clock.steadyTime()) {
     std::signal(SIGPIPE, SIG_IGN);
     platform_.log = &log_;
@@ -225,6 +225,18 @@ void LinuxPlatform::finishShutdown(bool inTime) {
         HY_LOG_ERROR(HYReportingPlatformCategory, "stopping with work left undone");
     }
     context_.stop();
+}
+
+// The service was asked to die at once; what it has answered need not. This runs
+// in the middle of whatever asked: requests behind it are never looked at, and
+// nobody hears of it, so only what came before is waited for.
+void LinuxPlatform::saveWhatWasAccepted() {
+    const BlockingSection blocking;
+    const auto drained = std::make_shared<std::promise<void>>();
+    queues_->drain([drained] { drained->set_value(); });
+    (void)drained->get_future().wait_for(kSaveLimit);
+    (void)store_->store.close();
+    log_.flush();
 }
 
 void LinuxPlatform::flush(std::function<void()> done) {

@@ -58,6 +58,7 @@ private:
     void armWatchdog();
     void beginShutdown();
     void finishShutdown(bool inTime);
+    void saveWhatWasAccepted();
     PeerRights rightsOfPeer(const Peer& peer) const;
 
     const Directories directories_;

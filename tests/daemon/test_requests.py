@@ -190,11 +190,21 @@ class Requests(DaemonTest):
 
     def test_kill_service_ends_with_status_2_and_keeps_what_was_accepted(self):
         client = self.connect()
+        client.result("sendMessage", {"single": True}, 4, 1, None)  # waits for its second
         client.session(1)
-        client.result("sendMessage", {"a": 1}, 4, 1, [1])
-        client.notify("killService")
+        for number in range(100):
+            client.notify("sendMessage", {"n": number}, 4, 1, [1])
+        client.result("sendMessage", {"n": 100}, 4, 1, [1])
+        killed = client.start("killService")
         self.assertEqual(self.daemon.process.wait(60), 2)
+
+        self.assertTrue(client.closed())
+        self.assertNotIn(killed, client.answers)
         self.assertIn("DESTROYING SERVICE", self.daemon.log())
+        rows = self.daemon.rows("SELECT payload FROM upload_message WHERE category = 4 ORDER BY id")
+        messages = [json.loads(row[0]) for row in rows]
+        self.assertEqual([each["n"] for each in messages if "n" in each], list(range(101)))
+        self.assertEqual([each for each in messages if "single" in each], [{"single": True}])
 
     def test_sigterm_delivers_commits_and_exits_0(self):
         client = self.connect()

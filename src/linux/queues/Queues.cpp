@@ -96,23 +96,26 @@ void Queues::runDelayed(std::list<Delayed>::iterator delayed) {
     delayed_.erase(delayed);
 }
 
-std::vector<std::shared_ptr<PooledSerialQueue>> Queues::busyRelayQueues() {
+std::vector<std::shared_ptr<PooledSerialQueue>>
+Queues::busyRelayQueues(const platform::SerialQueue* except) {
     std::vector<std::shared_ptr<PooledSerialQueue>> busy;
     const MutexLock lock(mutex_);
     for (const auto& weak : relayQueues_) {
-        if (auto queue = weak.lock(); queue != nullptr && !queue->isIdle()) {
+        auto queue = weak.lock();
+        if (queue != nullptr && queue.get() != except && !queue->isIdle()) {
             busy.push_back(std::move(queue));
         }
     }
     return busy;
 }
 
+std::shared_ptr<PooledSerialQueue> Queues::serviceQueue() {
+    const MutexLock lock(mutex_);
+    return serviceQueue_.lock();
+}
+
 void Queues::onServiceQueue(platform::Task task) {
-    std::shared_ptr<PooledSerialQueue> service;
-    {
-        const MutexLock lock(mutex_);
-        service = serviceQueue_.lock();
-    }
+    const auto service = serviceQueue();
     if (service != nullptr) {
         service->async(std::move(task));
     } else {
@@ -120,13 +123,33 @@ void Queues::onServiceQueue(platform::Task task) {
     }
 }
 
+// Draining follows the work down the stairs that it takes: requests on the service
+// queue leave deliveries to the relay queues, these leave single messages to the
+// background queue a second later, and all three leave rows to the store, which is
+// flushed behind. Nothing goes up again, so one pass over the stairs is enough:
+// each is asked for a sign once the one above has given its own.
+//
+// A relay queue gives the sign from behind what it has to do. One that is
+// suspended gives it when its session's back ends have answered or the session's
+// patience is at an end, so draining ends whatever they do. What is submitted
+// meanwhile is not waited for; whoever ends the process sees to it that nothing
+// is, or that it need not be kept.
+//
+// The queue of a task that waits for the draining cannot give a sign. It need not:
+// what came before that task has run.
 void Queues::drain(std::function<void()> done) {
-    onServiceQueue([this, done = std::move(done)] { drainRelayQueues(done); });
+    const platform::SerialQueue* const own = platform::SerialQueue::current();
+    auto next = [this, done = std::move(done), own] { drainRelayQueues(done, own); };
+    if (own != nullptr && own == serviceQueue().get()) {
+        next();
+    } else {
+        onServiceQueue(std::move(next));
+    }
 }
 
-void Queues::drainRelayQueues(std::function<void()> done) {
+void Queues::drainRelayQueues(std::function<void()> done, const platform::SerialQueue* except) {
     const auto last = whenReleased([this, done = std::move(done)] { drainDelayed(done); });
-    for (const auto& queue : busyRelayQueues()) {
+    for (const auto& queue : busyRelayQueues(except)) {
         queue->async([last] {});
     }
 }

@@ -37,6 +37,8 @@ public:
     // Calls `done`, on some worker, once everything submitted before has run:
     // the service queue's tasks, then what they left to the relay queues, then
     // the delayed background tasks, which do not wait for their moment any more.
+    // A task may wait for it, but for one of the background queue: the queue that
+    // it is called on counts as drained.
     void drain(std::function<void()> done);
 
     // Runs a task behind what the service queue has to do now.
@@ -63,8 +65,10 @@ private:
     void after(std::chrono::nanoseconds delay, platform::Task task);
     void runDelayed(std::list<Delayed>::iterator delayed);
     void addDelayed(std::chrono::nanoseconds delay, platform::Task task);
-    std::vector<std::shared_ptr<PooledSerialQueue>> busyRelayQueues() HY_EXCLUDES(mutex_);
-    void drainRelayQueues(std::function<void()> done);
+    std::shared_ptr<PooledSerialQueue> serviceQueue() HY_EXCLUDES(mutex_);
+    std::vector<std::shared_ptr<PooledSerialQueue>>
+    busyRelayQueues(const platform::SerialQueue* except) HY_EXCLUDES(mutex_);
+    void drainRelayQueues(std::function<void()> done, const platform::SerialQueue* except);
     void drainDelayed(std::function<void()> done);
 
     asio::io_context& timers_;

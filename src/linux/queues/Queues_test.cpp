@@ -212,6 +212,55 @@ TEST_F(QueuesTest, DrainingFollowsWorkFromQueueToQueue) {
     EXPECT_TRUE(ran);
 }
 
+TEST_F(QueuesTest, DrainingWaitsForAQueueThatIsSuspended) {
+    const auto relay = relayQueue();
+    std::promise<void> suspended;
+    relay->async([&] {
+        relay->suspend(1h, [] {});
+        suspended.set_value();
+    });
+    suspended.get_future().wait();
+    std::promise<void> drained;
+    bool ran = false;
+    queues_.drain([&] { drained.set_value(); });
+    ASSERT_TRUE(relay->resume([&] { ran = true; }));
+    drained.get_future().wait();
+
+    EXPECT_TRUE(ran);
+}
+
+TEST_F(QueuesTest, ATaskMayWaitForTheDrainingOfWhatCameBeforeIt) {
+    for (const auto priority : {QueuePriority::UserInteractive, QueuePriority::Utility}) {
+        const auto queue = queues_.makeSerialQueue("own", priority);
+        const auto relay = relayQueue();
+        bool delivered = false;
+        std::promise<bool> found;
+        queue->async([&] { relay->async([&] { delivered = true; }); });
+        queue->async([&] {
+            const BlockingSection blocking;
+            drain();
+            found.set_value(delivered);
+        });
+        EXPECT_TRUE(found.get_future().get());
+    }
+}
+
+TEST_F(QueuesTest, AQueueIsCurrentWhereItsTaskRuns) {
+    const auto queue = relayQueue();
+    const auto other = relayQueue();
+    EXPECT_FALSE(queue->isCurrent());
+    bool own = false;
+    bool others = true;
+    queue->async([&] {
+        own = queue->isCurrent();
+        others = other->isCurrent();
+    });
+    drain();
+
+    EXPECT_TRUE(own);
+    EXPECT_FALSE(others);
+}
+
 TEST_F(QueuesTest, TooManyDelayedTasksPutTheDaemonUnderPressure) {
     for (std::size_t i = 1; i < Queues::kDelayedHighWater; ++i) {
         queues_.backgroundQueue().asyncAfter(1h, [] {});

@@ -23,8 +23,8 @@ private:
 // Any thread.
 class ProcOwnProcess final : public platform::OwnProcess {
 public:
-    // `lastWords` writes out what must not be lost. It runs once, on the thread
-    // that calls terminate(), and must come to an end by itself.
+    // `lastWords` saves what must not be lost. It runs once, on the thread that
+    // calls terminate(), and must come to an end by itself.
     explicit ProcOwnProcess(std::function<void()> lastWords, std::filesystem::path root = "/proc");
 
     std::int32_t pid() const override;
