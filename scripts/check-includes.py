@@ -4,7 +4,7 @@
 The tables below are the dependency rule; docs and reviewers quote them. A
 violation is printed as FILE:LINE: text, and the exit code is 1.
 
-usage: check-includes.py [ROOT]        check ROOT/src and ROOT/tools
+usage: check-includes.py [ROOT]        check all that is compiled in ROOT
        check-includes.py --self-test   check the checker
 """
 
@@ -49,11 +49,20 @@ EXTRA = {
 }
 # A unit test (X_test.cpp, and what several of them share) also sees the fakes;
 # nothing but tests sees what they share.
-TEST_FILES = ("_test.cpp", "Fixture.h", "TestSupport.h", "Testing.h")
+TEST_FILES = ("_test.cpp", "_test.c", "Fixture.h", "TestSupport.h", "Testing.h", "Testing.cpp")
 TEST_EXTRA = {"testing"}
-# Programs beside the daemon are clients of it like anybody's: they see libhalyard's
-# public headers. Their tests play the daemon's side.
-TOOLS_TEST_EXTRA = {"common", "protocol", "testing"}
+# What is compiled beside src/, the longest path counts. All of it sees libhalyard's
+# public headers, and a file the headers of its own program.
+PROGRAMS = {
+    "tools": set(),  # clients of the daemon like anybody's
+    "tests": set(),  # strangers
+    "benchmarks": BASE | {"session", "linux/system", "linux/store", "linux/drivers", "testing"},
+    "benchmarks/load": {"common", "protocol", "testing"},  # the whole daemon from outside
+    "benchmarks/trace": set(),
+    "fuzz": BASE | {"sinks", "tracing", "linux/drivers", "linux/config", "testing"},
+}
+# The tests of such a program may play the daemon's side.
+PROGRAM_TEST_EXTRA = {"common", "protocol", "testing"}
 # The client's public headers, included as <halyard/...> or "halyard/...".
 PUBLIC = {"halyard": "client"}
 
@@ -110,8 +119,10 @@ class File:
         self.folder = folder_of(inner) if top == "src" else None
         self.is_core = self.folder in CORE and inner not in EXTRA
         if self.folder is None:
-            self.sees = TOOLS_TEST_EXTRA if self.is_test else set()
+            self.place = max((p for p in PROGRAMS if path.startswith(p + "/")), key=len)
+            self.sees = PROGRAMS[self.place] | (PROGRAM_TEST_EXTRA if self.is_test else set())
         else:
+            self.place = self.folder
             self.sees = FOLDERS[self.folder] | {self.folder} | EXTRA.get(inner, set())
             self.sees |= TEST_EXTRA if self.is_test else set()
 
@@ -124,12 +135,10 @@ class File:
             first = PUBLIC[first]
             quoted = True
         if quoted:
-            if self.folder is None and first is None:
-                return None  # a program's own header
-            if first not in FOLDERS:
-                return None if self.folder is None else f'write "{name}" from src/ on'
-            if first not in self.sees:
-                return f"{self.folder or 'tools'} does not see {first}"
+            if self.folder is not None and first not in FOLDERS:
+                return f'write "{name}" from src/ on'
+            if first in FOLDERS and first not in self.sees:
+                return f"{self.place} does not see {first}"
             if name.endswith(TEST_FILES) and not self.is_test:
                 return f"{name} is for tests"
             return None
@@ -184,11 +193,11 @@ def circles():
 
 
 def sources(root):
-    for top in ("src", "tools"):
+    for top in sorted({"src"} | {place.split("/")[0] for place in PROGRAMS}):
         for folder, subfolders, names in os.walk(os.path.join(root, top)):
             subfolders.sort()
             for name in sorted(names):
-                if name.endswith((".h", ".cpp", ".c")):
+                if name.endswith((".h", ".hpp", ".cpp", ".c")):
                     yield os.path.relpath(os.path.join(folder, name), root)
 
 
@@ -220,6 +229,12 @@ ALLOWED = {
     "src/client/A.cpp": '#include <halyard/halyard.h>\n#include "protocol/Wire.h"\n',
     "src/tracing/A.cpp": 'const char* text = "sleep(1)"; /* now() */\nint asleep(int);\n',
     "tools/ctl/A.cpp": '#include "Table.h"\n#include "halyard/halyard.hpp"\n#include <unistd.h>\n',
+    "benchmarks/a_benchmark.cpp": '#include "session/A.h"\n#include "testing/Tree.h"\n',
+    "benchmarks/load/A.cpp": '#include "load/Daemon.h"\n#include "protocol/Wire.h"\n',
+    "fuzz/a_fuzz.cpp": '#include "Require.h"\n#include "linux/config/Settings.h"\n',
+    "tests/a/A.cpp": '#include "Sound.h"\n#include <halyard/halyard.h>\n',
+    "src/client/a_test.c": "#include <halyard/halyard.h>\n",
+    "tools/ctl/ATesting.cpp": '#include "ATesting.h"\n#include "testing/Tree.h"\n',
     "tools/ctl/A_test.cpp": '#include "protocol/Wire.h"\n#include "testing/FakeDaemon.h"\n',
 }
 FORBIDDEN = {
@@ -248,6 +263,12 @@ FORBIDDEN = {
     "tools/ctl/B.cpp": '#include "common/Value.h"\n',
     "tools/ctl/C.cpp": '#include "client/Client.h"\n',
     "tools/ctl/D.cpp": '#include "testing/FakeDaemon.h"\n',
+    "benchmarks/a_benchmark.cpp": '#include "linux/net/Server.h"\n',
+    "benchmarks/load/A.cpp": '#include "service/Registry.h"\n',
+    "benchmarks/trace/A.cpp": '#include "common/Json.h"\n',
+    "fuzz/a_fuzz.cpp": '#include "service/Registry.h"\n',
+    "tests/a/A.cpp": '#include "common/Value.h"\n',
+    "tools/ctl/F.cpp": '#include "ATesting.h"\n',
     "tools/ctl/E_test.cpp": '#include "service/Registry.h"\n',
 }
 

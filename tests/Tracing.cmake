@@ -3,7 +3,6 @@
 pkg_check_modules(SNDFILE REQUIRED IMPORTED_TARGET sndfile)
 
 add_executable(traced_work tracing/traced_work.cpp tracing/Sound.cpp)
-target_include_directories(traced_work PRIVATE ${CMAKE_CURRENT_SOURCE_DIR})
 target_link_libraries(traced_work PRIVATE halyard_options halyard Threads::Threads
   PkgConfig::SNDFILE)
 

@@ -1,4 +1,4 @@
-#include "tracing/Sound.h"
+#include "Sound.h"
 
 #include <algorithm>
 #include <cmath>

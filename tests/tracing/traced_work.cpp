@@ -13,8 +13,8 @@
 #include <thread>
 #include <vector>
 
+#include "Sound.h"
 #include "halyard/halyard.h"
-#include "tracing/Sound.h"
 
 namespace {
 

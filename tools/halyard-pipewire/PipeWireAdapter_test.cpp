@@ -8,7 +8,7 @@
 #include <string>
 #include <vector>
 
-#include "PrivatePipeWire.h"
+#include "PipeWireTesting.h"
 #include "StreamTracker.h"
 #include "halyard/halyard.h"
 

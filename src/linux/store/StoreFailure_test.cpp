@@ -7,7 +7,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include "linux/store/StoreFaultyDisk.h"
+#include "linux/store/FaultyDiskTesting.h"
 #include "linux/store/StoreTesting.h"
 
 namespace halyard::linux_ {

@@ -7,6 +7,8 @@
 #include <sys/types.h>
 #include <vector>
 
+#include "testing/TempTree.h"
+
 namespace halyard::testing {
 
 // A child process, killed at the end.
@@ -49,7 +51,7 @@ public:
 private:
     std::filesystem::path log(const std::string& name) const { return folder_ / (name + ".log"); }
 
-    std::filesystem::path folder_;
+    TempTree folder_;
     Child daemon_;
     Child sessionManager_;
 };

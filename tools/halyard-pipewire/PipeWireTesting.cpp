@@ -1,11 +1,9 @@
-#include "PrivatePipeWire.h"
+#include "PipeWireTesting.h"
 
-#include <array>
 #include <csignal>
 #include <cstdint>
 #include <cstdlib>
 #include <fcntl.h>
-#include <fstream>
 #include <spawn.h>
 #include <stdexcept>
 #include <string_view>
@@ -37,11 +35,6 @@ v4l2_monitor.enabled = false
 libcamera_monitor.enabled = false
 default_access.enabled = false
 )";
-
-void write(const fs::path& file, std::string_view text) {
-    fs::create_directories(file.parent_path());
-    std::ofstream(file, std::ios::binary) << text;
-}
 
 void append32(std::string& to, std::uint32_t value) {
     for (int shift = 0; shift < 32; shift += 8) {
@@ -120,18 +113,13 @@ bool PrivatePipeWire::installed() {
 }
 
 PrivatePipeWire::PrivatePipeWire() {
-    std::array<char, 32> folder{"/tmp/halyard-graph-XXXXXX"};
-    if (mkdtemp(folder.data()) == nullptr) {
-        throw std::runtime_error("no temporary folder");
-    }
-    folder_ = folder.data();
-    write(folder_ / "config/pipewire/pipewire.conf.d/sinks.conf", kSinks);
-    write(folder_ / "config/wireplumber/main.lua.d/60-nodbus.lua", kNoDBus);
-    write(folder_ / "config/wireplumber/bluetooth.lua.d/60-off.lua",
-          "bluez_monitor.enabled = false\n");
-    write(folder_ / "silence.wav", silentWave());
+    folder_.write("config/pipewire/pipewire.conf.d/sinks.conf", kSinks);
+    folder_.write("config/wireplumber/main.lua.d/60-nodbus.lua", kNoDBus);
+    folder_.write("config/wireplumber/bluetooth.lua.d/60-off.lua",
+                  "bluez_monitor.enabled = false\n");
+    folder_.write("silence.wav", silentWave());
     for (const char* name : {"XDG_RUNTIME_DIR", "PIPEWIRE_RUNTIME_DIR", "XDG_STATE_HOME"}) {
-        setenv(name, folder_.c_str(), 1);
+        setenv(name, folder_.path().c_str(), 1);
     }
     setenv("XDG_CONFIG_HOME", (folder_ / "config").c_str(), 1);
     for (const char* name : {"PIPEWIRE_REMOTE", "DBUS_SESSION_BUS_ADDRESS", "DISPLAY"}) {
@@ -141,15 +129,13 @@ PrivatePipeWire::PrivatePipeWire() {
 
 PrivatePipeWire::~PrivatePipeWire() {
     stop();
-    std::error_code ignored;
-    fs::remove_all(folder_, ignored);
 }
 
 void PrivatePipeWire::start() {
     daemon_ = Child({"pipewire"}, log("pipewire"));
     // The session manager gives up when it cannot connect at once.
     const std::string ready = "until [ -S pipewire-0 ]; do sleep 0.02; done";
-    run({"sh", "-c", "cd " + folder_.string() + " && " + ready});
+    run({"sh", "-c", "cd " + folder_.path().string() + " && " + ready});
     sessionManager_ = Child({"wireplumber"}, log("wireplumber"));
 }
 
