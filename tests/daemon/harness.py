@@ -6,15 +6,17 @@ HALYARDD names the program.
 
 import os
 import shutil
-import signal
 import socket
 import sqlite3
-import subprocess
+import sys
 import tempfile
 import time
 import unittest
 
 import msgpack
+
+sys.path.append(os.path.join(os.path.dirname(__file__), "..", "..", "scripts"))
+import launcher  # noqa: E402
 
 HALYARDD = os.environ.get("HALYARDD", "build/release/halyardd")
 # How long anything may take on a loaded machine before a test gives up.
@@ -94,42 +96,20 @@ class Client:
         return self.start("startReportingSessionForID", reporter_id) if start else None
 
 
-class Daemon:
-    """One halyardd and its directories."""
+class Daemon(launcher.Launcher):
+    """One halyardd in a temporary directory."""
 
     def __init__(self, configuration=""):
-        self.root = tempfile.mkdtemp(prefix="halyardd-test-")
-        for name in ("configuration", "state", "runtime", "logs"):
-            os.mkdir(os.path.join(self.root, name))
-        self.socket_path = os.path.join(self.root, "runtime", "reporting.sock")
-        self.store_path = os.path.join(self.root, "state", "telemetry.db")
-        self.log_path = os.path.join(self.root, "log")
+        super().__init__(HALYARDD, tempfile.mkdtemp(prefix="halyardd-test-"))
         self.configure(configuration)
-        self.process = None
-
-    def configure(self, text):
-        path = os.path.join(self.root, "configuration", "halyard.toml")
-        with open(path + ".new", "w", encoding="utf-8") as file:
-            file.write(text)
-        os.rename(path + ".new", path)
 
     def run(self):
-        environment = dict(os.environ)
-        for name in ("configuration", "state", "runtime", "logs"):
-            environment[name.upper() + "_DIRECTORY"] = os.path.join(self.root, name)
-        with open(self.log_path, "ab") as log:
-            self.process = subprocess.Popen([HALYARDD], env=environment, stderr=log)
-        self.wait_for(lambda: self._accepts())
-        return self
-
-    def _accepts(self):
-        if self.process.poll() is not None:
-            raise AssertionError("halyardd ended: " + self.log())
+        self.start()
         try:
-            Client(self.socket_path).close()
-            return True
-        except OSError:
-            return False
+            self.wait_until_it_accepts(PATIENCE)
+        except launcher.Ended as error:
+            raise AssertionError(str(error)) from error
+        return self
 
     @staticmethod
     def wait_for(condition):
@@ -142,22 +122,13 @@ class Daemon:
     def client(self):
         return Client(self.socket_path)
 
-    def terminate(self):
-        self.process.send_signal(signal.SIGTERM)
-        return self.process.wait(PATIENCE)
-
-    def kill(self):
-        self.process.kill()
-        self.process.wait()
+    def terminate(self, seconds=PATIENCE):
+        return super().terminate(seconds)
 
     def remove(self):
         if self.process is not None and self.process.poll() is None:
             self.kill()
         shutil.rmtree(self.root, ignore_errors=True)
-
-    def log(self):
-        with open(self.log_path, encoding="utf-8", errors="replace") as file:
-            return file.read()
 
     def rows(self, query, *arguments):
         connection = sqlite3.connect(f"file:{self.store_path}?mode=ro", uri=True, timeout=PATIENCE)

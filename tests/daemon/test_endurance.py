@@ -105,7 +105,7 @@ class SecondDaemon(DaemonTest):
         second = Daemon()
         self.addCleanup(second.remove)
         second.root, kept = self.daemon.root, second.root
-        second.log_path = kept + "/log"
+        second.log_path = kept + "/stderr"
         self.assertRaisesRegex(AssertionError, "another daemon listens", self.run_second, second)
         second.root = kept
         self.assertEqual(self.connect().result("getAllReporters"), [])

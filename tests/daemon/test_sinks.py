@@ -75,7 +75,7 @@ class EverySink(DaemonTest):
                                          for name in glob.glob(report + "/**", recursive=True)])
 
     def test_a_snapshot_that_cannot_be_written_is_counted(self):
-        with open(os.path.join(self.daemon.root, "state", "incidents"), "w", encoding="utf-8"):
+        with open(self.daemon.path("state", "incidents"), "w", encoding="utf-8"):
             pass  # where the folder should be
         self.leak_twice()
         self.assertEqual(self.client.result("admin.status")["incidents"],

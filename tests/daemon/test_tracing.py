@@ -56,7 +56,7 @@ class Tracing(DaemonTest):
     configuration = "[feature_flags.AudioAnalytics]\nTracing = true\n"
 
     def traces(self, name):
-        return os.path.join(self.daemon.root, "logs", "Traces", name)
+        return self.daemon.path("log", "Traces", name)
 
     def read(self, name):
         with open(self.traces(name), encoding="utf-8") as file:
