@@ -60,7 +60,6 @@ public:
 
     bool connected() const { return core_ != nullptr && established_; }
     bool quitting() const { return quitting_; }
-    void setQuitting() { quitting_ = true; }
 
 private:
     void connect();
@@ -334,10 +333,6 @@ void PipeWireAdapter::run() {
 
 void PipeWireAdapter::iterate(std::chrono::milliseconds timeout) {
     impl_->iterate(static_cast<int>(timeout.count()));
-}
-
-void PipeWireAdapter::quit() {
-    impl_->post([impl = impl_.get()] { impl->setQuitting(); });
 }
 
 void PipeWireAdapter::post(std::function<void()> work) {

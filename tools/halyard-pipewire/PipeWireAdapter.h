@@ -5,8 +5,8 @@
 // libpipewire stays behind this header, because its headers need warnings
 // switched off.
 //
-// Threads: everything on the thread that runs the loop, but for quit() and
-// post(), which any thread may call.
+// Threads: everything on the thread that runs the loop, but for post(),
+// which any thread may call.
 #pragma once
 
 #include <chrono>
@@ -39,11 +39,10 @@ public:
     PipeWireAdapter(const PipeWireAdapter&) = delete;
     PipeWireAdapter& operator=(const PipeWireAdapter&) = delete;
 
-    // Runs until quit().
+    // Runs until a signal of quitOnSignal().
     void run();
     // Handles what is due, waiting for `timeout` at most.
     void iterate(std::chrono::milliseconds timeout);
-    void quit();
     // Calls `work` from the loop.
     void post(std::function<void()> work);
     // Quits on this signal. Requires that every thread of the process blocks it.

@@ -3,6 +3,7 @@
 #include "PipeWireAdapter.h"
 
 #include <algorithm>
+#include <csignal>
 #include <gtest/gtest.h>
 #include <map>
 #include <string>
@@ -163,8 +164,13 @@ TEST_F(PipeWireAdapterTest, PostedWorkRunsInTheLoop) {
     EXPECT_TRUE(until([&] { return ran; }));
 }
 
-TEST_F(PipeWireAdapterTest, QuitEndsTheLoop) {
-    adapter_->quit();
+TEST_F(PipeWireAdapterTest, ASignalEndsTheLoop) {
+    sigset_t signals;
+    sigemptyset(&signals);
+    sigaddset(&signals, SIGUSR1);
+    pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+    adapter_->quitOnSignal(SIGUSR1);
+    raise(SIGUSR1); // to this thread, which keeps it for the loop
     adapter_->run();
 }
 

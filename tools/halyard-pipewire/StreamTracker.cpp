@@ -58,13 +58,6 @@ void StreamTracker::handle(const GraphEvent& event) {
     std::visit([this](const auto& what) { on(what); }, event);
 }
 
-std::size_t StreamTracker::openSessions() const {
-    const auto open = std::count_if(nodes_.begin(), nodes_.end(), [](const auto& entry) {
-        return entry.second.session.has_value();
-    });
-    return static_cast<std::size_t>(open);
-}
-
 void StreamTracker::restate() {
     for (auto& [id, node] : nodes_) {
         if (!node.session || !node.session->playing) {

@@ -40,7 +40,6 @@ public:
     // Closes every session, as if all streams had gone.
     void closeAll();
 
-    std::size_t openSessions() const;
     std::uint64_t ignoredObjects() const { return ignoredObjects_; }
 
 private:
