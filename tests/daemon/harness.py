@@ -112,8 +112,8 @@ class Daemon(launcher.Launcher):
         return self
 
     @staticmethod
-    def wait_for(condition):
-        deadline = time.monotonic() + PATIENCE
+    def wait_for(condition, seconds=PATIENCE):
+        deadline = time.monotonic() + seconds
         while not condition():
             if time.monotonic() > deadline:
                 raise AssertionError("this did not come about")

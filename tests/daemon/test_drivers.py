@@ -187,7 +187,7 @@ class ThisMachine(DriversTest):
         client = self.connect()
         self.start(client, 7)
         try:
-            self.daemon.wait_for(self.idle_has_grown(self.idle_time()))
+            self.daemon.wait_for(self.idle_has_grown(self.idle_time()), seconds=10)
         except AssertionError:
             self.skipTest("the processor is never idle")
         client.result("stopReportingSessionForID", 7)
