@@ -135,7 +135,7 @@ std::vector<std::filesystem::path> stateDirectories(const std::filesystem::path&
         const std::string name = entries->path().filename().native();
         unsigned number = 0;
         const char* const end = name.data() + name.size();
-        if (name.starts_with(kPrefix) &&
+        if (name.starts_with(kPrefix) && name.size() > kPrefix.size() &&
             std::from_chars(name.data() + kPrefix.size(), end, number).ptr == end &&
             found.size() < kMaxSourceStates) {
             found.emplace_back(number, entries->path());

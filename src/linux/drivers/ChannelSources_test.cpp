@@ -311,5 +311,62 @@ TEST_F(PcmSourceTest, CountsWhatItsOwnerTriggersAgain) {
     EXPECT_THAT(readAfter(*source, 1s).numbers, ElementsAre(1));
 }
 
+TEST_F(PcmSourceTest, NothingElseIsARestart) {
+    const auto source = make("alsa_restarts:/sub0", own_);
+    status("RUNNING", "500", "504");
+    count(*source);
+    status("PAUSED", "505", "506");
+    EXPECT_EQ(count(*source), 0U);
+    status("RUNNING", "507", "508", 480, 11); // Somebody else's.
+    EXPECT_EQ(count(*source), 0U);
+    status("RUNNING", "509", "510", 480, 11);
+    EXPECT_EQ(count(*source), 1U);
+}
+
+TEST_F(PcmSourceTest, EachXrunCountsOnceAndTheFirstLookIsNone) {
+    const auto source = make("alsa_xruns:/sub0", own_);
+    status("XRUN", "500", "504");
+    EXPECT_EQ(count(*source), 0U);
+    for (const std::uint64_t expected : {1U, 2U}) {
+        status("RUNNING", "505", "506");
+        count(*source);
+        status("XRUN", "507", "508");
+        EXPECT_EQ(count(*source), expected);
+    }
+}
+
+TEST_F(PcmSourceTest, ARestartedStreamHasRunAllTheTime) {
+    status("RUNNING", "500", "504");
+    const auto source = make("alsa_states:/sub0", own_);
+    source->read(now_);
+    status("RUNNING", "506", "507");
+    const Reading reading = readAfter(*source, 3s);
+    EXPECT_EQ(residency(reading, "RUNNING"), 3'000'000U);
+    EXPECT_EQ(transitions(reading, "RUNNING"), 1U);
+}
+
+TEST_F(PcmSourceTest, NoStreamHasRunLongerThanTheTimeBetweenTwoReads) {
+    tree_.write("sub0/status", "closed\n");
+    const auto source = make("alsa_states:/sub0", own_);
+    source->read(now_);
+    status("RUNNING", "500", "600");
+    const Reading late = readAfter(*source, 2s);
+    EXPECT_EQ(residency(late, "RUNNING"), 2'000'000U);
+    EXPECT_EQ(residency(late, "CLOSED"), 0U);
+    status("PAUSED", "601", "602");
+    readAfter(*source, 0s);
+    status("RUNNING", "700", "600"); // Its clock went back.
+    EXPECT_EQ(residency(readAfter(*source, 5s), "PAUSED"), 5'000'000U);
+}
+
+TEST_F(PcmSourceTest, AStateThatNobodyKnowsHasNoResidency) {
+    status("PREPARED", "0", "0");
+    const auto source = make("alsa_states:/sub0", own_);
+    source->read(now_);
+    status("DREAMING", "0", "0");
+    EXPECT_EQ(residency(readAfter(*source, 2s), "PREPARED"), 2'000'000U);
+    EXPECT_EQ(residency(readAfter(*source, 2s), "PREPARED"), 2'000'000U);
+}
+
 } // namespace
 } // namespace halyard::linux_

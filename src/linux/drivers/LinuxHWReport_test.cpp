@@ -313,5 +313,27 @@ TEST_F(LinuxHWReportTest, IterationEndsWhenTheCallerSaysSo) {
     EXPECT_EQ(calls, 1);
 }
 
+TEST_F(LinuxHWReportTest, ChannelsThatDifferInOneNameAreTwo) {
+    DriverChannel driver = channel("A", "file:/a");
+    driver.driver = "Codec";
+    DriverChannel subgroup = channel("A", "file:/a");
+    subgroup.subgroup = "Stats";
+    DriverChannel group = channel("A", "file:/a");
+    group.group = "Rx";
+    auto& all = library({channel("A", "file:/a"), driver, subgroup, group, channel("B", "file:/a"),
+                         channel("A", "file:/b")});
+    EXPECT_EQ(all.getChannelCount(*all.copyChannelsInGroup({}, {}).value), 5);
+}
+
+TEST_F(LinuxHWReportTest, SetsOfTwoSubscriptionsHaveNoDifference) {
+    auto& all = library({channel("A", "file:/a")});
+    subscribe();
+    const auto first = subscribed_;
+    const auto before = sample();
+    subscribe();
+    EXPECT_EQ(all.createSamplesDelta(before.get(), *sample()).error->code, 22);
+    EXPECT_EQ(all.createSamples(first.subscription, subscribed_.channels.get()).error->code, 22);
+}
+
 } // namespace
 } // namespace halyard::linux_

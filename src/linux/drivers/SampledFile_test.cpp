@@ -98,5 +98,16 @@ TEST_F(SampledFileTest, ReadsTheKernelsFilesWhole) {
     }
 }
 
+TEST_F(SampledFileTest, TellsWhatIsAbsentFromWhatIsBroken) {
+    for (const auto error : {std::errc::no_such_file_or_directory, std::errc::no_such_device,
+                             std::errc::no_such_device_or_address, std::errc::not_a_directory}) {
+        EXPECT_TRUE(meansAbsent(error));
+    }
+    for (const auto error : {std::errc{}, std::errc::io_error, std::errc::permission_denied,
+                             std::errc::file_too_large}) {
+        EXPECT_FALSE(meansAbsent(error));
+    }
+}
+
 } // namespace
 } // namespace halyard::linux_

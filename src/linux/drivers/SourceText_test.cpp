@@ -172,5 +172,73 @@ TEST(SourceTextTest, ReadsTheStatusOfAStream) {
     EXPECT_FALSE(parsePcmStatus(""));
 }
 
+TEST(SourceTextTest, BlanksAreSpacesTabsAndReturns) {
+    EXPECT_EQ(parseInteger("\t7\r\n"), 7);
+    EXPECT_EQ(parseField("a\tb  3\r\n", {"a", 3}), 3);
+}
+
+TEST(SourceTextTest, ARowThatIsANumberIsALinesNumber) {
+    EXPECT_EQ(parseField("cpu 5\n1 7\n", {"1", 2}), 5);
+}
+
+TEST(SourceTextTest, PerProcessorCountsAreOneLine) {
+    EXPECT_EQ(parsePerCpuCount("1,2\n9\n"), 3U);
+}
+
+TEST(SourceTextTest, MoreStatesThanAnyDeviceHasAreNone) {
+    std::string times = "\n";
+    std::string header = "From : To\n :";
+    std::string rows;
+    for (std::size_t i = 0; i < kMaxSourceStates; ++i) {
+        times += std::to_string(i) + " 1\n\n";
+        header += " " + std::to_string(i);
+    }
+    EXPECT_EQ(parseTimeInState(times).value().size(), kMaxSourceStates);
+    EXPECT_EQ(parseTimeInState(times + "x 1\n"), std::nullopt);
+    EXPECT_EQ(parseTransitionTable(header + " x\n"), std::nullopt);
+}
+
+TEST(SourceTextTest, ATransitionTableWithTooManyRowsOrTransitionsIsNone) {
+    EXPECT_TRUE(parseTransitionTable("From : To\n : 1\n1: 3\n"));
+    EXPECT_EQ(parseTransitionTable("From : To\n : 1\n1: 3\n1: 3\n"), std::nullopt);
+    EXPECT_EQ(parseTransitionTable("From : To\n : 1 2\n1: 18446744073709551615 0\n2: 1 0\n"),
+              std::nullopt);
+}
+
+TEST(SourceTextTest, TheKeysOfATraceHistogramHaveBounds) {
+    const auto keyed = [](const std::string& key) {
+        return parseTraceHistogram("# event histogram\n{ lat: " + key + " } hitcount: 1\n");
+    };
+    EXPECT_THAT(keyed("~ -10--5"), Optional(ElementsAre(SourceBucket{-10, -5, 1})));
+    EXPECT_THAT(keyed("~ 2^62"), Optional(ElementsAre(SourceBucket{std::int64_t{1} << 61,
+                                                                   std::int64_t{1} << 62, 1})));
+    for (const char* key : {"~ 2^63", "~ 2^-1", "~ 10", "~ a-b", ""}) {
+        EXPECT_EQ(keyed(key), std::nullopt) << key;
+    }
+    EXPECT_EQ(parseTraceHistogram("{ lat: 1 } hitcount: 1\n"), std::nullopt);
+    EXPECT_EQ(parseTraceHistogram("# event histogram\n{ lat: 1 } hitcount: x\n"), std::nullopt);
+}
+
+TEST(SourceTextTest, MoreBucketsThanAnyTraceHistogramHasAreNone) {
+    std::string text = "# event histogram\n";
+    for (std::size_t i = 0; i < kMaxSourceBuckets; ++i) {
+        text += "{ lat: " + std::to_string(i) + " } hitcount: 1\n";
+    }
+    EXPECT_EQ(parseTraceHistogram(text).value().size(), kMaxSourceBuckets);
+    EXPECT_EQ(parseTraceHistogram(text + "{ lat: 5000 } hitcount: 1\n"), std::nullopt);
+}
+
+TEST(SourceTextTest, StampsThatNoClockHasAreNone) {
+    const auto stamp = [](const std::string& text) {
+        return parsePcmStatus("state: RUNNING\ntstamp: " + text + "\n")->stamped;
+    };
+    EXPECT_EQ(stamp("9000000000.000000001"), 9'000'000'000s + 1ns);
+    EXPECT_EQ(stamp("0.000000000"), 0ns);
+    for (const char* text :
+         {"9000000001.000000000", "-1.000000000", "5", "5.12345678x", "x.000000000"}) {
+        EXPECT_EQ(stamp(text), std::nullopt) << text;
+    }
+}
+
 } // namespace
 } // namespace halyard::linux_
