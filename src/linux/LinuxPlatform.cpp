@@ -1,6 +1,5 @@
 #include "linux/LinuxPlatform.h"
 
-#include <array>
 #include <asio/post.hpp>
 #include <csignal>
 #include <cstdlib>
@@ -44,34 +43,6 @@ Dictionary describe(const ListenerCounters& counters) {
                       {"requests", counters.requests.load()},
                       {"bad_requests", counters.badRequests.load()},
                       {"bytes_read", counters.bytesRead.load()}};
-}
-
-// In the order of StoreTable and StoreLoss.
-constexpr std::array<const char*, kStoreTables> kTableNames = {
-    "upload_session", "upload_message", "analytics_event", "energy_event", "metric", "incident"};
-constexpr std::array<const char*, kStoreLosses> kLossNames = {
-    "no_store", "disk_full", "read_only", "locked", "io_error", "stuck", "rejected"};
-
-template <std::size_t Size>
-Dictionary named(const std::array<const char*, Size>& names,
-                 const std::array<std::uint64_t, Size>& counts) {
-    Dictionary result;
-    for (std::size_t i = 0; i < Size; ++i) {
-        result.set(names[i], counts[i]);
-    }
-    return result;
-}
-
-Dictionary describe(const StoreStatus& store) {
-    return Dictionary{{"open", store.open},
-                      {"failing", store.failing},
-                      {"rows", named(kTableNames, store.rows)},
-                      {"lost", named(kLossNames, store.lost)},
-                      {"commits", store.commits},
-                      {"queued_rows", store.queuedRows},
-                      {"queued_bytes", store.queuedBytes},
-                      {"file_bytes", store.fileBytes},
-                      {"log_bytes", store.logBytes}};
 }
 
 } // namespace
@@ -244,7 +215,6 @@ void LinuxPlatform::flush(std::function<void()> done) {
 }
 
 Dictionary LinuxPlatform::status() const {
-    const StoreStatus store = store_->store.status();
     const std::chrono::duration<double> uptime = system_.clock.steadyTime() - startTime_;
     return Dictionary{{"version", HALYARD_VERSION},
                       {"pid", ownProcess_.pid()},
@@ -255,7 +225,7 @@ Dictionary LinuxPlatform::status() const {
                       {"listener", describe(listener_->counters())},
                       {"incidents", Dictionary{{"refused", incidents_->refusedSnapshots()},
                                                {"failed", incidents_->failedSnapshots()}}},
-                      {"store", describe(store)}};
+                      {"store", describe(store_->store.status())}};
 }
 
 } // namespace halyard::linux_

@@ -1,5 +1,6 @@
 #include "linux/store/Store.h"
 
+#include <array>
 #include <condition_variable>
 #include <csignal>
 #include <pthread.h>
@@ -59,7 +60,30 @@ StoreOptions withWatch(StoreOptions options, const std::shared_ptr<StoreEnding>&
     return options;
 }
 
+template <std::size_t Size, class Name>
+Dictionary named(const std::array<std::uint64_t, Size>& counts, Name nameOf) {
+    Dictionary result;
+    for (std::size_t i = 0; i < Size; ++i) {
+        result.set(nameOf(i), counts[i]);
+    }
+    return result;
+}
+
 } // namespace
+
+Dictionary describe(const StoreStatus& store) {
+    const auto table = [](std::size_t i) { return kStoreSchema[i].name; };
+    const auto loss = [](std::size_t i) { return kStoreLossNames[i].inStatus; };
+    return Dictionary{{"open", store.open},
+                      {"failing", store.failing},
+                      {"rows", named(store.rows, table)},
+                      {"lost", named(store.lost, loss)},
+                      {"commits", store.commits},
+                      {"queued_rows", store.queuedRows},
+                      {"queued_bytes", store.queuedBytes},
+                      {"file_bytes", store.fileBytes},
+                      {"log_bytes", store.logBytes}};
+}
 
 Store::Store(StoreOptions options, const platform::Clock& clock)
     : ending_(std::make_shared<StoreEnding>()),

@@ -23,6 +23,9 @@ namespace halyard::linux_ {
 
 struct StoreEnding;
 
+// As admin.status shows it.
+Dictionary describe(const StoreStatus& store);
+
 class Store final {
 public:
     // Opens or creates the file, which may take a moment when it is damaged.

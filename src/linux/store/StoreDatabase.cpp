@@ -1,5 +1,6 @@
 #include "linux/store/StoreDatabase.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <fmt/format.h>
 #include <fstream>
@@ -12,34 +13,16 @@
 namespace halyard::linux_ {
 namespace {
 
-constexpr const char* kSchema = R"(
-CREATE TABLE IF NOT EXISTS upload_session(id INTEGER PRIMARY KEY, session_id INTEGER,
-    session_info TEXT, user_info TEXT, opened REAL, closed REAL);
-CREATE TABLE IF NOT EXISTS upload_message(id INTEGER PRIMARY KEY, upload_session INTEGER,
-    session_info TEXT, user_info TEXT, category INTEGER, type INTEGER, payload TEXT, time REAL);
-CREATE TABLE IF NOT EXISTS analytics_event(id INTEGER PRIMARY KEY, name TEXT, payload TEXT,
-    time REAL);
-CREATE TABLE IF NOT EXISTS energy_event(id INTEGER PRIMARY KEY, client INTEGER, name TEXT,
-    payload TEXT, time REAL);
-CREATE TABLE IF NOT EXISTS metric(id INTEGER PRIMARY KEY, metric_id INTEGER, message BLOB,
-    time REAL);
-CREATE TABLE IF NOT EXISTS incident(id INTEGER PRIMARY KEY, signature TEXT, report TEXT,
-    time REAL);
-PRAGMA user_version = 1;
-)";
+std::string creationOfAll() {
+    std::string sql;
+    for (const StoreTableSchema& table : kStoreSchema) {
+        sql += storeCreateTable(table);
+    }
+    return sql;
+}
 
-// What takes a file of schema N to N + 1.
-constexpr std::array<const char*, StoreDatabase::kSchemaVersion> kMigrations = {kSchema};
-
-constexpr std::array<std::string_view, kStoreTables> kInserts = {
-    "INSERT INTO upload_session(id, session_id, session_info, user_info, opened)"
-    " VALUES(?, ?, ?, ?, ?)",
-    "INSERT INTO upload_message(id, upload_session, session_info, user_info, category, type,"
-    " payload, time) VALUES(?, ?, ?, ?, ?, ?, ?, ?)",
-    "INSERT INTO analytics_event(id, name, payload, time) VALUES(?, ?, ?, ?)",
-    "INSERT INTO energy_event(id, client, name, payload, time) VALUES(?, ?, ?, ?, ?)",
-    "INSERT INTO metric(id, metric_id, message, time) VALUES(?, ?, ?, ?)",
-    "INSERT INTO incident(id, signature, report, time) VALUES(?, ?, ?, ?)"};
+// What takes a file of schema N + 1 to N + 2; a new file gets the last at once.
+constexpr std::array<const char*, kStoreSchemaVersion - 1> kMigrations = {};
 
 // The size of pages counts for new files only. Twice SQLite's saves a good part of
 // the writes to log and file, and the least commit is still small.
@@ -85,7 +68,7 @@ StoreDatabase::~StoreDatabase() {
 }
 
 StoreDatabase::Opened StoreDatabase::open() {
-    if (versionInHeader(settings_.path) > kSchemaVersion) {
+    if (versionInHeader(settings_.path) > kStoreSchemaVersion) {
         errorText_ = "its schema is newer than this program";
         return Opened::NewerSchema;
     }
@@ -111,7 +94,7 @@ StoreDatabase::Opened StoreDatabase::openFile() {
     logPages_ = triedLogPages_ = 0;
     std::int64_t version = 0;
     code = query("PRAGMA user_version", version);
-    if (code == SQLITE_OK && version > kSchemaVersion) {
+    if (code == SQLITE_OK && version > kStoreSchemaVersion) {
         errorText_ = "its schema is newer than this program";
         return Opened::NewerSchema;
     }
@@ -174,16 +157,17 @@ int StoreDatabase::migrate() {
         errorText_ = "its schema version is negative";
         return SQLITE_CORRUPT;
     }
-    for (; code == SQLITE_OK && version < kSchemaVersion; ++version) {
-        code = execute("BEGIN IMMEDIATE");
-        if (code == SQLITE_OK) {
-            code = execute(kMigrations.at(static_cast<std::size_t>(version)));
-        }
-        if (code == SQLITE_OK) {
-            code = execute("COMMIT");
-        }
+    if (code != SQLITE_OK || version == kStoreSchemaVersion) {
+        return code;
     }
-    return code;
+    std::string sql = "BEGIN IMMEDIATE;";
+    if (version == 0) {
+        sql += creationOfAll();
+    }
+    for (auto step = std::max<std::int64_t>(version, 1); step < kStoreSchemaVersion; ++step) {
+        sql += kMigrations.at(static_cast<std::size_t>(step - 1));
+    }
+    return execute(fmt::format("{}PRAGMA user_version = {}; COMMIT", sql, kStoreSchemaVersion));
 }
 
 int StoreDatabase::prepare() {
@@ -194,7 +178,7 @@ int StoreDatabase::prepare() {
         }
     };
     for (std::size_t i = 0; i < kStoreTables; ++i) {
-        add(inserts_[i], kInserts[i]);
+        add(inserts_[i], storeInsert(kStoreSchema[i], "INSERT"));
     }
     add(closeUpload_, "UPDATE upload_session SET closed = ? WHERE id = ?");
     add(findUpload_, "SELECT 1 FROM upload_session WHERE id = ? AND session_id IS ?");
@@ -209,13 +193,10 @@ int StoreDatabase::prepare() {
 }
 
 int StoreDatabase::refreshIds() {
-    constexpr std::array<const char*, kStoreTables> kNewest = {
-        "SELECT max(id) FROM upload_session",  "SELECT max(id) FROM upload_message",
-        "SELECT max(id) FROM analytics_event", "SELECT max(id) FROM energy_event",
-        "SELECT max(id) FROM metric",          "SELECT max(id) FROM incident"};
     for (std::size_t i = 0; i < kStoreTables; ++i) {
         std::int64_t newest = 0;
-        if (const int code = query(kNewest[i], newest); code != SQLITE_OK) {
+        const int code = query(fmt::format("SELECT max(id) FROM {}", kStoreSchema[i].name), newest);
+        if (code != SQLITE_OK) {
             return code;
         }
         nextID_[i] = std::max(nextID_[i], newest + 1);
@@ -234,11 +215,11 @@ int StoreDatabase::readPageCounts() {
     return code;
 }
 
-int StoreDatabase::execute(const char* sql) {
-    return note(sqlite3_exec(database_, sql, nullptr, nullptr, nullptr));
+int StoreDatabase::execute(const std::string& sql) {
+    return note(sqlite3_exec(database_, sql.c_str(), nullptr, nullptr, nullptr));
 }
 
-int StoreDatabase::query(const char* sql, std::int64_t& result) {
+int StoreDatabase::query(std::string_view sql, std::int64_t& result) {
     StoreStatement statement;
     int code = statement.prepare(database_, sql);
     if (code == SQLITE_OK) {
@@ -368,13 +349,16 @@ int StoreDatabase::boundLog(std::uint64_t maxBytes, std::uint64_t checkpointByte
     return code == SQLITE_BUSY ? SQLITE_OK : note(code);
 }
 
-int StoreDatabase::insertInto(StoreTable table) {
+// Ids are given here and not by SQLite, so that they are known without asking and
+// are not used twice when retention has emptied a table. When somebody else has
+// inserted rows meanwhile, ours go behind them.
+template <class... Values>
+int StoreDatabase::insertInto(StoreTable table, const Values&... values) {
     const auto index = static_cast<std::size_t>(table);
     StoreStatement& insert = inserts_[index];
-    insert.bind(1, nextID_[index]);
+    insert.bindFrom(1, nextID_[index], values...);
     int code = insert.run();
     if (code == SQLITE_CONSTRAINT_PRIMARYKEY || code == SQLITE_CONSTRAINT_ROWID) {
-        // Somebody else wrote here. Behind his rows, then.
         code = refreshIds();
         if (code == SQLITE_OK) {
             insert.bind(1, nextID_[index]);
@@ -391,8 +375,7 @@ int StoreDatabase::insertInto(StoreTable table) {
 
 int StoreDatabase::ensureUpload(const StoreUploadPtr& upload) {
     if (upload->row != 0 && upload->generation != generation_) {
-        findUpload_.bind(1, upload->row);
-        findUpload_.bind(2, upload->sessionID);
+        findUpload_.bindFrom(1, upload->row, upload->sessionID);
         const int code = findUpload_.step();
         findUpload_.reset();
         if (code != SQLITE_ROW && code != SQLITE_DONE) {
@@ -404,12 +387,10 @@ int StoreDatabase::ensureUpload(const StoreUploadPtr& upload) {
     if (upload->row != 0) {
         return SQLITE_OK;
     }
-    StoreStatement& insert = statement(StoreTable::UploadSession);
-    insert.bind(2, upload->sessionID);
-    insert.bindText(3, sessionInfo_.write(upload->sessionInfo));
-    insert.bindText(4, userInfo_.write(upload->userInfo));
-    insert.bind(5, upload->opened);
-    if (const int code = insertInto(StoreTable::UploadSession); code != SQLITE_OK) {
+    const int code = insertInto(StoreTable::UploadSession, upload->sessionID,
+                                sessionInfo_.write(upload->sessionInfo),
+                                userInfo_.write(upload->userInfo), upload->opened, nullptr);
+    if (code != SQLITE_OK) {
         return code;
     }
     upload->row = nextID_[static_cast<std::size_t>(StoreTable::UploadSession)] - 1;
@@ -426,8 +407,7 @@ int StoreDatabase::write(const StoreCloseRow& row) {
     if (const int code = ensureUpload(row.upload); code != SQLITE_OK) {
         return code;
     }
-    closeUpload_.bind(1, row.time);
-    closeUpload_.bind(2, row.upload->row);
+    closeUpload_.bindFrom(1, row.time, row.upload->row);
     return note(closeUpload_.run());
 }
 
@@ -435,27 +415,15 @@ int StoreDatabase::write(const StoreMessageRow& row) {
     if (const int code = ensureUpload(row.upload); code != SQLITE_OK) {
         return code;
     }
-    StoreStatement& insert = statement(StoreTable::UploadMessage);
-    insert.bind(2, row.upload->row);
-    insert.bindNull(3);
-    insert.bindNull(4);
-    insert.bind(5, std::int64_t{row.category});
-    insert.bind(6, std::int64_t{row.type});
-    insert.bindText(7, payload_.write(row.payload));
-    insert.bind(8, row.time);
-    return insertInto(StoreTable::UploadMessage);
+    return insertInto(StoreTable::UploadMessage, row.upload->row, nullptr, nullptr,
+                      std::int64_t{row.category}, std::int64_t{row.type},
+                      payload_.write(row.payload), row.time);
 }
 
 int StoreDatabase::write(const StoreSingleRow& row) {
-    StoreStatement& insert = statement(StoreTable::UploadMessage);
-    insert.bindNull(2);
-    insert.bindText(3, sessionInfo_.write(row.sessionInfo));
-    insert.bindText(4, userInfo_.write(row.userInfo));
-    insert.bind(5, std::int64_t{row.category});
-    insert.bind(6, std::int64_t{row.type});
-    insert.bindText(7, payload_.write(row.payload));
-    insert.bind(8, row.time);
-    return insertInto(StoreTable::UploadMessage);
+    return insertInto(StoreTable::UploadMessage, nullptr, sessionInfo_.write(row.sessionInfo),
+                      userInfo_.write(row.userInfo), std::int64_t{row.category},
+                      std::int64_t{row.type}, payload_.write(row.payload), row.time);
 }
 
 int StoreDatabase::write(StoreAnalyticsRow& row) {
@@ -463,37 +431,24 @@ int StoreDatabase::write(StoreAnalyticsRow& row) {
         row.payload = row.builder();
         row.builder = nullptr;
     }
-    StoreStatement& insert = statement(StoreTable::AnalyticsEvent);
-    insert.bindText(2, row.name.text());
-    insert.bindText(3, payload_.write(row.payload));
-    insert.bind(4, row.time);
-    return insertInto(StoreTable::AnalyticsEvent);
+    return insertInto(StoreTable::AnalyticsEvent, row.name.text(), payload_.write(row.payload),
+                      row.time);
 }
 
 int StoreDatabase::write(const StoreEnergyRow& row) {
-    StoreStatement& insert = statement(StoreTable::EnergyEvent);
-    insert.bind(2, std::int64_t{row.client});
-    insert.bindText(3, row.name.text());
-    insert.bindText(4, payload_.write(row.payload));
-    insert.bind(5, row.time);
-    return insertInto(StoreTable::EnergyEvent);
+    return insertInto(StoreTable::EnergyEvent, std::int64_t{row.client}, row.name.text(),
+                      payload_.write(row.payload), row.time);
 }
 
 int StoreDatabase::write(const StoreMetricRow& row) {
-    StoreStatement& insert = statement(StoreTable::Metric);
-    insert.bind(2, std::int64_t{row.metricID});
-    insert.bindBlob(3, row.message);
-    insert.bind(4, row.time);
-    return insertInto(StoreTable::Metric);
+    return insertInto(StoreTable::Metric, std::int64_t{row.metricID}, StoreBlob{row.message},
+                      row.time);
 }
 
 int StoreDatabase::write(const StoreIncidentRow& row) {
-    StoreStatement& insert = statement(StoreTable::Incident);
     const std::string report = replaceInvalidUtf8(row.report.text());
-    insert.bindText(2, payload_.write(row.signature));
-    insert.bindText(3, report);
-    insert.bind(4, row.time);
-    return insertInto(StoreTable::Incident);
+    return insertInto(StoreTable::Incident, payload_.write(row.signature), std::string_view(report),
+                      row.time);
 }
 
 } // namespace halyard::linux_

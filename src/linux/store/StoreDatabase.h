@@ -17,9 +17,11 @@
 #include <filesystem>
 #include <memory>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "common/Json.h"
+#include "linux/store/Schema.h"
 #include "linux/store/StoreRow.h"
 #include "linux/store/StoreSqlite.h"
 
@@ -27,7 +29,6 @@ namespace halyard::linux_ {
 
 class StoreDatabase {
 public:
-    static constexpr std::int64_t kSchemaVersion = 1;
     // Files up to this size are checked when they are opened. Damage in a larger
     // one shows when its pages are used.
     static constexpr std::uint64_t kCheckedBytes = 64 * 1024 * 1024;
@@ -92,8 +93,8 @@ private:
     [[nodiscard]] int migrate();
     [[nodiscard]] int check();
     [[nodiscard]] int prepare();
-    [[nodiscard]] int execute(const char* sql);
-    [[nodiscard]] int query(const char* sql, std::int64_t& result);
+    [[nodiscard]] int execute(const std::string& sql);
+    [[nodiscard]] int query(std::string_view sql, std::int64_t& result);
     [[nodiscard]] int readPageCounts();
     Opened classify(int code) const;
     // Keeps what SQLite says about `code`, which it returns.
@@ -108,10 +109,8 @@ private:
     [[nodiscard]] int write(const StoreEnergyRow& row);
     [[nodiscard]] int write(const StoreMetricRow& row);
     [[nodiscard]] int write(const StoreIncidentRow& row);
-    [[nodiscard]] int insertInto(StoreTable table);
-    StoreStatement& statement(StoreTable table) {
-        return inserts_[static_cast<std::size_t>(table)];
-    }
+    template <class... Values>
+    [[nodiscard]] int insertInto(StoreTable table, const Values&... values);
 
     const Settings settings_;
     sqlite3* database_ = nullptr;

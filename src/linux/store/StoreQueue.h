@@ -15,6 +15,7 @@
 #include <condition_variable>
 #include <functional>
 #include <optional>
+#include <string_view>
 #include <vector>
 
 #include "common/Mutex.h"
@@ -33,6 +34,19 @@ enum class StoreLoss : std::uint8_t {
     Rejected, // The row itself: too big for the database, say.
 };
 inline constexpr std::size_t kStoreLosses = 7;
+// In the order of StoreLoss.
+struct StoreLossName {
+    std::string_view inStatus;
+    std::string_view inLog;
+};
+inline constexpr std::array<StoreLossName, kStoreLosses> kStoreLossNames = {
+    {{"no_store", "no store"},
+     {"disk_full", "disk full"},
+     {"read_only", "read-only"},
+     {"locked", "locked by another process"},
+     {"io_error", "input/output error"},
+     {"stuck", "the file system does not answer"},
+     {"rejected", "rejected"}}};
 using StoreLosses = std::array<std::uint64_t, kStoreLosses>;
 
 class StoreQueue {

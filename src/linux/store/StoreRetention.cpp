@@ -19,18 +19,14 @@ constexpr std::int64_t kSlabShare = 8;
 constexpr std::int64_t kSlackBytes = 1024 * 1024;
 constexpr std::int64_t kSlackShare = 16;
 
-struct Source {
-    std::string_view table;
-    // A session counts as old as its end; none while it is open.
-    std::string_view time;
-};
-constexpr std::string_view kSessionEnd = "coalesce(closed, CASE WHEN id < ?2 THEN ?3 END)";
-constexpr std::array<Source, kStoreTables> kSources = {{{"upload_session", kSessionEnd},
-                                                        {"upload_message", "time"},
-                                                        {"analytics_event", "time"},
-                                                        {"energy_event", "time"},
-                                                        {"metric", "time"},
-                                                        {"incident", "time"}}};
+// How old a row is, in seconds since 1970; NULL is too young to go. A session is as
+// old as its end, and has none while it is open; one that an earlier run left open
+// (its id is below ?2) ended when this run began (?3).
+std::string_view ageOf(std::size_t table) {
+    return table == static_cast<std::size_t>(StoreTable::UploadSession)
+               ? "coalesce(closed, CASE WHEN id < ?2 THEN ?3 END)"
+               : "time";
+}
 
 } // namespace
 
@@ -55,7 +51,8 @@ int StoreRetention::prepare(sqlite3* database) {
         }
     };
     for (std::size_t i = 0; i < kStoreTables; ++i) {
-        const auto [name, time] = kSources[i];
+        const std::string_view name = kStoreSchema[i].name;
+        const std::string_view time = ageOf(i);
         Table& table = tables_[i];
         add(table.lowest,
             fmt::format("SELECT id FROM {} WHERE {} IS NOT NULL ORDER BY id LIMIT 1", name, time));

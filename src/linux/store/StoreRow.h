@@ -15,16 +15,6 @@
 
 namespace halyard::linux_ {
 
-enum class StoreTable : std::uint8_t {
-    UploadSession,
-    UploadMessage,
-    AnalyticsEvent,
-    EnergyEvent,
-    Metric,
-    Incident,
-};
-inline constexpr std::size_t kStoreTables = 6;
-
 // An upload session, shared by its rows and by whoever sends through it.
 //
 // Its own row is written before its first message, whenever that is: a session

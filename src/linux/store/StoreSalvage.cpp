@@ -9,6 +9,8 @@
 #include <string_view>
 #include <vector>
 
+#include "linux/store/Schema.h"
+
 namespace halyard::linux_ {
 namespace {
 
@@ -22,22 +24,26 @@ constexpr std::uint64_t kRowsPerCommit = 4096;
 constexpr std::int64_t kFirstStep = 4;
 constexpr std::int64_t kLargestStep = std::int64_t{1} << 40;
 
-struct Source {
-    std::string_view table;
-    std::string_view columns; // behind the id
-    int count;                // with the id
-    std::string_view valid;   // what is true of every row that we wrote
-};
-constexpr std::array<Source, 6> kSources = {
-    {{"upload_session", "session_id, session_info, user_info, opened, closed", 6,
-      "json_valid(session_info) AND json_valid(user_info)"},
-     {"upload_message", "upload_session, session_info, user_info, category, type, payload, time", 8,
-      "json_valid(payload) AND (session_info IS NULL OR json_valid(session_info))"
-      " AND (user_info IS NULL OR json_valid(user_info))"},
-     {"analytics_event", "name, payload, time", 4, "json_valid(payload)"},
-     {"energy_event", "client, name, payload, time", 5, "json_valid(payload)"},
-     {"metric", "metric_id, message, time", 4, "typeof(metric_id) = 'integer'"},
-     {"incident", "signature, report, time", 4, "json_valid(signature)"}}};
+// What is true of every row that the daemon wrote, and seldom of what damage left.
+std::string validity(const StoreTableSchema& table) {
+    std::string sql = "1";
+    for (const auto& [name, type, holds] : table.columns) {
+        switch (holds) {
+        case StoreColumn::Holds::Anything:
+            break;
+        case StoreColumn::Holds::Integer:
+            sql += fmt::format(" AND typeof({}) = 'integer'", name);
+            break;
+        case StoreColumn::Holds::Json:
+            sql += fmt::format(" AND json_valid({})", name);
+            break;
+        case StoreColumn::Holds::JsonOrNull:
+            sql += fmt::format(" AND ({0} IS NULL OR json_valid({0}))", name);
+            break;
+        }
+    }
+    return sql;
+}
 
 std::string stampOf(platform::WallTime now) {
     const auto seconds = std::chrono::floor<std::chrono::seconds>(now);
@@ -76,18 +82,12 @@ void removeEmptyCompanions(const fs::path& path) {
 
 class TableCarrier {
 public:
-    TableCarrier(const Source& source, sqlite3* from, sqlite3* to, StoreSalvage& result)
-        : source_(source), to_(to), result_(result) {
-        std::string marks = "?";
-        for (int i = 1; i < source.count; ++i) {
-            marks += ", ?";
-        }
-        readable_ = read_.prepare(from, fmt::format("SELECT id, {}, {} FROM {} WHERE id > ? "
-                                                    "ORDER BY id",
-                                                    source.columns, source.valid, source.table));
-        result_.code = insert_.prepare(to, fmt::format("INSERT OR REPLACE INTO {}(id, {}) "
-                                                       "VALUES({})",
-                                                       source.table, source.columns, marks));
+    TableCarrier(const StoreTableSchema& table, sqlite3* from, sqlite3* to, StoreSalvage& result)
+        : columns_(static_cast<int>(table.columns.size()) + 1), to_(to), result_(result) {
+        readable_ =
+            read_.prepare(from, fmt::format("SELECT {}, {} FROM {} WHERE id > ? ORDER BY id",
+                                            storeColumnNames(table), validity(table), table.name));
+        result_.code = insert_.prepare(to, storeInsert(table, "INSERT OR REPLACE"));
     }
 
     void run() {
@@ -114,7 +114,7 @@ private:
         int code = read_.step();
         for (; code == SQLITE_ROW && result_.code == SQLITE_OK; code = read_.step()) {
             last_ = read_.integer(0);
-            if (read_.integer(source_.count) == 1) {
+            if (read_.integer(columns_) == 1) {
                 carry();
             } else {
                 ++result_.holes;
@@ -125,7 +125,7 @@ private:
     }
 
     void carry() {
-        for (int i = 0; i < source_.count; ++i) {
+        for (int i = 0; i < columns_; ++i) {
             insert_.bindColumn(i + 1, read_, i);
         }
         result_.code = insert_.run();
@@ -134,7 +134,7 @@ private:
         }
     }
 
-    const Source& source_;
+    const int columns_; // with the id
     sqlite3* to_;
     StoreSalvage& result_;
     StoreStatement read_;
@@ -173,9 +173,9 @@ StoreSalvage storeCarryOver(const fs::path& damaged, sqlite3* fresh) {
         // A table of contents that contradicts the file is what we came for.
         sqlite3_exec(from, "PRAGMA writable_schema = ON", nullptr, nullptr, nullptr);
         result.code = sqlite3_exec(fresh, "BEGIN IMMEDIATE", nullptr, nullptr, nullptr);
-        for (const Source& source : kSources) {
+        for (const StoreTableSchema& table : kStoreSchema) {
             if (result.code == SQLITE_OK) {
-                TableCarrier(source, from, fresh, result).run();
+                TableCarrier(table, from, fresh, result).run();
             }
         }
         const bool whole = result.code == SQLITE_OK;

@@ -1,12 +1,17 @@
 // The little of SQLite's interface that the store uses, with owners.
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <sqlite3.h>
 #include <string_view>
 #include <utility>
 
 namespace halyard::linux_ {
+
+struct StoreBlob {
+    std::string_view bytes;
+};
 
 // A prepared statement, used over and over. Not thread-safe.
 //
@@ -35,13 +40,17 @@ public:
 
     void bind(int index, std::int64_t value) { sqlite3_bind_int64(statement_, index, value); }
     void bind(int index, double value) { sqlite3_bind_double(statement_, index, value); }
-    void bindText(int index, std::string_view text) {
+    void bind(int index, std::string_view text) {
         sqlite3_bind_text64(statement_, index, text.data(), text.size(), nullptr, SQLITE_UTF8);
     }
-    void bindBlob(int index, std::string_view bytes) {
-        sqlite3_bind_blob64(statement_, index, bytes.data(), bytes.size(), nullptr);
+    void bind(int index, StoreBlob blob) {
+        sqlite3_bind_blob64(statement_, index, blob.bytes.data(), blob.bytes.size(), nullptr);
     }
-    void bindNull(int index) { sqlite3_bind_null(statement_, index); }
+    void bind(int index, std::nullptr_t) { sqlite3_bind_null(statement_, index); }
+    // All parameters from `first` on.
+    template <class... Values> void bindFrom(int first, const Values&... values) {
+        (bind(first++, values), ...);
+    }
     void bindColumn(int index, const StoreStatement& from, int column) {
         sqlite3_bind_value(statement_, index, sqlite3_column_value(from.statement_, column));
     }

@@ -23,23 +23,7 @@ constexpr std::uint64_t kLogAllowance = 16 * 1024 * 1024;
 constexpr std::size_t kForgetShare = 64;
 
 std::string_view nameOf(StoreLoss reason) {
-    switch (reason) {
-    case StoreLoss::NoStore:
-        return "no store";
-    case StoreLoss::DiskFull:
-        return "disk full";
-    case StoreLoss::ReadOnly:
-        return "read-only";
-    case StoreLoss::Locked:
-        return "locked by another process";
-    case StoreLoss::IoError:
-        return "input/output error";
-    case StoreLoss::Stuck:
-        return "the file system does not answer";
-    case StoreLoss::Rejected:
-        return "rejected";
-    }
-    return "";
+    return kStoreLossNames[static_cast<std::size_t>(reason)].inLog;
 }
 
 std::uint64_t sum(const StoreLosses& losses) {

@@ -2,6 +2,7 @@
 
 #include "linux/store/Store.h"
 
+#include "common/Json.h"
 #include "linux/store/StoreTesting.h"
 
 namespace halyard::linux_ {
@@ -26,6 +27,35 @@ TEST_F(StoreTest, CreatesTheSchema) {
                                         "energy_event", "metric", "incident"}));
     EXPECT_EQ(reader().one("SELECT count(*) FROM sqlite_schema WHERE type = 'index'"), "0");
     EXPECT_EQ(reader().one("PRAGMA journal_mode"), "wal");
+}
+
+TEST_F(StoreTest, TablesHaveTheColumnsThatReadersRelyOn) {
+    open();
+    EXPECT_EQ(
+        reader().rows("SELECT t.name || '(' || group_concat(c.name || ' ' || c.type || "
+                      "iif(c.pk, ' KEY', ''), ', ') || ')' FROM sqlite_schema t "
+                      "JOIN pragma_table_info(t.name) c GROUP BY t.name ORDER BY t.rowid, c.cid"),
+        (std::vector<std::string>{
+            "upload_session(id INTEGER KEY, session_id INTEGER, session_info TEXT, user_info "
+            "TEXT, opened REAL, closed REAL)",
+            "upload_message(id INTEGER KEY, upload_session INTEGER, session_info TEXT, "
+            "user_info TEXT, category INTEGER, type INTEGER, payload TEXT, time REAL)",
+            "analytics_event(id INTEGER KEY, name TEXT, payload TEXT, time REAL)",
+            "energy_event(id INTEGER KEY, client INTEGER, name TEXT, payload TEXT, time REAL)",
+            "metric(id INTEGER KEY, metric_id INTEGER, message BLOB, time REAL)",
+            "incident(id INTEGER KEY, signature TEXT, report TEXT, time REAL)"}));
+}
+
+TEST_F(StoreTest, StatusNamesTablesAndLosses) {
+    StoreStatus status;
+    status.rows = {1, 2, 3, 4, 5, 6};
+    status.lost = {1, 2, 3, 4, 5, 6, 7};
+    const Dictionary told = describe(status);
+    EXPECT_EQ(toJson(told["rows"]), "{\"upload_session\":1,\"upload_message\":2,"
+                                    "\"analytics_event\":3,\"energy_event\":4,"
+                                    "\"metric\":5,\"incident\":6}");
+    EXPECT_EQ(toJson(told["lost"]), "{\"no_store\":1,\"disk_full\":2,\"read_only\":3,"
+                                    "\"locked\":4,\"io_error\":5,\"stuck\":6,\"rejected\":7}");
 }
 
 TEST_F(StoreTest, WritesSessionsAndTheirMessages) {
