@@ -10,7 +10,8 @@
 
 namespace halyard::linux_ {
 
-// How the writer's thread tells that it has ended, and the watch is told to.
+// How the writer's thread tells that it has ended, and the watch is told to. While
+// clients are held back, the watch sees to it that a writer that hangs lets them go.
 struct StoreEnding {
     Mutex mutex;
     std::condition_variable_any changed;
@@ -49,15 +50,15 @@ std::thread startThread(const char* name, std::function<void()> body) {
     });
 }
 
-// Whoever is held back by a writer that hangs must be let go.
-StoreOptions withWatch(StoreOptions options, const std::shared_ptr<StoreEnding>& ending) {
-    options.onPressure = [ending, told = std::move(options.onPressure)](bool on) {
-        ending->press(on);
-        if (told) {
-            told(on);
-        }
-    };
-    return options;
+std::shared_ptr<StoreQueue> makeQueue(const StoreOptions& options,
+                                      const std::shared_ptr<StoreEnding>& ending) {
+    return std::make_shared<StoreQueue>(options.marks, options.groupRows,
+                                        [ending, told = options.onPressure](bool on) {
+                                            ending->press(on);
+                                            if (told) {
+                                                told(on);
+                                            }
+                                        });
 }
 
 template <std::size_t Size, class Name>
@@ -85,10 +86,10 @@ Dictionary describe(const StoreStatus& store) {
                       {"log_bytes", store.logBytes}};
 }
 
-Store::Store(StoreOptions options, const platform::Clock& clock)
-    : ending_(std::make_shared<StoreEnding>()),
-      writer_(std::make_shared<StoreWriter>(withWatch(std::move(options), ending_), clock)),
-      open_(writer_->open()) {
+Store::Store(const StoreOptions& options, const platform::Clock& clock)
+    : clock_(clock), closeLimit_(options.closeLimit), ending_(std::make_shared<StoreEnding>()),
+      queue_(makeQueue(options, ending_)),
+      writer_(std::make_shared<StoreWriter>(options, clock, queue_)), open_(writer_->open()) {
     if (!open_) {
         return;
     }
@@ -98,11 +99,12 @@ Store::Store(StoreOptions options, const platform::Clock& clock)
         ending->writerEnded = true;
         ending->changed.notify_all();
     });
-    watching_ = startThread("store watch", [writer = writer_, ending = ending_] {
-        while (ending->waitForWatch(writer->options().watchPeriod)) {
-            writer->watch();
-        }
-    });
+    watching_ = startThread("store watch",
+                            [writer = writer_, ending = ending_, period = options.watchPeriod] {
+                                while (ending->waitForWatch(period)) {
+                                    writer->watch();
+                                }
+                            });
 }
 
 Store::~Store() {
@@ -118,13 +120,13 @@ bool Store::close() {
     if (!writing_.joinable()) {
         return true;
     }
-    writer_->queue().stop();
+    queue_->stop();
     bool ended = false;
     {
         const MutexLock lock(ending_->mutex);
         ending_->closing = true;
         ending_->changed.notify_all();
-        const auto until = std::chrono::steady_clock::now() + writer_->options().closeLimit;
+        const auto until = std::chrono::steady_clock::now() + closeLimit_;
         while (!ending_->writerEnded &&
                ending_->changed.wait_until(ending_->mutex, until) != std::cv_status::timeout) {
         }
@@ -145,26 +147,25 @@ StoreUploadPtr Store::openUpload(std::int64_t sessionID, const Dictionary& sessi
     upload->sessionID = sessionID;
     upload->sessionInfo = sessionInfo;
     upload->userInfo = userInfo;
-    upload->opened = writer_->now();
-    upload->accepted =
-        writer_->queue().push(StoreOpenRow{upload}, 0, StoreQueue::OnDrop::KeepQuiet);
+    upload->opened = now();
+    upload->accepted = queue_->push(StoreOpenRow{upload}, 0, StoreQueue::OnDrop::KeepQuiet);
     return upload;
 }
 
 void Store::closeUpload(const StoreUploadPtr& upload) {
     // One that got no row so far gets it now, or is counted as lost.
     if (!upload->accepted) {
-        upload->accepted = writer_->queue().push(StoreOpenRow{upload});
+        upload->accepted = queue_->push(StoreOpenRow{upload});
     }
     if (upload->accepted) {
-        writer_->queue().pushAlways(StoreCloseRow{upload, writer_->now()});
+        queue_->pushAlways(StoreCloseRow{upload, now()});
     }
 }
 
 bool Store::addMessage(const StoreUploadPtr& upload, std::uint16_t category, std::uint32_t type,
                        Dictionary payload) {
-    const bool taken = writer_->queue().push(
-        StoreMessageRow{upload, std::move(payload), type, category, writer_->now()});
+    const bool taken =
+        queue_->push(StoreMessageRow{upload, std::move(payload), type, category, now()});
     if (taken && !upload->accepted.load(std::memory_order_relaxed)) {
         upload->accepted = true;
     }
@@ -174,32 +175,31 @@ bool Store::addMessage(const StoreUploadPtr& upload, std::uint16_t category, std
 bool Store::addSingleMessage(const Dictionary& sessionInfo, const Dictionary& userInfo,
                              std::uint16_t category, std::uint32_t type,
                              const Dictionary& payload) {
-    return writer_->queue().push(
-        StoreSingleRow{sessionInfo, userInfo, payload, type, category, writer_->now()});
+    return queue_->push(StoreSingleRow{sessionInfo, userInfo, payload, type, category, now()});
 }
 
 bool Store::addAnalyticsEvent(const Value& name, std::function<Dictionary()> builder) {
-    StoreAnalyticsRow row{name, std::move(builder), {}, writer_->now()};
+    StoreAnalyticsRow row{name, std::move(builder), {}, now()};
     std::size_t hidden = 0;
-    if (writer_->queue().wantsFinishedRows()) {
+    if (queue_->wantsFinishedRows()) {
         row.payload = row.builder();
         row.builder = nullptr;
     } else {
-        hidden = writer_->expectedPayloadBytes();
+        hidden = queue_->expectedPayloadBytes();
     }
-    return writer_->queue().push(std::move(row), hidden);
+    return queue_->push(std::move(row), hidden);
 }
 
 bool Store::addEnergyEvent(std::uint32_t client, std::string_view name, const Dictionary& payload) {
-    return writer_->queue().push(StoreEnergyRow{name, payload, client, writer_->now()});
+    return queue_->push(StoreEnergyRow{name, payload, client, now()});
 }
 
 bool Store::addMetric(std::uint32_t metricID, std::string message) {
-    return writer_->queue().push(StoreMetricRow{std::move(message), metricID, writer_->now()});
+    return queue_->push(StoreMetricRow{std::move(message), metricID, now()});
 }
 
 bool Store::addIncident(const Dictionary& signature, std::string_view report) {
-    return writer_->queue().push(StoreIncidentRow{signature, report, writer_->now()});
+    return queue_->push(StoreIncidentRow{signature, report, now()});
 }
 
 } // namespace halyard::linux_

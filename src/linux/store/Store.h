@@ -30,7 +30,7 @@ class Store final {
 public:
     // Opens or creates the file, which may take a moment when it is damaged.
     // Borrows `clock`, which must outlive the store's thread (see close()).
-    Store(StoreOptions options, const platform::Clock& clock);
+    Store(const StoreOptions& options, const platform::Clock& clock);
     ~Store();
     Store(const Store&) = delete;
     Store& operator=(const Store&) = delete;
@@ -62,7 +62,7 @@ public:
 
     // Calls `done` once every row added before is committed or counted as lost: on
     // the store's thread, or at once when nothing is waiting.
-    void flush(std::function<void()> done) { writer_->queue().flush(std::move(done)); }
+    void flush(std::function<void()> done) { queue_->flush(std::move(done)); }
 
     void setLimits(StoreLimits limits) { writer_->setLimits(limits); }
     StoreStatus status() const { return writer_->status(); }
@@ -74,7 +74,14 @@ public:
     [[nodiscard]] bool close();
 
 private:
+    double now() const { return platform::secondsSince1970(clock_.wallTime()); }
+
+    const platform::Clock& clock_;
+    const std::chrono::nanoseconds closeLimit_;
+    // Shared with the threads, which a dead file system may keep for longer than
+    // this object lives.
     const std::shared_ptr<StoreEnding> ending_;
+    const std::shared_ptr<StoreQueue> queue_;
     const std::shared_ptr<StoreWriter> writer_;
     bool open_ = false;
     std::thread writing_;

@@ -6,7 +6,6 @@
 #include <fstream>
 #include <string_view>
 #include <utility>
-#include <variant>
 
 #include "common/Utf8.h"
 
@@ -295,10 +294,6 @@ int StoreDatabase::begin() {
     return note(begin_.run());
 }
 
-int StoreDatabase::insert(StoreRow& row) {
-    return std::visit([this](auto& kind) { return write(kind); }, row);
-}
-
 int StoreDatabase::commit() {
     const int code = note(commit_.run());
     if (code != SQLITE_OK) {
@@ -399,11 +394,11 @@ int StoreDatabase::ensureUpload(const StoreUploadPtr& upload) {
     return SQLITE_OK;
 }
 
-int StoreDatabase::write(const StoreOpenRow& row) {
+int StoreDatabase::insert(const StoreOpenRow& row) {
     return ensureUpload(row.upload);
 }
 
-int StoreDatabase::write(const StoreCloseRow& row) {
+int StoreDatabase::insert(const StoreCloseRow& row) {
     if (const int code = ensureUpload(row.upload); code != SQLITE_OK) {
         return code;
     }
@@ -411,7 +406,7 @@ int StoreDatabase::write(const StoreCloseRow& row) {
     return note(closeUpload_.run());
 }
 
-int StoreDatabase::write(const StoreMessageRow& row) {
+int StoreDatabase::insert(const StoreMessageRow& row) {
     if (const int code = ensureUpload(row.upload); code != SQLITE_OK) {
         return code;
     }
@@ -420,32 +415,28 @@ int StoreDatabase::write(const StoreMessageRow& row) {
                       payload_.write(row.payload), row.time);
 }
 
-int StoreDatabase::write(const StoreSingleRow& row) {
+int StoreDatabase::insert(const StoreSingleRow& row) {
     return insertInto(StoreTable::UploadMessage, nullptr, sessionInfo_.write(row.sessionInfo),
                       userInfo_.write(row.userInfo), std::int64_t{row.category},
                       std::int64_t{row.type}, payload_.write(row.payload), row.time);
 }
 
-int StoreDatabase::write(StoreAnalyticsRow& row) {
-    if (row.builder) { // Its result is kept: a group may be written again.
-        row.payload = row.builder();
-        row.builder = nullptr;
-    }
+int StoreDatabase::insert(const StoreAnalyticsRow& row) {
     return insertInto(StoreTable::AnalyticsEvent, row.name.text(), payload_.write(row.payload),
                       row.time);
 }
 
-int StoreDatabase::write(const StoreEnergyRow& row) {
+int StoreDatabase::insert(const StoreEnergyRow& row) {
     return insertInto(StoreTable::EnergyEvent, std::int64_t{row.client}, row.name.text(),
                       payload_.write(row.payload), row.time);
 }
 
-int StoreDatabase::write(const StoreMetricRow& row) {
+int StoreDatabase::insert(const StoreMetricRow& row) {
     return insertInto(StoreTable::Metric, std::int64_t{row.metricID}, StoreBlob{row.message},
                       row.time);
 }
 
-int StoreDatabase::write(const StoreIncidentRow& row) {
+int StoreDatabase::insert(const StoreIncidentRow& row) {
     const std::string report = replaceInvalidUtf8(row.report.text());
     return insertInto(StoreTable::Incident, payload_.write(row.signature), std::string_view(report),
                       row.time);

@@ -60,9 +60,17 @@ public:
     void close();
 
     [[nodiscard]] int begin();
-    // Requires begin(). SQLITE_TOOBIG, SQLITE_CONSTRAINT and SQLITE_MISMATCH concern
-    // this row alone, every other error the whole group.
-    [[nodiscard]] int insert(StoreRow& row);
+    // Requires begin(), and of an analytics event that its payload is built.
+    // SQLITE_TOOBIG, SQLITE_CONSTRAINT and SQLITE_MISMATCH concern this row alone,
+    // every other error the whole group.
+    [[nodiscard]] int insert(const StoreOpenRow& row);
+    [[nodiscard]] int insert(const StoreCloseRow& row);
+    [[nodiscard]] int insert(const StoreMessageRow& row);
+    [[nodiscard]] int insert(const StoreSingleRow& row);
+    [[nodiscard]] int insert(const StoreAnalyticsRow& row);
+    [[nodiscard]] int insert(const StoreEnergyRow& row);
+    [[nodiscard]] int insert(const StoreMetricRow& row);
+    [[nodiscard]] int insert(const StoreIncidentRow& row);
     // Rolls back when it fails.
     [[nodiscard]] int commit();
     void rollback();
@@ -101,14 +109,6 @@ private:
     int note(int code);
 
     [[nodiscard]] int ensureUpload(const StoreUploadPtr& upload);
-    [[nodiscard]] int write(const StoreOpenRow& row);
-    [[nodiscard]] int write(const StoreCloseRow& row);
-    [[nodiscard]] int write(const StoreMessageRow& row);
-    [[nodiscard]] int write(const StoreSingleRow& row);
-    [[nodiscard]] int write(StoreAnalyticsRow& row);
-    [[nodiscard]] int write(const StoreEnergyRow& row);
-    [[nodiscard]] int write(const StoreMetricRow& row);
-    [[nodiscard]] int write(const StoreIncidentRow& row);
     template <class... Values>
     [[nodiscard]] int insertInto(StoreTable table, const Values&... values);
 

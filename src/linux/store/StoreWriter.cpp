@@ -19,8 +19,6 @@ constexpr std::uint64_t kLeastCheckpointBytes = 64 * 1024;
 // What a reader that stays in one transaction may make the log grow to, beside
 // the size of the store.
 constexpr std::uint64_t kLogAllowance = 16 * 1024 * 1024;
-// How fast the expected size of payloads forgets a large one.
-constexpr std::size_t kForgetShare = 64;
 
 std::string_view nameOf(StoreLoss reason) {
     return kStoreLossNames[static_cast<std::size_t>(reason)].inLog;
@@ -42,9 +40,9 @@ bool isDamage(int code) {
 
 } // namespace
 
-StoreWriter::StoreWriter(StoreOptions options, const platform::Clock& clock)
-    : options_(std::move(options)), clock_(clock),
-      queue_(options_.marks, options_.groupRows, options_.onPressure),
+StoreWriter::StoreWriter(const StoreOptions& options, const platform::Clock& clock,
+                         std::shared_ptr<StoreQueue> queue)
+    : options_(options), clock_(clock), queue_(std::move(queue)),
       database_({options_.path, options_.busyTimeout, options_.vfs}),
       retention_(platform::secondsSince1970(clock.wallTime())), limits_(options_.limits) {}
 
@@ -55,7 +53,7 @@ bool StoreWriter::open() {
     if (!usable) {
         HY_LOG_ERROR(HYReportingPlatformCategory, "running without a store: {}: {}",
                      options_.path.string(), database_.errorText());
-        queue_.stop();
+        queue_->stop();
     } else if (opened == StoreDatabase::Opened::NotNow) {
         beginEpisode(lossOf(database_.errorCode()), database_.errorText());
     }
@@ -105,7 +103,7 @@ void StoreWriter::carryOver(const std::filesystem::path& aside) {
 void StoreWriter::closeDatabase() {
     if (surrendered_) {
         HY_LOG_ERROR(HYReportingPlatformCategory, "closing {}, {} rows lost: {}",
-                     options_.path.string(), sum(queue_.levels().lost), nameOf(*surrendered_));
+                     options_.path.string(), sum(queue_->levels().lost), nameOf(*surrendered_));
     }
     retention_.reset();
     if (database_.hasMoved()) {
@@ -120,10 +118,14 @@ void StoreWriter::run() {
         const auto idle = trimMore_            ? std::chrono::nanoseconds(0)
                           : database_.isOpen() ? options_.agePeriod
                                                : options_.lastRetry;
-        switch (queue_.waitForGroup(options_.groupDelay, idle)) {
+        switch (queue_->waitForGroup(options_.groupDelay, idle)) {
         case StoreQueue::Wake::Rows:
-            queue_.take(taken_, options_.groupDelay);
-            writeTaken();
+            queue_->take(taken_, options_.groupDelay);
+            for (std::size_t from = 0; from < taken_.size(); from += options_.groupRows) {
+                writeGroup(std::span(taken_).subspan(
+                    from, std::min(taken_.size() - from, options_.groupRows)));
+            }
+            taken_.clear();
             break;
         case StoreQueue::Wake::Idle:
             maintain();
@@ -145,16 +147,6 @@ void StoreWriter::watch() {
     }
 }
 
-void StoreWriter::writeTaken() {
-    std::span<StoreItem> rest(taken_);
-    while (!rest.empty()) {
-        const std::size_t rows = std::min(rest.size(), options_.groupRows);
-        writeGroup(rest.first(rows));
-        rest = rest.subspan(rows);
-    }
-    taken_.clear();
-}
-
 void StoreWriter::writeGroup(std::span<StoreItem> group) {
     auto delay = options_.firstRetry;
     for (;;) {
@@ -167,11 +159,11 @@ void StoreWriter::writeGroup(std::span<StoreItem> group) {
         }
         const StoreLoss reason = lossOf(code);
         beginEpisode(reason, database_.errorText());
-        if (queue_.isStopping()) {
+        if (queue_->isStopping()) {
             surrendered_ = reason;
             continue;
         }
-        queue_.pause(delay);
+        queue_->pause(delay);
         delay = std::min(delay * 2, options_.lastRetry);
     }
 }
@@ -221,7 +213,7 @@ int StoreWriter::reopenIfNeeded() {
 int StoreWriter::writeRows(std::span<StoreItem> group) {
     const bool ageDue = limitsChanged_.exchange(false) || isAgeDue();
     const StoreLimits bounds = limits();
-    rejected_ = 0;
+    bool more = false;
     int code = database_.boundLog(
         bounds.maxBytes + kLogAllowance,
         std::clamp(bounds.maxBytes / 8, kLeastCheckpointBytes, kCheckpointBytes));
@@ -229,15 +221,8 @@ int StoreWriter::writeRows(std::span<StoreItem> group) {
     if (code != SQLITE_OK) {
         return code;
     }
-    for (StoreItem& item : group) {
-        code = code == SQLITE_OK ? insert(item.row) : code;
-    }
-    bool more = false;
-    if (code == SQLITE_OK) {
-        const double oldest = now() - static_cast<double>(bounds.maxAge.count());
-        code = retention_.trim(database_, bounds.maxBytes,
-                               ageDue ? std::optional(oldest) : std::nullopt, more);
-    }
+    code = insertAll(group);
+    code = code == SQLITE_OK ? trim(bounds, ageDue, more) : code;
     if (code != SQLITE_OK) {
         database_.rollback();
         return code;
@@ -252,21 +237,38 @@ int StoreWriter::writeRows(std::span<StoreItem> group) {
     return code;
 }
 
-int StoreWriter::insert(StoreRow& row) {
-    const auto* analytics = std::get_if<StoreAnalyticsRow>(&row);
-    const bool built = analytics != nullptr && analytics->builder;
-    const int code = database_.insert(row);
-    if (built) {
-        const std::size_t expected = expectedPayload_.load(std::memory_order_relaxed);
-        expectedPayload_.store(
-            std::max(storeBytes(analytics->payload), expected - expected / kForgetShare),
-            std::memory_order_relaxed);
+int StoreWriter::insertAll(std::span<StoreItem> group) {
+    rejected_ = 0;
+    for (StoreItem& item : group) {
+        buildPayload(item.row);
+        const int code =
+            std::visit([this](const auto& row) { return database_.insert(row); }, item.row);
+        if (concernsOneRow(code)) {
+            ++rejected_;
+        } else if (code != SQLITE_OK) {
+            return code;
+        }
     }
-    if (concernsOneRow(code)) {
-        ++rejected_;
-        return SQLITE_OK;
+    return SQLITE_OK;
+}
+
+int StoreWriter::trim(const StoreLimits& bounds, bool ageDue, bool& more) {
+    std::optional<double> oldest;
+    if (ageDue) {
+        oldest = platform::secondsSince1970(clock_.wallTime()) -
+                 static_cast<double>(bounds.maxAge.count());
     }
-    return code;
+    return retention_.trim(database_, bounds.maxBytes, oldest, more);
+}
+
+// What was built is kept in the row: its group may be written again.
+void StoreWriter::buildPayload(StoreRow& row) {
+    auto* const event = std::get_if<StoreAnalyticsRow>(&row);
+    if (event != nullptr && event->builder) {
+        event->payload = event->builder();
+        event->builder = nullptr;
+        queue_->notePayloadBytes(storeBytes(event->payload));
+    }
 }
 
 void StoreWriter::noteSizes() {
@@ -288,11 +290,11 @@ void StoreWriter::settle(std::span<StoreItem> group) {
         }
     }
     if (rejected_ > 0) {
-        queue_.countLost(StoreLoss::Rejected, rejected_);
+        queue_->countLost(StoreLoss::Rejected, rejected_);
         HY_LOG_ERROR(HYReportingPlatformCategory, "the store rejected {} rows: {}", rejected_,
                      database_.errorText());
     }
-    queue_.settle(group.size(), bytes);
+    queue_->settle(group.size(), bytes);
 }
 
 void StoreWriter::giveUp(std::span<StoreItem> group, StoreLoss reason) {
@@ -302,8 +304,8 @@ void StoreWriter::giveUp(std::span<StoreItem> group, StoreLoss reason) {
         bytes += item.bytes;
         lost += std::holds_alternative<StoreCloseRow>(item.row) ? 0 : 1;
     }
-    queue_.countLost(reason, lost);
-    queue_.settle(group.size(), bytes);
+    queue_->countLost(reason, lost);
+    queue_->settle(group.size(), bytes);
 }
 
 bool StoreWriter::isAgeDue() const {
@@ -340,12 +342,12 @@ void StoreWriter::beginEpisode(StoreLoss reason, const std::string& text) {
         const MutexLock lock(mutex_);
         first = !episode_;
         if (first) {
-            episode_ = Episode{reason, clock_.steadyTime(), queue_.levels().lost};
+            episode_ = Episode{reason, clock_.steadyTime(), queue_->levels().lost};
         }
         episode_->reason = reason;
         status_.failing = true;
     }
-    queue_.setFailing(reason);
+    queue_->setFailing(reason);
     if (first) {
         HY_LOG_ERROR(HYReportingPlatformCategory, "cannot write to {}, trying on: {}: {}",
                      options_.path.string(), nameOf(reason), text);
@@ -362,12 +364,12 @@ void StoreWriter::endEpisode() {
     if (!ended) {
         return;
     }
-    queue_.setFailing(std::nullopt);
+    queue_->setFailing(std::nullopt);
     const auto seconds =
         std::chrono::duration_cast<std::chrono::seconds>(clock_.steadyTime() - ended->began);
     HY_LOG_DEFAULT(HYReportingPlatformCategory, "writing to {} again after {} s, {} rows lost",
                    options_.path.string(), seconds.count(),
-                   sum(queue_.levels().lost) - sum(ended->lostBefore));
+                   sum(queue_->levels().lost) - sum(ended->lostBefore));
 }
 
 void StoreWriter::setLimits(StoreLimits limits) {
@@ -376,7 +378,7 @@ void StoreWriter::setLimits(StoreLimits limits) {
         limits_ = limits;
     }
     limitsChanged_ = true;
-    queue_.wake();
+    queue_->wake();
 }
 
 StoreLimits StoreWriter::limits() const {
@@ -385,7 +387,7 @@ StoreLimits StoreWriter::limits() const {
 }
 
 StoreStatus StoreWriter::status() const {
-    const StoreQueue::Levels levels = queue_.levels();
+    const StoreQueue::Levels levels = queue_->levels();
     const MutexLock lock(mutex_);
     StoreStatus status = status_;
     status.queuedRows = levels.rows;

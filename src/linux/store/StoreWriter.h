@@ -60,7 +60,8 @@ struct StoreStatus {
 class StoreWriter {
 public:
     // Borrows `clock`.
-    StoreWriter(StoreOptions options, const platform::Clock& clock);
+    StoreWriter(const StoreOptions& options, const platform::Clock& clock,
+                std::shared_ptr<StoreQueue> queue);
 
     // False when there is no store to be had. Before run().
     [[nodiscard]] bool open();
@@ -69,13 +70,8 @@ public:
     // Looks whether run() hangs. Any thread.
     void watch();
 
-    StoreQueue& queue() { return queue_; }
-    const StoreOptions& options() const { return options_; }
     void setLimits(StoreLimits limits) HY_EXCLUDES(mutex_);
     StoreStatus status() const HY_EXCLUDES(mutex_);
-    double now() const { return platform::secondsSince1970(clock_.wallTime()); }
-    // What a payload that is not built yet is taken to weigh.
-    std::size_t expectedPayloadBytes() const { return expectedPayload_.load(); }
 
 private:
     struct Episode {
@@ -89,12 +85,13 @@ private:
     void carryOver(const std::filesystem::path& aside);
     void closeDatabase();
     [[nodiscard]] int reopenIfNeeded();
-    void writeTaken();
     void writeGroup(std::span<StoreItem> group);
     void maintain();
     [[nodiscard]] int attempt(std::span<StoreItem> group);
     [[nodiscard]] int writeRows(std::span<StoreItem> group);
-    [[nodiscard]] int insert(StoreRow& row);
+    [[nodiscard]] int insertAll(std::span<StoreItem> group);
+    [[nodiscard]] int trim(const StoreLimits& bounds, bool ageDue, bool& more);
+    void buildPayload(StoreRow& row);
     void noteSizes() HY_EXCLUDES(mutex_);
     void settle(std::span<StoreItem> group);
     void giveUp(std::span<StoreItem> group, StoreLoss reason);
@@ -107,7 +104,7 @@ private:
 
     const StoreOptions options_;
     const platform::Clock& clock_;
-    StoreQueue queue_;
+    const std::shared_ptr<StoreQueue> queue_;
     StoreDatabase database_;
     StoreRetention retention_;
     std::vector<StoreItem> taken_;
@@ -118,7 +115,6 @@ private:
     platform::SteadyTime agedAt_{};
     std::atomic<bool> limitsChanged_{false};
     std::atomic<std::int64_t> busySince_{0}; // steady time, 0 while not busy
-    std::atomic<std::size_t> expectedPayload_{1024};
 
     mutable Mutex mutex_;
     StoreLimits limits_ HY_GUARDED_BY(mutex_);
