@@ -178,6 +178,41 @@ TEST_F(StoreFailureTest, ClosingGivesUpOnADiskThatHangs) {
     EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 1);
 }
 
+TEST_F(StoreFailureTest, ARowThatIsRefusedForItselfIsLostAlone) {
+    open();
+    reader().rows("CREATE TRIGGER picky BEFORE INSERT ON metric WHEN new.metric_id = 2 "
+                  "BEGIN SELECT RAISE(ABORT, 'not this one'); END");
+    store_->addMetric(1, "before");
+    store_->addMetric(2, "refused");
+    store_->addMetric(3, "behind");
+    flush();
+    EXPECT_EQ(reader().rows("SELECT id, metric_id FROM metric"),
+              (std::vector<std::string>{"1|1", "2|3"}));
+    EXPECT_EQ(lost(StoreLoss::Rejected), 1U);
+    EXPECT_EQ(log_.count("the store rejected 1 rows", LogLevel::Error), 1U);
+    EXPECT_FALSE(store_->status().failing);
+}
+
+TEST_F(StoreFailureTest, AFailedGroupIsRolledBackWhole) {
+    options_.vfs = FaultyDisk::kName;
+    open();
+    addSingles(1, {});
+    flush();
+    disk_.fail(SQLITE_IOERR);
+    const auto upload = store_->openUpload(5, {}, {});
+    EXPECT_TRUE(store_->addMessage(upload, 1, 1, {}));
+    store_->flush([] {});
+    log_.waitFor("cannot write");
+    EXPECT_EQ(reader().one("SELECT count(*) FROM upload_message"), "1");
+    disk_.fail(SQLITE_OK);
+    flush();
+    EXPECT_EQ(reader().one("SELECT m.id, s.id, s.session_id FROM upload_message m "
+                           "JOIN upload_session s ON s.id = m.upload_session"),
+              "2|1|5");
+    EXPECT_EQ(store_->status().rows, (StoreDatabase::RowCounts{1, 2, 0, 0, 0, 0}));
+    EXPECT_EQ(total(store_->status().lost), 0U);
+}
+
 TEST_F(StoreFailureTest, ClosingCountsWhatItCouldNotWrite) {
     open();
     Reader other(options_.path);

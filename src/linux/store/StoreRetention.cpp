@@ -8,6 +8,29 @@
 
 #include "linux/store/StoreLimits.h"
 
+// How rows go.
+//
+// When: in the transaction of the rows that come, behind their INSERTs. The bounds
+// hold after each commit without anybody looking at them in between, and a group
+// that is rolled back has pushed nothing out.
+//
+// Which: the oldest of all tables together, without an index on time, which would
+// cost more than everything else here. Within a table ids rise with time. So each
+// table proposes a cut, the row a slab's length behind its oldest; the earliest time
+// of the cuts is how far this slab reaches, and each table loses what is before its
+// own cut and not younger than that. The table whose cut is earliest, which is the
+// busiest one, loses a whole slab; the others what is as old as that and no more.
+// A session is as old as its end, which comes after its messages, so these go with
+// it or before.
+//
+// How much: by size, slabs until enough pages are free or kSlabsAtOnce are gone; by
+// age, the same for what is too old. A transaction thus stays short whatever the
+// limits were set to, and `more` makes the writer come back without rows. Free pages
+// are used again; only a file that is well beyond its size gives pages back, a
+// MiB's worth or so at a time, because moving them costs more than writing rows.
+//
+// What stays: open sessions, however old. When nothing but these is left, the store
+// is larger than its size and `more` is not set, or the writer would never rest.
 namespace halyard::linux_ {
 namespace {
 

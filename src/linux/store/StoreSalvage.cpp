@@ -11,6 +11,26 @@
 
 #include "linux/store/Schema.h"
 
+// How rows are saved.
+//
+// First the old file and its companions get another name, and only then is anything
+// read: whatever reading does to a damaged file, the writer has a new one, and the
+// next start does not meet the damage again. The write-ahead log goes along, because
+// rows that were committed last may be in it alone.
+//
+// A row is looked for by its id. Reading a table in the order of its ids goes well
+// until SQLite meets a page that it cannot use, and says so without telling how many
+// rows that page had. So the next attempt begins a few ids further on, then twice as
+// far, and so on; the first row that is found resets the distance. A page that is
+// lost costs its own rows and less than as many again behind it; a page of the tree
+// above it costs no more, since ids behind it are found by their own way down.
+//
+// What SQLite reads may still be nonsense. A row whose columns do not hold what the
+// daemon writes there is left out, rather than given to readers who trust the rest.
+//
+// Ids stay, so that messages find their sessions. Rows go into the new file in
+// several transactions: when it is full half way, what was saved so far is kept, and
+// the damaged file is there for whoever wants the rest.
 namespace halyard::linux_ {
 namespace {
 

@@ -86,6 +86,23 @@ TEST_F(StoreSalvageTest, RowsAroundADamagedPageAreCarriedOver) {
     EXPECT_EQ(reader().one("PRAGMA integrity_check"), "ok");
 }
 
+TEST_F(StoreSalvageTest, RowsThatTheDaemonCannotHaveWrittenAreLeftOut) {
+    makeStore(3);
+    reader().rows("UPDATE upload_message SET payload = '{\"a' WHERE id = 2;"
+                  "INSERT INTO metric VALUES(2, 'no number', 'x', 0);"
+                  "INSERT INTO incident VALUES(1, '{}', 'kept', 0), (2, NULL, 'no signature', 0);"
+                  "INSERT INTO upload_message VALUES(4, NULL, '{}', 'broken', 1, 1, '{}', 0),"
+                  " (5, NULL, '{}', '{}', 1, 1, '{}', 0);"
+                  "ALTER TABLE energy_event DROP COLUMN time"); // for which it is set aside
+    open();
+    EXPECT_EQ(setAside().size(), 1U);
+    EXPECT_EQ(reader().rows("SELECT id FROM upload_message"),
+              (std::vector<std::string>{"1", "3", "5"}));
+    EXPECT_EQ(reader().rows("SELECT id FROM metric"), std::vector<std::string>{"1"});
+    EXPECT_EQ(reader().rows("SELECT id FROM incident"), std::vector<std::string>{"1"});
+    EXPECT_EQ(log_.count("carried over 6 rows", LogLevel::Default), 1U);
+}
+
 TEST_F(StoreSalvageTest, ATruncatedFileGivesWhatIsLeftOfIt) {
     makeStore(4000);
     std::filesystem::resize_file(options_.path, static_cast<std::uintmax_t>(fileBytes() / 2));

@@ -9,6 +9,31 @@
 #include "linux/store/StoreSalvage.h"
 #include "platform/Log.h"
 
+// What happens when a group cannot be written.
+//
+// A group is one transaction, which is repeated as a whole: rows keep their order,
+// and none is in the file twice. What may go wrong, and what is lost by it:
+//
+// - One row is refused for itself (too big): it alone is lost (Rejected), and the
+//   rest of its group is written.
+// - The disk is full, read-only, locked or broken: nothing of the group is lost. It
+//   is tried again and again, at growing intervals. Meanwhile the queue drops what
+//   comes beyond its mark, under the reason that was seen last. That is an episode:
+//   one line when it begins, one when it ends.
+// - The file is gone or another one: it is opened, or made, anew, and the group goes
+//   there. Sessions that had a row in the old file get one in the new.
+// - The file is damaged: it is set aside, its rows are carried over, and the group is
+//   written to the new one in the same attempt. A second failure is an ordinary one.
+// - An operation does not come back: this thread cannot tell, so the watch begins the
+//   episode, which lets the clients go. The attempt's own end ends it. The end may
+//   slip in between the watch's look and its episode, which nobody would end then;
+//   therefore the watch looks once more.
+// - The daemon ends: one attempt more for the group at hand; when that fails, it and
+//   all behind it are given up and counted, without a further attempt for each, since
+//   a disk that takes seconds to say no would take them for each group.
+//
+// Rows are settled only once they are committed or counted as lost, so a flush never
+// answers for rows that are neither.
 namespace halyard::linux_ {
 namespace {
 

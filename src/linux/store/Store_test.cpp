@@ -128,6 +128,18 @@ TEST_F(StoreTest, IdsGoOnAfterReopening) {
     EXPECT_EQ(reader().one("SELECT max(id), count(*) FROM upload_message"), "4|4");
 }
 
+TEST_F(StoreTest, RowsOfOthersAreLeftAlone) {
+    open();
+    addSingles(1, {});
+    flush();
+    reader().rows("INSERT INTO upload_message(id, type) VALUES(2, 77), (9, 77)");
+    addSingles(2, {});
+    flush();
+    EXPECT_EQ(reader().rows("SELECT id, type FROM upload_message"),
+              (std::vector<std::string>{"1|2", "2|77", "9|77", "10|2", "11|2"}));
+    EXPECT_EQ(total(store_->status().lost), 0U);
+}
+
 TEST_F(StoreTest, ClosingStoresWhatIsWaitingAndLeavesOneFile) {
     open();
     addSingles(5, examplePayload());
