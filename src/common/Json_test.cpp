@@ -93,6 +93,7 @@ TEST(JsonTest, OneWriterWritesManyValues) {
     JsonWriter writer;
     EXPECT_EQ(writer.write(Dictionary{{"a", 1}}), "{\"a\":1}");
     EXPECT_EQ(writer.write(List{Value(2)}), "[2]");
+    EXPECT_EQ(writer.write(Dictionary{{"b", 3}}), "{\"b\":3}");
 }
 
 } // namespace

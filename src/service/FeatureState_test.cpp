@@ -1,5 +1,6 @@
 #include "service/FeatureState.h"
 
+#include "common/Json.h"
 #include "service/ServiceFixture.h"
 
 namespace halyard {
@@ -72,6 +73,17 @@ TEST_F(FeatureStateTest, TheStateTellsWhenItWasRead) {
                                                         {"device_name", "kitchen"},
                                                         {"hyreporting_timestamp", 1700000000.499},
                                                         {"systemuptime_sec", 1000}}));
+}
+
+TEST_F(FeatureStateTest, DefaultsAndStateHaveTheirKeysInAFixedOrder) {
+    setDeviceName("kitchen");
+    setAccessory(true);
+    restartService();
+    EXPECT_EQ(toJson(service_->getDefaults()),
+              "{\"device_name\":\"kitchen\",\"disable_reporting\":false}");
+    EXPECT_EQ(toJson(service_->getFeaturesState().value_or(Dictionary())),
+              "{\"spatial-audio-accessory-feature\":true,\"device_name\":\"kitchen\","
+              "\"hyreporting_timestamp\":1700000000,\"systemuptime_sec\":1000}");
 }
 
 TEST_F(FeatureStateTest, TheUptimeIsRoundedToTheNearestSecond) {

@@ -235,6 +235,30 @@ TEST_F(RequestDispatchTest, TheStatusShowsAStopThatWaitsForItsTraceWhileAllElseW
     EXPECT_EQ(tester.ask(Method::AdminStatus)->result.dictionary()["stops_waiting"], Value(List()));
 }
 
+TEST_F(RequestDispatchTest, AStatusThatWaitsLooksAgainEverySecond) {
+    platform_.featureFlags.flags[{"AudioAnalytics", "Tracing"}] = true;
+    platform_.performanceTraces.completes = false;
+    std::shared_ptr<testing::Answer> answer;
+    platform_.conditions.onWait = [&] {
+        platform_.queues.advance(std::chrono::seconds(1));
+        EXPECT_TRUE(answer->given());
+        platform_.performanceTraces.sessions[0]->delegate.lock()->performanceTraceDidComplete(
+            "/traces/one.dat", "one", std::nullopt);
+        return true;
+    };
+    const Peer tester = connect(100);
+    tester.create(7);
+    tester.setServiceType(kAudioServiceTypeTest, 7);
+    tester.start(7);
+    service_->serviceQueue()->suspend(std::chrono::minutes(1), [] {});
+    answer = tester.ask(Method::AdminStatus);
+    platform_.queues.advance(std::chrono::seconds(3));
+    EXPECT_FALSE(answer->given()) << "no stop waits yet";
+    session(7)->stop();
+    EXPECT_EQ(answer->count, 1);
+    EXPECT_EQ(platform_.queues.queuesMade("com.kestrel.halyard.status"), 1U);
+}
+
 TEST_F(RequestDispatchTest, AStatusKeepsItsPlaceHoweverLongTheRequestsBeforeItTake) {
     const auto answer = ask(Method::AdminStatus);
     service_->serviceQueue()->suspend(std::chrono::minutes(1), [] {});

@@ -24,6 +24,19 @@ TEST_F(HYReportingSessionTest, BeginsUnknownUnstartedAndUnrelayed) {
     EXPECT_THAT(platform_.traceMarks.codes, ElementsAre(0x21044828));
 }
 
+TEST_F(HYReportingSessionTest, TheNamesThatClientsKnowStay) {
+    EXPECT_STREQ(HYReportingSessionBlacklistFieldsKey, "_comparison_field_blacklist");
+    EXPECT_STREQ(HYReportingSessionThrottleSecondsKey, "_throttle_seconds");
+    EXPECT_STREQ(HYReportingRelayReportingTimeOut, "9.0");
+    EXPECT_STREQ(HYReportingTraceType, "HYReportingTraceType");
+    EXPECT_STREQ(HYReportingTraceTypeEvtap, "evtap");
+    EXPECT_STREQ(HYReportingTraceTypeArtrace, "artrace");
+    EXPECT_STREQ(HYReportingLoomisPlistFilePath, "HYReportingLoomisPlistFilePath");
+    EXPECT_STREQ(HYReportingPerfProcesses, "HYReportingPerfProcesses");
+    EXPECT_STREQ(HYReportingDelayPerfEndSnapShot, "HYReportingPerfEndDelay");
+    EXPECT_STREQ(HYReportingTestName, "HYReportingTestName");
+}
+
 TEST_F(HYReportingSessionTest, DescribesItself) {
     const auto session = HYReportingSession::initWithID(-9, {100, 200});
     session->setServiceType(kAudioServiceTypeAlarms);

@@ -44,6 +44,20 @@ TEST_F(SessionEventsTest, AStretchMustLastLongerThanTheMinimum) {
     EXPECT_EQ(events[0]["VQSessionVolume"], Value(0.5));
 }
 
+TEST_F(SessionEventsTest, TheMinimumIsHalfASecondUnlessItIsToldOtherwise) {
+    for (const auto& [end, events] : {std::pair(10.5, 0U), std::pair(10.75, 1U)}) {
+        MessageBatch batch;
+        for (const bool playing : {true, false}) {
+            EXPECT_FALSE(batch.addUnlessRedundant(
+                kAudioEventCategoryVolume, kAudioEventTypeSetup,
+                Dictionary{{"VQSessionVolume", 0.5},
+                           {"VQSessionVolumePlayingState", playing},
+                           {"hyreporting_timestamp", playing ? 10 : end}}));
+        }
+        EXPECT_EQ(batch.volumeEvents().size(), events);
+    }
+}
+
 TEST_F(SessionEventsTest, AVolumeChangeWhilePlayingEndsOneStretchAndStartsTheNext) {
     addVolume(0.5, true, 10);
     addVolume(0.75, true, 14);
