@@ -107,6 +107,11 @@ TEST_F(TraceRunnerTest, ResultsAreWrittenByNameAndThenInTheirOrder) {
 TEST_F(TraceRunnerTest, EventsThatWaitedInTheQueueCountWhenItStops) {
     create(paramsNamed("one"));
     runner_->runTraces();
+    std::vector<int> ended; // how often, when each event arrives
+    session(0).handler = [&, handler = session(0).handler](const trace_point& point) {
+        ended.push_back(session(0).ended);
+        handler(point);
+    };
     session(0).deliver(tracePoint(1, 10));
     session(0).deliver(tracePoint(2, 20));
     session(0).deliver(tracePoint(1, 30));
@@ -114,6 +119,7 @@ TEST_F(TraceRunnerTest, EventsThatWaitedInTheQueueCountWhenItStops) {
     ASSERT_EQ(platform_.queues.pending("Tracing Queue"), 4U);
     runner_->stopTracingandProcessResults();
     EXPECT_EQ(platform_.queues.pending("Tracing Queue"), 0U);
+    EXPECT_THAT(ended, ElementsAre(0, 0, 0, 0));
     EXPECT_THAT(results().values, ElementsAre(FakeResultsFiles::NamedValue{"b", 10},
                                               FakeResultsFiles::NamedValue{"b", 15}));
 }
@@ -142,7 +148,13 @@ TEST_F(TraceRunnerTest, TracesAreEndedOneAfterAnotherAndCounted) {
     create(paramsNamed("signpost", 1));
     create(paramsNamed("three"));
     runner_->runTraces();
+    int endedBefore = -1; // the third, when the first completes
+    session(0).completion = [&, completion = session(0).completion] {
+        endedBefore = session(1).ended;
+        completion();
+    };
     runner_->stopTracingandProcessResults();
+    EXPECT_EQ(endedBefore, 0);
     std::vector<std::string> completed;
     for (const std::string& text : platform_.log.texts()) {
         if (text.starts_with("Completed trace.... ")) {
