@@ -42,15 +42,16 @@ public:
     bool locked = false;
 };
 
+// Outlives the conditions that it makes.
 class FakeConditionFactory final : public platform::ConditionFactory {
 public:
     std::unique_ptr<platform::Condition> makeCondition() override {
         auto condition = std::make_unique<FakeCondition>();
-        condition->onWait = onWait;
+        condition->onWait = [this] { return onWait && onWait(); };
         return condition;
     }
 
-    std::function<bool()> onWait; // of the conditions it makes
+    std::function<bool()> onWait; // of the conditions it makes, also when set later
 };
 
 } // namespace halyard::testing
