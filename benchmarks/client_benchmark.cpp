@@ -18,6 +18,7 @@
 #include <vector>
 
 #include "halyard/halyard.hpp"
+#include "testing/TempTree.h"
 
 namespace {
 
@@ -151,9 +152,8 @@ void measureNothing(const char* name, int times, microseconds pause) {
 } // namespace
 
 int main() {
-    char pattern[] = "/tmp/halyard-benchmark-XXXXXX";
-    const std::string directory = ::mkdtemp(pattern);
-    const std::string path = directory + "/reporting.sock";
+    const halyard::testing::TempTree directory;
+    const std::string path = directory / "reporting.sock";
     std::printf("%-46s %8s %8s %8s %9s %9s\n", "ns per hand-over", "median", "99 %", "99.9 %",
                 "max", "dropped");
     measureNothing("nothing", 100'000, microseconds(0));
@@ -170,7 +170,5 @@ int main() {
     for (const Case& what : cases) {
         run(what, path);
     }
-    ::unlink(path.c_str());
-    ::rmdir(directory.c_str());
     return 0;
 }

@@ -2,9 +2,7 @@
 // thread, and in CPU time of the whole process (JSON, INSERT, commit, checkpoint
 // and retention included).
 #include <benchmark/benchmark.h>
-#include <cstdlib>
 #include <ctime>
-#include <filesystem>
 #include <functional>
 #include <future>
 #include <string>
@@ -12,6 +10,7 @@
 #include "common/Json.h"
 #include "linux/store/Store.h"
 #include "linux/system/LinuxFacts.h"
+#include "testing/TempTree.h"
 
 namespace {
 
@@ -41,16 +40,10 @@ double processCpuSeconds() {
 class BenchmarkStore {
 public:
     explicit BenchmarkStore(std::uint64_t maxBytes) {
-        std::string pattern = (std::filesystem::temp_directory_path() / "halyard.XXXXXX").string();
-        directory_ = ::mkdtemp(pattern.data());
         StoreOptions options;
         options.path = directory_ / "telemetry.db";
         options.limits.maxBytes = maxBytes;
         store_ = std::make_unique<Store>(std::move(options), clock_);
-    }
-    ~BenchmarkStore() {
-        store_.reset();
-        std::filesystem::remove_all(directory_);
     }
     BenchmarkStore(const BenchmarkStore&) = delete;
     BenchmarkStore& operator=(const BenchmarkStore&) = delete;
@@ -64,7 +57,7 @@ public:
 
 private:
     SystemClock clock_;
-    std::filesystem::path directory_;
+    testing::TempTree directory_;
     std::unique_ptr<Store> store_;
 };
 

@@ -8,7 +8,7 @@
 
 #include "load/Connection.h"
 #include "load/Options.h"
-#include "load/TemporaryDirectory.h"
+#include "testing/TempTree.h"
 
 namespace halyard::load {
 
@@ -56,7 +56,7 @@ private:
     [[noreturn]] void failWithLog(const std::string& what) const;
 
     const Options& options_;
-    TemporaryDirectory directory_;
+    testing::TempTree directory_;
     pid_t pid_ = -1;
 };
 

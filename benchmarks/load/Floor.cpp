@@ -11,9 +11,9 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include "load/TemporaryDirectory.h"
 #include "load/Throughput.h"
 #include "load/Workers.h"
+#include "testing/TempTree.h"
 
 namespace halyard::load {
 namespace {
@@ -113,7 +113,7 @@ std::uint64_t nanoseconds(const timeval& time) {
 
 Measurement measureFloor(const Options& options) {
     const std::vector<Stream> streams = makeStreams(options, modes().front());
-    const TemporaryDirectory directory(options.directory);
+    const testing::TempTree directory(options.directory);
     const std::string socketPath = directory.path() / "socket";
     const std::string filePath = directory.path() / "file";
     const pid_t server = startServer(listenAt(socketPath), filePath, streams.size());

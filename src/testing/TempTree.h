@@ -13,8 +13,10 @@ namespace halyard::testing {
 
 class TempTree {
 public:
-    TempTree() {
-        std::string name = (std::filesystem::temp_directory_path() / "halyard-XXXXXX").native();
+    // In `parent`, for what is to lie on a certain disk.
+    explicit TempTree(
+        const std::filesystem::path& parent = std::filesystem::temp_directory_path()) {
+        std::string name = (parent / "halyard-XXXXXX").native();
         if (::mkdtemp(name.data()) == nullptr) {
             throw std::runtime_error("no temporary directory: " + name);
         }
@@ -30,9 +32,10 @@ public:
     const std::filesystem::path& path() const { return root_; }
     std::filesystem::path operator/(std::string_view relative) const { return root_ / relative; }
 
-    // Makes the folders it takes; replaces what was there.
-    std::filesystem::path write(std::string_view relative, std::string_view text) const {
-        const std::filesystem::path file = root_ / relative;
+    // Makes the folders it takes; replaces what was there. `path` may also be one
+    // that this gave out.
+    std::filesystem::path write(const std::filesystem::path& path, std::string_view text) const {
+        const std::filesystem::path file = root_ / path;
         std::filesystem::create_directories(file.parent_path());
         std::ofstream(file, std::ios::binary | std::ios::trunc) << text;
         return file;

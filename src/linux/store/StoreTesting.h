@@ -2,9 +2,7 @@
 // be waited for, and a reader that is nobody's business but SQLite's.
 #pragma once
 
-#include <atomic>
 #include <condition_variable>
-#include <cstdlib>
 #include <filesystem>
 #include <future>
 #include <gtest/gtest.h>
@@ -16,46 +14,10 @@
 #include "linux/store/Store.h"
 #include "platform/Log.h"
 #include "platform/Platform.h"
+#include "testing/ManualClock.h"
+#include "testing/TempTree.h"
 
 namespace halyard::linux_ {
-
-class TempDirectory {
-public:
-    TempDirectory() {
-        std::string pattern = (std::filesystem::temp_directory_path() / "halyard.XXXXXX").string();
-        path_ = ::mkdtemp(pattern.data());
-    }
-    ~TempDirectory() {
-        std::error_code ignored;
-        std::filesystem::remove_all(path_, ignored);
-    }
-    TempDirectory(const TempDirectory&) = delete;
-    TempDirectory& operator=(const TempDirectory&) = delete;
-    const std::filesystem::path& path() const { return path_; }
-
-private:
-    std::filesystem::path path_;
-};
-
-// A clock that a test moves while the store's threads read it.
-class SharedClock final : public platform::Clock {
-public:
-    platform::WallTime wallTime() const override {
-        return platform::WallTime(std::chrono::seconds(1'700'000'000) + passed());
-    }
-    platform::SteadyTime steadyTime() const override {
-        return platform::SteadyTime(std::chrono::seconds(1000) + passed());
-    }
-    std::chrono::nanoseconds systemUptime() const override { return passed(); }
-    std::chrono::seconds utcOffset(platform::WallTime) const override {
-        return std::chrono::seconds(0);
-    }
-    void advance(std::chrono::nanoseconds by) { passed_ += by.count(); }
-
-private:
-    std::chrono::nanoseconds passed() const { return std::chrono::nanoseconds(passed_.load()); }
-    std::atomic<std::int64_t> passed_{0};
-};
 
 class WaitingLog final : public platform::LogSink {
 public:
@@ -173,8 +135,8 @@ protected:
         return store_->status().lost[static_cast<std::size_t>(reason)];
     }
 
-    TempDirectory directory_;
-    SharedClock clock_;
+    testing::TempTree directory_;
+    testing::ManualClock clock_;
     WaitingLog log_;
     platform::Platform platform_;
     StoreOptions options_;

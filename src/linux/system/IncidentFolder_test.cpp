@@ -12,6 +12,7 @@
 
 #include "linux/system/ProcessFacts.h"
 #include "testing/ManualClock.h"
+#include "testing/TempTree.h"
 
 namespace halyard::linux_ {
 namespace {
@@ -29,18 +30,13 @@ std::string contents(const fs::path& path) {
 class IncidentTree : public ::testing::Test {
 protected:
     IncidentTree() { fs::create_directory(proc_); }
-    ~IncidentTree() override { fs::remove_all(root_); }
 
-    void addFile(const fs::path& path, std::string_view text) {
-        fs::create_directories(path.parent_path());
-        std::ofstream(path, std::ios::binary) << text;
-    }
     void addProcess(int pid, std::string_view name) {
         const fs::path process = proc_ / std::to_string(pid);
-        addFile(process / "comm", std::string(name) + '\n');
-        addFile(process / "status", "State:\tR (running)\n");
-        addFile(process / "environ", "SECRET=1");
-        addFile(process / "cmdline", "mpv --password=x");
+        root_.write(process / "comm", std::string(name) + '\n');
+        root_.write(process / "status", "State:\tR (running)\n");
+        root_.write(process / "environ", "SECRET=1");
+        root_.write(process / "cmdline", "mpv --password=x");
     }
     std::vector<std::string> namesIn(const fs::path& directory) {
         std::vector<std::string> names;
@@ -51,12 +47,7 @@ protected:
         return names;
     }
 
-    static fs::path makeRoot() {
-        std::string name = (fs::temp_directory_path() / "halyard-incidents-XXXXXX").string();
-        return ::mkdtemp(name.data());
-    }
-
-    const fs::path root_ = makeRoot();
+    const testing::TempTree root_;
     const fs::path proc_ = root_ / "proc";
 };
 
@@ -164,9 +155,9 @@ TEST_F(IncidentFolderTest, NumbersGoOnAfterARestart) {
 }
 
 TEST_F(IncidentFolderTest, ForeignAndUnfinishedEntriesAreToldApart) {
-    addFile(directory_ / "notes.txt", "mine");
-    addFile(directory_ / "7-file", "no folder");
-    addFile(directory_ / ".unfinished" / "old", "of a killed daemon");
+    root_.write(directory_ / "notes.txt", "mine");
+    root_.write(directory_ / "7-file", "no folder");
+    root_.write(directory_ / ".unfinished" / "old", "of a killed daemon");
     IncidentFolder folder(clock_, options());
     const fs::path kept(std::string(take(folder, signature_)["path"].text()));
     EXPECT_EQ(kept.filename().string().substr(0, 7), "000001-");
@@ -177,7 +168,7 @@ TEST_F(IncidentFolderTest, ForeignAndUnfinishedEntriesAreToldApart) {
 }
 
 TEST_F(IncidentFolderTest, AFolderThatCannotBeMadeIsToldInTheResponse) {
-    addFile(root_ / "state", "a file where the folder should be");
+    root_.write(root_ / "state", "a file where the folder should be");
     IncidentFolder folder(clock_, options());
     const Dictionary response = take(folder, signature_);
     EXPECT_EQ(response["success"], Value(false));
@@ -254,9 +245,9 @@ TEST_F(ProcessFactsTest, ReportsTheFirstFewAndCountsTheRest) {
 
 TEST_F(ProcessFactsTest, CutsLongFilesAndSkipsWhatIsNoProcess) {
     addProcess(10, "mpv");
-    addFile(proc_ / "10" / "status", std::string(kMostFactBytes + 1, 's'));
-    addFile(proc_ / "self" / "comm", "mpv\n");
-    addFile(proc_ / "12x" / "comm", "mpv\n");
+    root_.write(proc_ / "10" / "status", std::string(kMostFactBytes + 1, 's'));
+    root_.write(proc_ / "self" / "comm", "mpv\n");
+    root_.write(proc_ / "12x" / "comm", "mpv\n");
     const NamedProcesses named = processesNamed("mpv", proc_);
     ASSERT_EQ(named.processes.size(), 1U);
     EXPECT_EQ(named.processes[0].facts.at(0).text.size(), kMostFactBytes);
