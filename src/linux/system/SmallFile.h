@@ -10,8 +10,7 @@
 namespace halyard::linux_ {
 
 // The whole of a regular file. file_too_large when it has more than `most`
-// bytes, invalid_argument when it is none; never waits, whatever `path` is. Any
-// thread.
+// bytes, invalid_argument when it is none: others are not even opened. Any thread.
 [[nodiscard]] std::variant<std::string, std::errc> readSmallFile(const std::filesystem::path& path,
                                                                  std::size_t most);
 

@@ -1,7 +1,9 @@
 #include "linux/system/SmallFile.h"
 
 #include <gtest/gtest.h>
+#include <sys/inotify.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include "testing/TempTree.h"
 
@@ -38,6 +40,18 @@ TEST(SmallFileTest, TellsWhyThereIsNoText) {
     EXPECT_EQ(readSmallFile(tree / "file/x", 9), Result(std::errc::not_a_directory));
     EXPECT_EQ(readSmallFile(tree.path(), 9), Result(std::errc::is_a_directory));
     EXPECT_EQ(readSmallFile(tree / "pipe", 9), Result(std::errc::invalid_argument));
+}
+
+TEST(SmallFileTest, WhatIsNoRegularFileIsNotEvenOpened) {
+    const testing::TempTree tree;
+    ASSERT_EQ(::mkfifo((tree / "pipe").c_str(), 0600), 0);
+    const int watcher = ::inotify_init1(IN_NONBLOCK | IN_CLOEXEC);
+    ASSERT_GE(::inotify_add_watch(watcher, (tree / "pipe").c_str(), IN_OPEN), 0);
+
+    EXPECT_EQ(readSmallFile(tree / "pipe", 9), Result(std::errc::invalid_argument));
+    char events[4096];
+    EXPECT_LT(::read(watcher, events, sizeof events), 0) << "opened";
+    ::close(watcher);
 }
 
 } // namespace

@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <cstring>
 #include <elf.h>
-#include <fcntl.h>
 #include <fmt/format.h>
 #include <sstream>
 #include <sys/stat.h>
@@ -120,35 +119,12 @@ std::optional<std::string> libraryPath(const std::string& line) {
     return path;
 }
 
-// Only what is a regular file is opened for reading: others may do something when
-// they are opened. The first look opens nothing, the second opens what it saw.
-std::shared_ptr<OpenLibrary> openLibrary(const std::string& path) {
-    const OpenLibrary seen(::open(path.c_str(), O_PATH | O_CLOEXEC));
-    struct stat facts {};
-    if (seen.descriptor() < 0 || ::fstat(seen.descriptor(), &facts) != 0 ||
-        !S_ISREG(facts.st_mode)) {
-        return nullptr;
-    }
-    auto file = std::make_shared<OpenLibrary>(
-        ::open(seen.path().c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
-    return file->descriptor() >= 0 ? file : nullptr;
-}
-
 } // namespace
 
-OpenLibrary::~OpenLibrary() {
-    if (descriptor_ >= 0) {
-        ::close(descriptor_);
-    }
-}
-
-std::string OpenLibrary::path() const {
-    return fmt::format("/proc/self/fd/{}", descriptor_);
-}
-
 std::optional<std::uint64_t> functionOffset(const fs::path& library, std::string_view function) {
-    const auto file = openLibrary(library);
-    return file ? ElfFile(file->descriptor()).offsetOf(function) : std::nullopt;
+    const RegularFile file(library);
+    return file.error() == std::errc{} ? ElfFile(file.descriptor()).offsetOf(function)
+                                       : std::nullopt;
 }
 
 // What a client maps is its own to choose, and so are the bounds that it meets
@@ -185,9 +161,9 @@ void MarkLibraries::addLibrariesOf(std::int32_t pid, std::vector<Library>& found
 void MarkLibraries::addLibrary(std::int32_t pid, const std::string& path,
                                std::vector<Library>& found) {
     // A process may live in another root than ours.
-    const auto file = openLibrary(fmt::format("/proc/{}/root{}", pid, path));
+    const auto file = std::make_shared<RegularFile>(fmt::format("/proc/{}/root{}", pid, path));
     struct stat facts {};
-    if (!file || ::fstat(file->descriptor(), &facts) != 0) {
+    if (file->error() != std::errc{} || ::fstat(file->descriptor(), &facts) != 0) {
         return;
     }
     const std::pair<std::uint64_t, std::uint64_t> key{facts.st_dev, facts.st_ino};

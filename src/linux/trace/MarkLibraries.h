@@ -13,28 +13,14 @@
 #include <utility>
 #include <vector>
 
+#include "linux/system/RegularFile.h"
+
 namespace halyard::linux_ {
 
 // The offset in the file of a function that an ELF library exports; none when
 // it has no such function.
 [[nodiscard]] std::optional<std::uint64_t> functionOffset(const std::filesystem::path& library,
                                                           std::string_view function);
-
-// A file that is held open, by its descriptor.
-class OpenLibrary {
-public:
-    explicit OpenLibrary(int descriptor) : descriptor_(descriptor) {}
-    ~OpenLibrary();
-    OpenLibrary(const OpenLibrary&) = delete;
-    OpenLibrary& operator=(const OpenLibrary&) = delete;
-
-    int descriptor() const { return descriptor_; }
-    // Leads to this file, whatever has become of its name.
-    std::string path() const;
-
-private:
-    const int descriptor_;
-};
 
 class MarkLibraries {
 public:
@@ -44,7 +30,7 @@ public:
     struct Library {
         std::string name; // for people: the path that the process has it by
         std::uint64_t offset;
-        std::shared_ptr<OpenLibrary> file;
+        std::shared_ptr<RegularFile> file;
     };
 
     // More are left out: libraries of a session, its processes at a time, and paths
