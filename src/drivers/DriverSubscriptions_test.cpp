@@ -103,10 +103,12 @@ TEST_F(DriverSubscriptionsTest, AGroupListedWithAnErrorIsStillSubscribed) {
 }
 
 TEST_F(DriverSubscriptionsTest, ASystemWithoutSuchStatisticsHasNoSubscriptions) {
-    platform::Platform bare = platform::current();
-    bare.hwReport = nullptr;
+    const platform::Platform& whole = platform::current();
+    platform::Platform bare;
+    bare.log = whole.log;
     platform::install(&bare);
     EXPECT_THAT(HYReportingDriverUtility().ioChannelSubscriptions(), IsEmpty());
+    platform::install(&whole);
 }
 
 TEST_F(DriverSubscriptionsTest, TheListCanBeReplaced) {

@@ -1,8 +1,5 @@
 #include "platform/HYReportingUtilityDevice.h"
 
-#include <atomic>
-#include <mutex>
-
 #include "common/Utf8.h"
 #include "platform/Log.h"
 #include "platform/Platform.h"
@@ -44,21 +41,8 @@ bool HYReportingUtilityProcessInfoForPID(std::int32_t pid, platform::ProcessInfo
 }
 
 bool HYReportingUtilityIsInternalBuild() {
-    // Twice the installation's number plus the answer; zero before the first.
-    static std::atomic<std::uint64_t> known{0};
-    static std::mutex asking;
-    const std::uint64_t installation = platform::installations();
-    if (std::uint64_t answer = known.load(std::memory_order_acquire); answer / 2 == installation) {
-        return answer % 2 != 0;
-    }
-    const std::lock_guard lock(asking);
-    if (std::uint64_t answer = known.load(std::memory_order_relaxed); answer / 2 == installation) {
-        return answer % 2 != 0;
-    }
-    const bool internal =
-        platform::current().deviceProperties->boolean("InternalBuild").value_or(false);
-    known.store(installation * 2 + (internal ? 1 : 0), std::memory_order_release);
-    return internal;
+    const platform::Platform& system = platform::current();
+    return system.buildKind.isInternal(*system.deviceProperties);
 }
 
 bool HYReportingUtilityWait(platform::Condition& condition, double timeout, const bool* done,

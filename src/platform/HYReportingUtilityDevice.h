@@ -20,8 +20,7 @@ std::optional<std::string> HYReportingUtilityProcessNameForPID(std::int32_t pid)
 [[nodiscard]] bool HYReportingUtilityProcessInfoForPID(std::int32_t pid,
                                                        platform::ProcessInfo& info);
 
-// The device property "InternalBuild". Asked once in the process's life (once
-// for each platform that a test installs).
+// The device property "InternalBuild"; what the device answered first stays.
 bool HYReportingUtilityIsInternalBuild();
 
 // Waits until *done is set. Each wake-up without the flag grants a fresh

@@ -2,7 +2,10 @@
 
 #include <gtest/gtest.h>
 #include <limits>
+#include <map>
+#include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
 #include "platform/Platform.h"
@@ -26,6 +29,16 @@ protected:
     }
     ~DeviceHelpersTest() override { platform::install(nullptr); }
 
+    // On a platform that has asked nothing yet.
+    bool isInternalAtFirst(std::map<std::string, bool> properties) {
+        platform::Platform fresh;
+        fresh.deviceProperties = &properties_;
+        properties_.booleans = std::move(properties);
+        platform::install(&fresh);
+        const bool internal = HYReportingUtilityIsInternalBuild();
+        platform::install(&platform_);
+        return internal;
+    }
     bool wait(double timeout) {
         return HYReportingUtilityWait(condition_, timeout, &done_, "waiting", "timed out",
                                       HYReportingSessionCategory);
@@ -73,12 +86,14 @@ TEST_F(DeviceHelpersTest, ProcessInfoOfAVanishedProcessIsLeftAlone) {
 }
 
 TEST_F(DeviceHelpersTest, ABuildIsInternalOnlyWhenTheDeviceSaysSo) {
+    EXPECT_FALSE(isInternalAtFirst({}));
+    EXPECT_FALSE(isInternalAtFirst({{"InternalBuild", false}}));
+    EXPECT_TRUE(isInternalAtFirst({{"InternalBuild", true}}));
+}
+
+TEST_F(DeviceHelpersTest, EachPlatformKeepsItsFirstAnswer) {
     EXPECT_FALSE(HYReportingUtilityIsInternalBuild());
-    platform::install(&platform_);
-    properties_.booleans["InternalBuild"] = true;
-    EXPECT_TRUE(HYReportingUtilityIsInternalBuild());
-    platform::install(&platform_);
-    properties_.booleans["InternalBuild"] = false;
+    EXPECT_TRUE(isInternalAtFirst({{"InternalBuild", true}}));
     EXPECT_FALSE(HYReportingUtilityIsInternalBuild());
 }
 

@@ -4,6 +4,7 @@
 #include <cassert>
 
 #include "common/Description.h"
+#include "platform/Device.h"
 #include "platform/Log.h"
 
 fmt::format_context::iterator
@@ -17,7 +18,6 @@ namespace halyard::platform {
 namespace {
 
 const Platform* installed = nullptr;
-std::uint64_t installedTimes = 0;
 
 std::string_view baseName(std::string_view path) {
     return path.substr(path.rfind('/') + 1);
@@ -25,13 +25,13 @@ std::string_view baseName(std::string_view path) {
 
 } // namespace
 
-void install(const Platform* platform) {
-    installed = platform;
-    ++installedTimes;
+bool BuildKind::isInternal(const DeviceProperties& device) const {
+    std::call_once(asked_, [&] { internal_ = device.boolean("InternalBuild").value_or(false); });
+    return internal_;
 }
 
-std::uint64_t installations() {
-    return installedTimes;
+void install(const Platform* platform) {
+    installed = platform;
 }
 
 const Platform& current() {

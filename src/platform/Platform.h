@@ -5,7 +5,7 @@
 // borrowed and must outlive the installation.
 #pragma once
 
-#include <cstdint>
+#include <mutex>
 
 namespace halyard::platform {
 
@@ -33,6 +33,18 @@ class RelayReportingFramework;
 class ResultsFiles;
 class TraceMarks;
 
+// The kind of build that the device says it is. It stays what the first answer
+// said, so it is kept with the platform whose device answered: one in the daemon,
+// another in each test. Any thread.
+class BuildKind {
+public:
+    bool isInternal(const DeviceProperties& device) const;
+
+private:
+    mutable std::once_flag asked_;
+    mutable bool internal_ = false;
+};
+
 struct Platform {
     Clock* clock = nullptr;
     Random* random = nullptr;
@@ -58,15 +70,13 @@ struct Platform {
     Operations* operations = nullptr;
     // Null where the system has no such statistics.
     HWReport* hwReport = nullptr;
+    // Not borrowed, and why a platform cannot be copied.
+    BuildKind buildKind = {};
 };
 
 // Replaces what was installed before; null uninstalls. Requires that no other
 // thread uses the platform meanwhile.
 void install(const Platform* platform);
-
-// How often a platform was installed. What is to be worked out once in a
-// process's life is kept under this number, so that tests do not share it.
-std::uint64_t installations();
 
 // Requires an installed platform.
 const Platform& current();

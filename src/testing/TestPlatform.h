@@ -29,35 +29,35 @@ class TestPlatform {
     // platform for its log and its marks while it goes.
     struct Installation {
         ~Installation() { platform::install(nullptr); }
-        platform::Platform platform;
+        const platform::Platform platform;
     };
     Installation installation_;
 
 public:
-    TestPlatform() {
-        installation_.platform = {.clock = &clock,
-                                  .random = &random,
-                                  .queues = &queues,
-                                  .conditions = &conditions,
-                                  .log = &log,
-                                  .files = &files,
-                                  .traceMarks = &traceMarks,
-                                  .eventTrace = &eventTrace,
-                                  .resultsFiles = &resultsFiles,
-                                  .performanceTraces = &performanceTraces,
-                                  .preferences = &preferences,
-                                  .featureFlags = &featureFlags,
-                                  .deviceProperties = &deviceProperties,
-                                  .notifications = &notifications,
-                                  .processTable = &processTable,
-                                  .ownProcess = &ownProcess,
-                                  .relayReporting = &relayReporting,
-                                  .analytics = &analytics,
-                                  .energyLedger = &energyLedger,
-                                  .metrics = &metrics,
-                                  .incidentReporter = &incidentReporter,
-                                  .operations = &operations,
-                                  .hwReport = &hwReport};
+    TestPlatform()
+        : installation_{{.clock = &clock,
+                         .random = &random,
+                         .queues = &queues,
+                         .conditions = &conditions,
+                         .log = &log,
+                         .files = &files,
+                         .traceMarks = &traceMarks,
+                         .eventTrace = &eventTrace,
+                         .resultsFiles = &resultsFiles,
+                         .performanceTraces = &performanceTraces,
+                         .preferences = &preferences,
+                         .featureFlags = &featureFlags,
+                         .deviceProperties = &deviceProperties,
+                         .notifications = &notifications,
+                         .processTable = &processTable,
+                         .ownProcess = &ownProcess,
+                         .relayReporting = &relayReporting,
+                         .analytics = &analytics,
+                         .energyLedger = &energyLedger,
+                         .metrics = &metrics,
+                         .incidentReporter = &incidentReporter,
+                         .operations = &operations,
+                         .hwReport = &hwReport}} {
         platform::install(&installation_.platform);
     }
     ~TestPlatform() { queues.clear(); }
