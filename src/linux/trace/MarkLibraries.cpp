@@ -9,6 +9,7 @@
 #include <unistd.h>
 
 #include "linux/system/SmallFile.h"
+#include "platform/Log.h"
 
 namespace halyard::linux_ {
 namespace {
@@ -167,12 +168,22 @@ void MarkLibraries::addLibrary(std::int32_t pid, const std::string& path,
         return;
     }
     const std::pair<std::uint64_t, std::uint64_t> key{facts.st_dev, facts.st_ino};
-    if (seenFiles_.size() >= kMostLibraries || seenFiles_.contains(key)) {
+    if (toldOfMore_ || seenFiles_.contains(key)) {
         return;
     }
-    if (const auto offset = ElfFile(file->descriptor()).offsetOf(kFunction)) {
+    const auto offset = ElfFile(file->descriptor()).offsetOf(kFunction);
+    if (!offset) {
+        return;
+    }
+    if (seenFiles_.size() < kMostLibraries) {
         seenFiles_.insert(key);
         found.push_back({path, *offset, file});
+    } else {
+        toldOfMore_ = true;
+        HY_LOG_ERROR(HYReportingTraceCategory,
+                     "a client's library is not traced: {}: {} others are; no line tells of "
+                     "further ones",
+                     path, kMostLibraries);
     }
 }
 

@@ -33,8 +33,8 @@ public:
         std::shared_ptr<RegularFile> file;
     };
 
-    // More are left out: libraries of a session, its processes at a time, and paths
-    // of one process.
+    // More are left out: libraries of a session, which is told once, its processes
+    // at a time, and paths of one process.
     static constexpr std::size_t kMostLibraries = 32;
     static constexpr std::size_t kMostProcesses = 4096;
     static constexpr std::size_t kMostOfProcess = 4;
@@ -48,6 +48,7 @@ private:
 
     std::set<std::int32_t> seenProcesses_;                        // that are still there
     std::set<std::pair<std::uint64_t, std::uint64_t>> seenFiles_; // device and inode
+    bool toldOfMore_ = false;
 };
 
 } // namespace halyard::linux_

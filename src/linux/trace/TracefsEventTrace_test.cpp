@@ -394,6 +394,29 @@ TEST(MarkLibrariesTest, FurtherPathsOfOneProcessAreNotLookedAt) {
     EXPECT_THAT(libraries.newLibrariesOf({hostile.pid(), ::getpid()}), SizeIs(1));
 }
 
+TEST(MarkLibrariesTest, WhatIsMoreThanAllTogetherMayHaveIsLeftOutAndToldOnce) {
+    const halyard::testing::TestPlatform platform;
+    const halyard::testing::TempTree tree;
+    MarkLibraries libraries;
+    std::size_t probed = 0;
+    std::vector<std::string> leftOut;
+    for (std::size_t i = 0; i < MarkLibraries::kMostLibraries + 2; ++i) {
+        const fs::path path = tree.write(fmt::format("libhalyard.so.{}", i), libraryBytes());
+        const MappedCode copy(path);
+        const auto found = libraries.newLibrariesOf({::getpid()});
+        probed += found.size();
+        if (found.empty()) {
+            leftOut.push_back(path);
+        }
+        EXPECT_THAT(libraries.newLibrariesOf({}), IsEmpty()); // Forgets the process.
+    }
+    EXPECT_EQ(probed, 32U);
+    ASSERT_GE(leftOut.size(), 2U);
+    EXPECT_THAT(platform.log.texts(),
+                ElementsAre("a client's library is not traced: " + leftOut[0] +
+                            ": 32 others are; no line tells of further ones"));
+}
+
 TEST(MarkLibrariesTest, AProcessThatHasGoneIsForgotten) {
     ASSERT_NE(markFunction(), nullptr) << ::dlerror();
     const halyard::testing::TempTree tree;
