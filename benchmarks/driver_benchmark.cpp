@@ -48,7 +48,7 @@ void delta(benchmark::State& state) {
         std::int64_t sum = 0;
         const auto change = statistics.library.createSamplesDelta(before.get(), *after).value;
         statistics.library.iterate(*change, [&](const platform::HWReportChannel& channel) {
-            sum += channel.simpleGetIntegerValue() + channel.stateGetCount();
+            sum += channel.value + static_cast<std::int64_t>(channel.states.size());
             return 0;
         });
         benchmark::DoNotOptimize(sum);

@@ -4,6 +4,7 @@
 #include <gmock/gmock.h>
 #include <memory>
 #include <string>
+#include <string_view>
 #include <utility>
 #include <vector>
 
@@ -14,7 +15,7 @@ namespace halyard {
 
 class DriverTest : public ::testing::Test {
 protected:
-    using Channel = testing::FakeHWReportChannel;
+    using Channel = platform::HWReportChannel;
     using Group = testing::FakeHWReport::Group;
     using Lines = std::vector<testing::RecordingLog::Line>;
 
@@ -33,11 +34,11 @@ protected:
         return result;
     }
 
-    static Channel simple(std::string name, std::int64_t value) {
+    static Channel simple(std::string_view name, std::int64_t value) {
         Channel channel;
         channel.format = platform::kHWReportFormatSimple;
         channel.group = "Speaker";
-        channel.name = std::move(name);
+        channel.name = name;
         channel.value = value;
         return channel;
     }

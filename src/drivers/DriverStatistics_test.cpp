@@ -61,8 +61,9 @@ TEST_F(DriverStatisticsTest, AKeyKeepsThePlaceOfEmptyNames) {
 
 TEST_F(DriverStatisticsTest, AKeyMayBeOfAnyLength) {
     Channel channel;
-    channel.name = std::string(5000, 'x');
-    EXPECT_EQ(key(channel), "Simple_" + std::string(5000, 'x'));
+    const std::string name(5000, 'x');
+    channel.name = name;
+    EXPECT_EQ(key(channel), "Simple_" + name);
 }
 
 TEST_F(DriverStatisticsTest, TheKindIsNotCleaned) {

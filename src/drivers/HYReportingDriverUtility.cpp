@@ -164,7 +164,7 @@ void HYReportingDriverUtility::collect(const HYReportingIOChannelSubscription& s
 
 void HYReportingDriverUtility::processChannel(const HWReportChannel& channel,
                                               Statistics& statistics) {
-    const unsigned format = channel.getFormat();
+    const unsigned format = channel.format;
     switch (format) {
     case platform::kHWReportFormatSimple:
         processSimpleData(channel, statistics.simple);
@@ -179,27 +179,25 @@ void HYReportingDriverUtility::processChannel(const HWReportChannel& channel,
     case platform::kHWReportFormatLast:
         HY_LOG_DEBUG(HYReportingDriverUtilityCategory,
                      "Dropping sample of type : {} for group : {} subgroup : {}", format,
-                     orNull(channel.getGroup()), orNull(channel.getSubGroup()));
+                     orNull(channel.group), orNull(channel.subGroup));
         break;
     default:
         HY_LOG_ERROR(HYReportingDriverUtilityCategory,
                      "The HWReportingFormat {} is not supported group : {} subgroup : {}", format,
-                     orNull(channel.getGroup()), orNull(channel.getSubGroup()));
+                     orNull(channel.group), orNull(channel.subGroup));
         break;
     }
 }
 
 void HYReportingDriverUtility::processSimpleData(const HWReportChannel& channel,
                                                  Dictionary& driverStats) {
-    const std::int64_t value = channel.simpleGetIntegerValue();
-    if (value >= 1) {
-        driverStats.set(getDriverStatsKey(channel, "Simple"), value);
+    if (channel.value >= 1) {
+        driverStats.set(getDriverStatsKey(channel, "Simple"), channel.value);
     }
 }
 
 void HYReportingDriverUtility::processHistogramData(const HWReportChannel& channel,
                                                     Dictionary& driverStats) {
-    const std::int32_t count = channel.histogramGetBucketCount();
     // From 0, so bounds that are all positive still report a lower end of 0.
     std::int64_t lower = 0;
     std::int64_t upper = 0;
@@ -207,41 +205,39 @@ void HYReportingDriverUtility::processHistogramData(const HWReportChannel& chann
     std::int64_t bucketLower = 0;
     std::int64_t bucketUpper = 0;
     fmt::memory_buffer buckets;
-    for (std::int32_t index = 0; index < count; ++index) {
-        if (const int result = channel.histogramGetBucketBounds(index, bucketLower, bucketUpper)) {
+    for (const auto& bucket : channel.buckets) {
+        if (bucket.boundsError != 0) {
             HY_LOG_INFO(HYReportingDriverUtilityCategory, "Error in getting the bucket bounds : {}",
-                        result);
+                        bucket.boundsError);
+        } else {
+            bucketLower = bucket.lower;
+            bucketUpper = bucket.upper;
         }
         lower = std::min(lower, bucketLower);
         upper = std::max(upper, bucketUpper);
-        if (const std::int64_t hits = channel.histogramGetBucketHits(index)) {
+        if (bucket.hits != 0) {
             fmt::format_to(std::back_inserter(buckets), "{}-{}:{};", bucketLower, bucketUpper,
-                           hits);
+                           bucket.hits);
         }
     }
     if (buckets.size() == 0) {
         return;
     }
     driverStats.set(getDriverStatsKey(channel, "Histogram"),
-                    fmt::format("count={},lower={},upper={},min={},max={},unit={}::{}", count,
-                                lower, upper, channel.histogramGetMinValue(),
-                                channel.histogramGetMaxValue(), orNull(channel.getUnitLabel()),
+                    fmt::format("count={},lower={},upper={},min={},max={},unit={}::{}",
+                                channel.buckets.size(), lower, upper, channel.min, channel.max,
+                                orNull(channel.unit),
                                 std::string_view(buckets.data(), buckets.size() - 1)));
 }
 
 void HYReportingDriverUtility::processStateData(const HWReportChannel& channel,
                                                 Dictionary& driverStats) {
-    const std::int32_t count = channel.stateGetCount();
     std::string text;
-    for (std::int32_t index = 0; index < count; ++index) {
-        const auto name = channel.stateGetNameForIndex(index);
-        const std::uint64_t transitions = channel.stateGetInTransitions(index);
-        const std::uint64_t residency = channel.stateGetResidency(index);
-        const double dutyCycle = channel.stateGetDutyCycle(index);
-        if (residency != 0) {
+    for (const auto& state : channel.states) {
+        if (state.residency != 0) {
             fmt::format_to(std::back_inserter(text),
-                           "name:{},transition:{},residency:{},duty_cycle:{:f};", orNull(name),
-                           transitions, residency, dutyCycle);
+                           "name:{},transition:{},residency:{},duty_cycle:{:f};",
+                           orNull(state.name), state.transitions, state.residency, state.dutyCycle);
         }
     }
     HY_LOG_DEBUG(HYReportingDriverUtilityCategory, "the current reported data is : {}", text);
@@ -252,18 +248,18 @@ void HYReportingDriverUtility::processStateData(const HWReportChannel& channel,
 std::string HYReportingDriverUtility::getDriverStatsKey(const HWReportChannel& channel,
                                                         std::string_view type) {
     std::string key;
-    if (const auto driver = channel.getDriverName()) {
-        appendCleaned(key, driver->substr(0, driver->find('<')));
+    if (channel.driver) {
+        appendCleaned(key, channel.driver->substr(0, channel.driver->find('<')));
         key += '_';
     }
-    for (const auto& part : {channel.getGroup(), channel.getSubGroup()}) {
+    for (const auto& part : {channel.group, channel.subGroup}) {
         if (part) {
             appendCleaned(key, *part);
             key += '_';
         }
     }
     key.append(type).append("_");
-    appendCleaned(key, channel.getChannelName().value_or(""));
+    appendCleaned(key, channel.name.value_or(""));
     return key;
 }
 

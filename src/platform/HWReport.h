@@ -15,6 +15,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 namespace halyard::platform {
 
@@ -36,36 +37,33 @@ inline constexpr std::uint8_t kHWReportFormatHistogram = 3;
 // Above are formats that nobody has heard of; 0 and this one are known, unused.
 inline constexpr std::uint8_t kHWReportFormatLast = 4;
 
-// One entry of a sample set, for as long as it is iterated. The values of
-// another format than its own are 0, and so is what lies past a count.
-class HWReportChannel {
-public:
+// One entry of a sample set, for as long as it is iterated: its texts are
+// borrowed from the set. Only what belongs to its format is filled in.
+struct HWReportChannel {
     using Text = std::optional<std::string_view>;
+    struct Bucket {
+        std::int64_t lower = 0;
+        std::int64_t upper = 0;
+        std::int64_t hits = 0;
+        int boundsError = 0; // not 0: nobody knows the bounds
+    };
+    struct State {
+        Text name;
+        std::uint64_t transitions = 0; // into the state
+        std::uint64_t residency = 0;
+        double dutyCycle = 0; // the share of the time that the set covers
+    };
 
-    virtual ~HWReportChannel() = default;
-    virtual std::uint8_t getFormat() const = 0;
-    virtual Text getDriverName() const = 0;
-    virtual Text getGroup() const = 0;
-    virtual Text getSubGroup() const = 0;
-    virtual Text getChannelName() const = 0;
-    virtual Text getUnitLabel() const = 0;
+    std::uint8_t format = 0;
+    Text driver, group, subGroup, name, unit;
 
-    virtual std::int64_t simpleGetIntegerValue() const = 0;
+    std::int64_t value = 0; // of a simple one
 
-    virtual std::int32_t histogramGetBucketCount() const = 0;
-    // 0, or an error that leaves the bounds as they are.
-    virtual int histogramGetBucketBounds(std::int32_t index, std::int64_t& lower,
-                                         std::int64_t& upper) const = 0;
-    virtual std::int64_t histogramGetBucketHits(std::int32_t index) const = 0;
-    virtual std::int64_t histogramGetMinValue() const = 0;
-    virtual std::int64_t histogramGetMaxValue() const = 0;
+    std::vector<Bucket> buckets; // of a histogram,
+    std::int64_t min = 0;        // with the ends of what it recorded
+    std::int64_t max = 0;
 
-    virtual std::int32_t stateGetCount() const = 0;
-    virtual Text stateGetNameForIndex(std::int32_t index) const = 0;
-    virtual std::uint64_t stateGetInTransitions(std::int32_t index) const = 0;
-    virtual std::uint64_t stateGetResidency(std::int32_t index) const = 0;
-    // The share of the time that the set covers.
-    virtual double stateGetDutyCycle(std::int32_t index) const = 0;
+    std::vector<State> states;
 };
 
 class HWReportChannels {

@@ -81,7 +81,7 @@ TEST_F(DriverReportsTest, AStopDoesBothBeforeTheSessionEnds) {
 
 TEST_F(DriverReportsTest, TheReportReachesTheUploadSessionBeforeItEnds) {
     client().createAndStart(7);
-    testing::FakeHWReportChannel channel;
+    platform::HWReportChannel channel;
     channel.format = platform::kHWReportFormatSimple;
     channel.name = "Underruns";
     channel.value = 3;

@@ -13,69 +13,6 @@
 
 namespace halyard::testing {
 
-struct FakeHWReportChannel final : platform::HWReportChannel {
-    using OptionalText = std::optional<std::string>;
-    struct Bucket {
-        std::int64_t lower = 0;
-        std::int64_t upper = 0;
-        std::int64_t hits = 0;
-        int boundsError = 0;
-    };
-    struct State {
-        OptionalText name;
-        std::uint64_t transitions = 0;
-        std::uint64_t residency = 0;
-        double dutyCycle = 0;
-    };
-
-    std::uint8_t format = 0;
-    OptionalText driver, group, subGroup, name, unit;
-    std::int64_t value = 0;
-    std::vector<Bucket> buckets;
-    std::int64_t min = 0;
-    std::int64_t max = 0;
-    std::vector<State> states;
-
-    std::uint8_t getFormat() const override { return format; }
-    Text getDriverName() const override { return driver; }
-    Text getGroup() const override { return group; }
-    Text getSubGroup() const override { return subGroup; }
-    Text getChannelName() const override { return name; }
-    Text getUnitLabel() const override { return unit; }
-    std::int64_t simpleGetIntegerValue() const override { return value; }
-    std::int32_t histogramGetBucketCount() const override {
-        return static_cast<std::int32_t>(buckets.size());
-    }
-    int histogramGetBucketBounds(std::int32_t index, std::int64_t& lower,
-                                 std::int64_t& upper) const override {
-        const Bucket& bucket = buckets.at(static_cast<std::size_t>(index));
-        if (bucket.boundsError == 0) {
-            lower = bucket.lower;
-            upper = bucket.upper;
-        }
-        return bucket.boundsError;
-    }
-    std::int64_t histogramGetBucketHits(std::int32_t index) const override {
-        return buckets.at(static_cast<std::size_t>(index)).hits;
-    }
-    std::int64_t histogramGetMinValue() const override { return min; }
-    std::int64_t histogramGetMaxValue() const override { return max; }
-    std::int32_t stateGetCount() const override { return static_cast<std::int32_t>(states.size()); }
-    Text stateGetNameForIndex(std::int32_t index) const override { return state(index).name; }
-    std::uint64_t stateGetInTransitions(std::int32_t index) const override {
-        return state(index).transitions;
-    }
-    std::uint64_t stateGetResidency(std::int32_t index) const override {
-        return state(index).residency;
-    }
-    double stateGetDutyCycle(std::int32_t index) const override { return state(index).dutyCycle; }
-
-private:
-    const State& state(std::int32_t index) const {
-        return states.at(static_cast<std::size_t>(index));
-    }
-};
-
 class FakeHWReport final : public platform::HWReport {
 public:
     // How one group behaves; groups that are not in `groups` list nothing, and
@@ -90,7 +27,7 @@ public:
         std::optional<std::int64_t> samplingError = {};
         bool differs = true; // a delta comes back
         std::optional<std::int64_t> deltaError = {};
-        std::vector<FakeHWReportChannel> delta = {};
+        std::vector<platform::HWReportChannel> delta = {};
     };
 
     struct Channels final : platform::HWReportChannels {
@@ -104,7 +41,7 @@ public:
     struct Samples final : platform::HWReportSamples {
         std::string group;
         int number = 0;
-        std::vector<FakeHWReportChannel> channels;
+        std::vector<platform::HWReportChannel> channels;
     };
 
     platform::HWReportResult<platform::HWReportChannelsRef>

@@ -125,8 +125,8 @@ protected:
         std::vector<std::string> result;
         library_->iterate(*library_->createSamplesDelta(before, after).value,
                           [&](const platform::HWReportChannel& each) {
-                              result.push_back(std::string(*each.getChannelName()) + "=" +
-                                               std::to_string(each.simpleGetIntegerValue()));
+                              result.push_back(std::string(*each.name) + "=" +
+                                               std::to_string(each.value));
                               return 0;
                           });
         return result;
@@ -137,13 +137,12 @@ protected:
         std::vector<std::string> result;
         library_->iterate(*library_->createSamplesDelta(&before, after).value,
                           [&](const platform::HWReportChannel& each) {
-                              for (int i = 0; i < each.stateGetCount(); ++i) {
-                                  if (each.stateGetResidency(i) != 0) {
-                                      result.push_back(
-                                          std::string(*each.getChannelName()) + " " +
-                                          std::string(*each.stateGetNameForIndex(i)) + " " +
-                                          std::to_string(each.stateGetResidency(i)) + " " +
-                                          std::to_string(each.stateGetDutyCycle(i)));
+                              for (const auto& state : each.states) {
+                                  if (state.residency != 0) {
+                                      result.push_back(std::string(*each.name) + " " +
+                                                       std::string(*state.name) + " " +
+                                                       std::to_string(state.residency) + " " +
+                                                       std::to_string(state.dutyCycle));
                                   }
                               }
                               return 0;

@@ -7,107 +7,37 @@ namespace halyard::linux_ {
 
 using platform::HWReportChannel;
 
-// One entry of a set, as the core reads it. What is asked past its end is 0.
-class SampledChannel final : public HWReportChannel {
-public:
-    SampledChannel(const SampleSet& set, std::size_t index)
-        : facts_(*set.list_->channels[index]), entry_(set.entries_[index]),
-          numbers_(set.numbers(entry_)), elapsed_(set.elapsed_) {}
+namespace {
 
-    std::uint8_t getFormat() const override {
-        switch (facts_.names.format) {
-        case ChannelFormat::Simple:
-            return platform::kHWReportFormatSimple;
-        case ChannelFormat::State:
-            return platform::kHWReportFormatState;
-        case ChannelFormat::Histogram:
-            return platform::kHWReportFormatHistogram;
+std::uint8_t reported(ChannelFormat format) {
+    switch (format) {
+    case ChannelFormat::Simple:
+        return platform::kHWReportFormatSimple;
+    case ChannelFormat::State:
+        return platform::kHWReportFormatState;
+    case ChannelFormat::Histogram:
+        return platform::kHWReportFormatHistogram;
+    }
+    return 0;
+}
+
+HWReportChannel::Text unlessEmpty(const std::string& text) {
+    return text.empty() ? std::nullopt : HWReportChannel::Text(text);
+}
+
+// To within the buckets: what is kept of a value is the bucket it fell into.
+void setEnds(HWReportChannel& channel) {
+    bool hit = false;
+    for (const auto& bucket : channel.buckets) {
+        if (bucket.hits != 0) {
+            channel.min = hit ? std::min(channel.min, bucket.lower) : bucket.lower;
+            channel.max = hit ? std::max(channel.max, bucket.upper) : bucket.upper;
+            hit = true;
         }
-        return 0;
     }
-    Text getDriverName() const override { return unlessEmpty(facts_.names.driver); }
-    Text getGroup() const override { return text(facts_.names.group); }
-    Text getSubGroup() const override { return text(facts_.names.subgroup); }
-    Text getChannelName() const override { return facts_.names.name; }
-    Text getUnitLabel() const override { return unlessEmpty(facts_.names.unit); }
+}
 
-    std::int64_t simpleGetIntegerValue() const override {
-        return facts_.names.format == ChannelFormat::Simple ? signedNumber(0) : 0;
-    }
-    std::int32_t histogramGetBucketCount() const override {
-        return entry_.shape != nullptr ? static_cast<std::int32_t>(entry_.shape->bounds.size()) : 0;
-    }
-    int histogramGetBucketBounds(std::int32_t index, std::int64_t& lower,
-                                 std::int64_t& upper) const override {
-        if (index < 0 || index >= histogramGetBucketCount()) {
-            return static_cast<int>(std::errc::invalid_argument);
-        }
-        std::tie(lower, upper) = entry_.shape->bounds[static_cast<std::size_t>(index)];
-        return 0;
-    }
-    std::int64_t histogramGetBucketHits(std::int32_t index) const override {
-        return index >= 0 ? signedNumber(static_cast<std::size_t>(index)) : 0;
-    }
-    // To within the buckets: what is kept of a value is the bucket it fell into.
-    std::int64_t histogramGetMinValue() const override { return hitBounds().first; }
-    std::int64_t histogramGetMaxValue() const override { return hitBounds().second; }
-
-    std::int32_t stateGetCount() const override {
-        return entry_.shape != nullptr ? static_cast<std::int32_t>(entry_.shape->states.size()) : 0;
-    }
-    Text stateGetNameForIndex(std::int32_t index) const override {
-        return index >= 0 && index < stateGetCount()
-                   ? Text(entry_.shape->states[static_cast<std::size_t>(index)])
-                   : std::nullopt;
-    }
-    std::uint64_t stateGetInTransitions(std::int32_t index) const override {
-        return index >= 0 ? number(2 * static_cast<std::size_t>(index) + 1) : 0;
-    }
-    std::uint64_t stateGetResidency(std::int32_t index) const override {
-        return index >= 0 ? number(2 * static_cast<std::size_t>(index)) : 0;
-    }
-    double stateGetDutyCycle(std::int32_t index) const override {
-        if (!elapsed_ || elapsed_->count() <= 0) {
-            return 0;
-        }
-        const double seconds = std::chrono::duration<double>(*elapsed_).count();
-        const double resident = static_cast<double>(stateGetResidency(index)) /
-                                static_cast<double>(facts_.residencyPerSecond);
-        // Kernels book the time of a state when it is left, so a long one may be
-        // booked late and would seem longer than the time there was.
-        return std::min(resident / seconds, 1.0);
-    }
-
-private:
-    static Text text(const std::optional<std::string>& name) {
-        return name ? Text(*name) : std::nullopt;
-    }
-    static Text unlessEmpty(const std::string& name) {
-        return name.empty() ? std::nullopt : Text(name);
-    }
-    std::uint64_t number(std::size_t index) const {
-        return index < entry_.count ? numbers_[index] : 0;
-    }
-    std::int64_t signedNumber(std::size_t index) const {
-        return static_cast<std::int64_t>(number(index));
-    }
-    std::pair<std::int64_t, std::int64_t> hitBounds() const {
-        std::optional<std::pair<std::int64_t, std::int64_t>> hit;
-        for (std::int32_t index = 0; index < histogramGetBucketCount(); ++index) {
-            if (number(static_cast<std::size_t>(index)) != 0) {
-                const auto& [lower, upper] = entry_.shape->bounds[static_cast<std::size_t>(index)];
-                hit = hit ? std::pair(std::min(hit->first, lower), std::max(hit->second, upper))
-                          : std::pair(lower, upper);
-            }
-        }
-        return hit.value_or(std::pair(0, 0));
-    }
-
-    const ChannelFacts& facts_;
-    const SampleSet::Entry& entry_;
-    const std::uint64_t* const numbers_;
-    const std::optional<std::chrono::nanoseconds> elapsed_;
-};
+} // namespace
 
 void SampleSet::add(const Reading& reading) {
     Entry entry;
@@ -122,21 +52,67 @@ void SampleSet::add(const Reading& reading) {
 }
 
 void SampleSet::iterate(const std::function<int(const HWReportChannel&)>& callback) const {
+    HWReportChannel channel; // Its lists keep their memory from one to the next.
     for (std::size_t index = 0; index < entries_.size(); ++index) {
-        if (entries_[index].status == ReadStatus::Read &&
-            callback(SampledChannel(*this, index)) != 0) {
-            return;
+        if (entries_[index].status == ReadStatus::Read) {
+            fill(channel, index);
+            if (callback(channel) != 0) {
+                return;
+            }
         }
     }
 }
 
-std::shared_ptr<const SampleSet> SampleSet::since(const SampleSet& before) const {
-    auto delta = std::make_shared<SampleSet>(list_, time_);
-    delta->elapsed_ = time_ - before.time_;
-    for (std::size_t index = 0; index < entries_.size(); ++index) {
-        delta->add(change(index, before));
+void SampleSet::fill(HWReportChannel& channel, std::size_t index) const {
+    const ChannelFacts& facts = *list_->channels[index];
+    channel.format = reported(facts.names.format);
+    channel.driver = unlessEmpty(facts.names.driver);
+    channel.group = facts.names.group;
+    channel.subGroup = facts.names.subgroup;
+    channel.name = facts.names.name;
+    channel.unit = unlessEmpty(facts.names.unit);
+    const Entry& entry = entries_[index];
+    channel.value = facts.names.format == ChannelFormat::Simple ? hits(entry, 0) : 0;
+    fillBuckets(channel, entry);
+    fillStates(channel, entry, facts.residencyPerSecond);
+}
+
+void SampleSet::fillBuckets(HWReportChannel& channel, const Entry& entry) const {
+    channel.buckets.clear();
+    channel.min = 0;
+    channel.max = 0;
+    if (entry.shape == nullptr) {
+        return;
     }
-    return delta;
+    for (const auto& [lower, upper] : entry.shape->bounds) {
+        channel.buckets.push_back({lower, upper, hits(entry, channel.buckets.size()), 0});
+    }
+    setEnds(channel);
+}
+
+void SampleSet::fillStates(HWReportChannel& channel, const Entry& entry,
+                           std::uint64_t residencyPerSecond) const {
+    channel.states.clear();
+    if (entry.shape == nullptr) {
+        return;
+    }
+    for (const auto& name : entry.shape->states) {
+        const std::size_t at = 2 * channel.states.size();
+        const std::uint64_t residency = number(entry, at);
+        channel.states.push_back(
+            {name, number(entry, at + 1), residency, dutyCycle(residency, residencyPerSecond)});
+    }
+}
+
+double SampleSet::dutyCycle(std::uint64_t residency, std::uint64_t perSecond) const {
+    if (!elapsed_ || elapsed_->count() <= 0) {
+        return 0;
+    }
+    const double seconds = std::chrono::duration<double>(*elapsed_).count();
+    const double resident = static_cast<double>(residency) / static_cast<double>(perSecond);
+    // Kernels book the time of a state when it is left, so a long one may be
+    // booked late and would seem longer than the time there was.
+    return std::min(resident / seconds, 1.0);
 }
 
 namespace {
@@ -167,45 +143,53 @@ std::vector<std::optional<std::size_t>> places(const std::vector<Part>& now,
 
 // Subtracts what `before` has of the same parts, each of `width` numbers, unless
 // one of them went back: then all were begun anew, as with a counter.
-void subtract(std::vector<std::uint64_t>& numbers, const std::uint64_t* before, std::size_t width,
-              const std::vector<std::optional<std::size_t>>& placesBefore) {
-    std::vector<std::uint64_t> changed = numbers;
-    for (std::size_t index = 0; index < numbers.size(); ++index) {
+void subtractParts(std::uint64_t* numbers, std::size_t count, const std::uint64_t* before,
+                   std::size_t width, const std::vector<std::optional<std::size_t>>& placesBefore) {
+    const auto old = [&](std::size_t index) {
         const auto place = placesBefore[index / width];
-        const std::uint64_t old = place ? before[*place * width + index % width] : 0;
-        if (old > numbers[index]) {
+        return place ? before[*place * width + index % width] : 0;
+    };
+    for (std::size_t index = 0; index < count; ++index) {
+        if (old(index) > numbers[index]) {
             return;
         }
-        changed[index] = numbers[index] - old;
     }
-    numbers = std::move(changed);
+    for (std::size_t index = 0; index < count; ++index) {
+        numbers[index] -= old(index);
+    }
 }
 
 } // namespace
 
-Reading SampleSet::change(std::size_t index, const SampleSet& before) const {
-    const Entry& now = entries_[index];
+std::shared_ptr<const SampleSet> SampleSet::since(const SampleSet& before) const {
+    auto delta = std::make_shared<SampleSet>(*this);
+    delta->elapsed_ = time_ - before.time_;
+    for (std::size_t index = 0; index < entries_.size(); ++index) {
+        delta->subtract(index, before);
+    }
+    return delta;
+}
+
+void SampleSet::subtract(std::size_t index, const SampleSet& before) {
+    Entry& now = entries_[index];
     const Entry& then = before.entries_[index];
-    Reading reading;
     if (now.status != ReadStatus::Read || then.status == ReadStatus::Failed) {
-        return reading; // Nobody knows what it changed from, or to.
+        now = Entry(); // Nobody knows what it changed from, or to.
+        return;
     }
-    reading.status = ReadStatus::Read;
-    reading.shape = now.shape;
-    reading.numbers.assign(numbers(now), numbers(now) + now.count);
     if (then.status == ReadStatus::Absent) {
-        return reading; // It came meanwhile: all that it counted is new.
+        return; // It came meanwhile: all that it counted is new.
     }
-    const std::uint64_t* const old = before.numbers(then);
+    std::uint64_t* const numbers = numbers_.data() + now.first;
+    const std::uint64_t* const old = before.numbers_.data() + then.first;
     if (now.shape == nullptr) {
-        reading.numbers[0] = static_cast<std::uint64_t>(counterChange(
-            static_cast<std::int64_t>(reading.numbers[0]), static_cast<std::int64_t>(old[0])));
+        numbers[0] = static_cast<std::uint64_t>(counterChange(static_cast<std::int64_t>(numbers[0]),
+                                                              static_cast<std::int64_t>(old[0])));
     } else if (!now.shape->states.empty()) {
-        subtract(reading.numbers, old, 2, places(now.shape->states, then.shape->states));
+        subtractParts(numbers, now.count, old, 2, places(now.shape->states, then.shape->states));
     } else {
-        subtract(reading.numbers, old, 1, places(now.shape->bounds, then.shape->bounds));
+        subtractParts(numbers, now.count, old, 1, places(now.shape->bounds, then.shape->bounds));
     }
-    return reading;
 }
 
 std::size_t SampleSet::footprint() const {

@@ -52,7 +52,6 @@ public:
     std::size_t footprint() const;
 
 private:
-    friend class SampledChannel;
     struct Entry {
         ReadingShapeRef shape;
         std::uint32_t first = 0; // of its numbers
@@ -60,8 +59,19 @@ private:
         ReadStatus status = ReadStatus::Failed;
     };
 
-    Reading change(std::size_t index, const SampleSet& before) const;
-    const std::uint64_t* numbers(const Entry& entry) const { return numbers_.data() + entry.first; }
+    void subtract(std::size_t index, const SampleSet& before);
+    void fill(platform::HWReportChannel& channel, std::size_t index) const;
+    void fillBuckets(platform::HWReportChannel& channel, const Entry& entry) const;
+    void fillStates(platform::HWReportChannel& channel, const Entry& entry,
+                    std::uint64_t residencyPerSecond) const;
+    double dutyCycle(std::uint64_t residency, std::uint64_t perSecond) const;
+    // 0 past the end of what was read.
+    std::uint64_t number(const Entry& entry, std::size_t index) const {
+        return index < entry.count ? numbers_[entry.first + index] : 0;
+    }
+    std::int64_t hits(const Entry& entry, std::size_t index) const {
+        return static_cast<std::int64_t>(number(entry, index));
+    }
 
     ChannelListRef list_;
     platform::SteadyTime time_;

@@ -61,27 +61,24 @@ protected:
     }
     static std::string describe(const platform::HWReportChannel& channel) {
         std::string text;
-        switch (channel.getFormat()) {
+        switch (channel.format) {
         case platform::kHWReportFormatSimple:
-            return std::to_string(channel.simpleGetIntegerValue());
+            return std::to_string(channel.value);
         case platform::kHWReportFormatState:
-            for (int i = 0; i < channel.stateGetCount(); ++i) {
-                text += std::string(*channel.stateGetNameForIndex(i)) + "=" +
-                        std::to_string(channel.stateGetResidency(i)) + "/" +
-                        std::to_string(channel.stateGetInTransitions(i)) + "/" +
-                        std::to_string(channel.stateGetDutyCycle(i)) + " ";
+            for (const auto& state : channel.states) {
+                text += std::string(*state.name) + "=" + std::to_string(state.residency) + "/" +
+                        std::to_string(state.transitions) + "/" + std::to_string(state.dutyCycle) +
+                        " ";
             }
             return text;
         default:
-            for (int i = 0; i < channel.histogramGetBucketCount(); ++i) {
-                std::int64_t lower = 0;
-                std::int64_t upper = 0;
-                EXPECT_EQ(channel.histogramGetBucketBounds(i, lower, upper), 0);
-                text += std::to_string(lower) + "-" + std::to_string(upper) + ":" +
-                        std::to_string(channel.histogramGetBucketHits(i)) + " ";
+            for (const auto& bucket : channel.buckets) {
+                EXPECT_EQ(bucket.boundsError, 0);
+                text += std::to_string(bucket.lower) + "-" + std::to_string(bucket.upper) + ":" +
+                        std::to_string(bucket.hits) + " ";
             }
-            return text + "min " + std::to_string(channel.histogramGetMinValue()) + " max " +
-                   std::to_string(channel.histogramGetMaxValue());
+            return text + "min " + std::to_string(channel.min) + " max " +
+                   std::to_string(channel.max);
         }
     }
 
@@ -158,24 +155,50 @@ TEST_F(SampleSetTest, WhatCouldNotBeReadIsNotReported) {
     EXPECT_THAT(delta(reading({7}), missing(ReadStatus::Absent)), IsEmpty());
 }
 
-TEST_F(SampleSetTest, AskingPastTheEndIsHarmless) {
+TEST_F(SampleSetTest, AChannelHasNothingOfOtherFormatsAndNoShareWithoutAnInterval) {
     channelOf(ChannelFormat::State);
     SampleSet set(list_, platform::SteadyTime(100s));
     set.add(reading({1, 2}, {{"on"}, {}}));
     set.iterate([](const platform::HWReportChannel& channel) {
-        for (const int index : {-1, 1, 1000}) {
-            std::int64_t lower = 5;
-            std::int64_t upper = 6;
-            EXPECT_EQ(channel.stateGetNameForIndex(index), std::nullopt);
-            EXPECT_EQ(channel.stateGetResidency(index), 0U);
-            EXPECT_EQ(channel.stateGetInTransitions(index), 0U);
-            EXPECT_NE(channel.histogramGetBucketBounds(index, lower, upper), 0);
-            EXPECT_EQ(lower, 5);
-        }
-        EXPECT_EQ(channel.simpleGetIntegerValue(), 0);
-        EXPECT_EQ(channel.stateGetDutyCycle(0), 0); // No interval, no share.
+        EXPECT_EQ(channel.value, 0);
+        EXPECT_THAT(channel.buckets, IsEmpty());
+        EXPECT_EQ(channel.states.size(), 1U);
+        EXPECT_EQ(channel.states[0].dutyCycle, 0);
         return 0;
     });
+}
+
+TEST_F(SampleSetTest, AReadingThatIsTooShortEndsInZeros) {
+    channelOf(ChannelFormat::State);
+    SampleSet set(list_, platform::SteadyTime(100s));
+    set.add(reading({1, 2, 3}, {{"on", "off", "idle"}, {}}));
+    set.iterate([](const platform::HWReportChannel& channel) {
+        EXPECT_EQ(describe(channel), "on=1/2/0.000000 off=3/0/0.000000 idle=0/0/0.000000 ");
+        return 0;
+    });
+}
+
+TEST_F(SampleSetTest, AChannelKeepsNothingOfTheOneBefore) {
+    channelOf(ChannelFormat::Histogram);
+    auto list = std::make_shared<ChannelList>(*list_);
+    DriverChannel names;
+    names.name = "counter";
+    list->channels.push_back(std::make_shared<const ChannelFacts>(ChannelFacts{names, 1}));
+    list->places.push_back(1);
+    SampleSet set(list, platform::SteadyTime(100s));
+    set.add(reading({1}, {{}, {{10, 20}}}));
+    set.add(reading({7}));
+    std::vector<platform::HWReportChannel> seen;
+    set.iterate([&](const platform::HWReportChannel& channel) {
+        seen.push_back(channel);
+        return 0;
+    });
+    ASSERT_EQ(seen.size(), 2U);
+    EXPECT_EQ(seen[0].max, 20);
+    EXPECT_EQ(seen[1].value, 7);
+    EXPECT_EQ(seen[1].group, std::nullopt);
+    EXPECT_THAT(seen[1].buckets, IsEmpty());
+    EXPECT_EQ(seen[1].max, 0);
 }
 
 } // namespace
