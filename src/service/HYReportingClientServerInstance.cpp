@@ -173,11 +173,10 @@ void HYReportingClientServerInstance::sendMessage(
     auto processName = HYReportingUtilityIsInternalBuild()
                            ? HYReportingUtilityProcessNameForPID(pid_)
                            : std::nullopt;
-    onServiceQueue([message = std::move(message), category, type,
+    onServiceQueue([message = Message{std::move(message), category, type},
                     processName = std::move(processName), reporterIDs = std::move(reporterIDs),
                     reply = std::move(reply)](auto& self, Delegate& delegate) mutable {
-        const MaybeError error =
-            self.send(delegate, std::move(message), category, type, reporterIDs, processName);
+        const MaybeError error = self.send(delegate, std::move(message), reporterIDs, processName);
         if (reply) {
             reply(error);
         }
@@ -185,11 +184,10 @@ void HYReportingClientServerInstance::sendMessage(
 }
 
 MaybeError
-HYReportingClientServerInstance::send(Delegate& delegate, Dictionary message,
-                                      AudioEventCategory category, std::uint16_t type,
+HYReportingClientServerInstance::send(Delegate& delegate, Message message,
                                       const std::optional<std::vector<std::int64_t>>& reporterIDs,
                                       const std::optional<std::string>& processName) {
-    MessageFanOut fanOut(delegate, {std::move(message), category, type, processName});
+    MessageFanOut fanOut(delegate, std::move(message), processName);
     return fanOut.route(reporterIDs, [&](std::int64_t reporterID) {
         return findReportingSessionForID(delegate, reporterID, true);
     });

@@ -13,6 +13,7 @@
 #include <optional>
 #include <string>
 
+#include "common/Message.h"
 #include "common/Mutex.h"
 #include "platform/Clock.h"
 #include "platform/WorkQueue.h"
@@ -79,8 +80,8 @@ private:
     void start(Delegate& delegate, std::int64_t reporterID, const BoolReply& reply);
     void stop(Delegate& delegate, std::int64_t reporterID);
     void destroy(Delegate& delegate, std::int64_t reporterID);
-    MaybeError send(Delegate& delegate, Dictionary message, AudioEventCategory category,
-                    std::uint16_t type, const std::optional<std::vector<std::int64_t>>& reporterIDs,
+    MaybeError send(Delegate& delegate, Message message,
+                    const std::optional<std::vector<std::int64_t>>& reporterIDs,
                     const std::optional<std::string>& processName);
     void leave(Delegate& delegate);
     // For a session that leaves the map: answers the start that it holds.

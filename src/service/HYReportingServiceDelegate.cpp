@@ -215,7 +215,7 @@ void HYReportingServiceDelegate::sendDriverLogsForSession(const Session& session
 }
 
 void HYReportingServiceDelegate::handleEventForIBX(const Dictionary& message,
-                                                   AudioEventCategory category, std::uint16_t type,
+                                                   AudioEventCategory category, AudioEventType type,
                                                    const Session& session,
                                                    const std::optional<std::string>& processName) {
     if (HYReportingUtilityIsInternalBuild() && ibxStateManager_ != nullptr) {

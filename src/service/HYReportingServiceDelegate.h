@@ -48,7 +48,7 @@ public:
     void sendDriverLogsForSession(const Session& session) override;
     void removeClient(const HYReportingClientServerInstance& client) override;
     void handleEventForIBX(const Dictionary& message, AudioEventCategory category,
-                           std::uint16_t type, const Session& session,
+                           AudioEventType type, const Session& session,
                            const std::optional<std::string>& processName) override;
     std::int64_t activeSessionCount() const override { return activeSessionCount_.load(); }
     void setActiveSessionCount(std::int64_t count) override { activeSessionCount_.store(count); }

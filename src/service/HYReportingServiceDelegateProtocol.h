@@ -40,7 +40,7 @@ public:
     virtual void removeClient(const HYReportingClientServerInstance& client) = 0;
     // Offers the message to the issue capture of internal builds.
     virtual void handleEventForIBX(const Dictionary& message, AudioEventCategory category,
-                                   std::uint16_t type, const Session& session,
+                                   AudioEventType type, const Session& session,
                                    const std::optional<std::string>& processName) = 0;
     virtual std::int64_t activeSessionCount() const = 0;
     virtual void setActiveSessionCount(std::int64_t count) = 0;

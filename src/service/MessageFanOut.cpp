@@ -98,7 +98,7 @@ void MessageFanOut::sendStandalone() const {
 }
 
 void MessageFanOut::offerToSinks(const Session& session) const {
-    const auto& [payload, category, type, processName] = message_;
+    const auto& [payload, category, type] = message_;
     HYReportingTallyhubBridge::handleEvent(&payload, category, type, session);
     HYReportingEnergyLedgerUtility::handleEvent(&payload, category, type, session);
     HYReportingTMXBridge::handleEvent(&payload, category, type, session);
@@ -106,7 +106,7 @@ void MessageFanOut::offerToSinks(const Session& session) const {
 
 void MessageFanOut::offerToIssueCapture(const Session& session) const {
     delegate_.handleEventForIBX(message_.payload, message_.category, message_.type, session,
-                                message_.processName);
+                                processName_);
 }
 
 } // namespace halyard

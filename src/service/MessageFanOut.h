@@ -10,32 +10,25 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "common/Error.h"
-#include "common/HYReportingUtility.h"
-#include "common/Value.h"
+#include "common/Message.h"
 #include "service/HYReportingServiceDelegateProtocol.h"
 #include "session/HYReportingSession.h"
 
 namespace halyard {
-
-// What a client sent.
-struct ClientMessage {
-    Dictionary payload;
-    AudioEventCategory category;
-    std::uint16_t type;
-    // The sender's, where issue capture will want it.
-    const std::optional<std::string>& processName;
-};
 
 class MessageFanOut {
 public:
     using Session = std::shared_ptr<HYReportingSession>;
     using Lookup = std::function<Session(std::int64_t reporterID)>;
 
-    MessageFanOut(HYReportingServiceDelegateProtocol& delegate, ClientMessage message)
-        : delegate_(delegate), message_(std::move(message)) {}
+    // The name is that of the sender's process, where issue capture will want it.
+    MessageFanOut(HYReportingServiceDelegateProtocol& delegate, Message message,
+                  const std::optional<std::string>& processName)
+        : delegate_(delegate), message_(std::move(message)), processName_(processName) {}
 
     // Without a list the message goes to every started session or, where there
     // is none, out on its own. The error is that of a disabled service; unknown
@@ -52,7 +45,8 @@ private:
     void offerToIssueCapture(const Session& session) const;
 
     HYReportingServiceDelegateProtocol& delegate_;
-    ClientMessage message_;
+    Message message_;
+    const std::optional<std::string>& processName_;
 };
 
 // A list of session descriptions, for log lines.

@@ -22,7 +22,7 @@ public:
     platform::DriverSnapshotRef getSnapShot() override { return nullptr; }
     void sendDriverLogsForSession(const Session&) override {}
     void removeClient(const HYReportingClientServerInstance&) override {}
-    void handleEventForIBX(const Dictionary&, AudioEventCategory, std::uint16_t,
+    void handleEventForIBX(const Dictionary&, AudioEventCategory, AudioEventType,
                            const Session& session,
                            const std::optional<std::string>& processName) override {
         offeredFor.push_back(session);
@@ -38,7 +38,7 @@ public:
 class StandaloneSessionTest : public ::testing::Test {
 protected:
     void broadcast() {
-        MessageFanOut(service_, {{{"n", 1}}, kAudioEventCategoryPlayback, 1, sender_})
+        MessageFanOut(service_, {{{"n", 1}}, kAudioEventCategoryPlayback, 1}, sender_)
             .route(std::nullopt, [](std::int64_t) { return nullptr; });
     }
 
