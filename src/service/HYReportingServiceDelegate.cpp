@@ -53,9 +53,6 @@ std::shared_ptr<HYReportingServiceDelegate> HYReportingServiceDelegate::make() {
     std::shared_ptr<HYReportingServiceDelegate> delegate(new HYReportingServiceDelegate);
     delegate->listenForFeatureStateChanges();
     delegate->driverUtility_ = std::make_unique<HYReportingDriverUtility>();
-    if (HYReportingUtilityIsInternalBuild()) {
-        delegate->ibxStateManager_ = std::make_unique<HYReportingUtilityIBXStateManager>();
-    }
     return delegate;
 }
 
@@ -218,9 +215,7 @@ void HYReportingServiceDelegate::handleEventForIBX(const Dictionary& message,
                                                    AudioEventCategory category, AudioEventType type,
                                                    const Session& session,
                                                    const std::optional<std::string>& processName) {
-    if (HYReportingUtilityIsInternalBuild() && ibxStateManager_ != nullptr) {
-        ibxStateManager_->handleEvent(&message, category, type, session, processName);
-    }
+    sinks_.captureIssue({message, category, type}, session, processName);
 }
 
 bool HYReportingServiceDelegate::isStopWaiting() const {

@@ -21,7 +21,7 @@
 #include "platform/WorkQueue.h"
 #include "service/FeatureState.h"
 #include "service/HYReportingServiceDelegateProtocol.h"
-#include "sinks/HYReportingUtilityIBXStateManager.h"
+#include "sinks/MessageSinks.h"
 
 namespace halyard {
 
@@ -47,6 +47,7 @@ public:
     platform::DriverSnapshotRef getSnapShot() override;
     void sendDriverLogsForSession(const Session& session) override;
     void removeClient(const HYReportingClientServerInstance& client) override;
+    MessageSinks& sinks() override { return sinks_; }
     void handleEventForIBX(const Dictionary& message, AudioEventCategory category,
                            AudioEventType type, const Session& session,
                            const std::optional<std::string>& processName) override;
@@ -79,8 +80,7 @@ private:
     std::atomic<std::uint64_t> repeatsOfRetiredSessions_{0};
     std::vector<FeatureRecord> features_;
     std::unique_ptr<HYReportingDriverUtility> driverUtility_;
-    // Null but on internal builds.
-    std::unique_ptr<HYReportingUtilityIBXStateManager> ibxStateManager_;
+    MessageSinks sinks_;
 
     mutable Mutex monitor_;
     std::vector<Client> clients_ HY_GUARDED_BY(monitor_);

@@ -16,6 +16,7 @@ namespace halyard {
 
 class HYReportingClientServerInstance;
 class HYReportingSession;
+class MessageSinks;
 
 // All on the service work queue, but for findReportingSessionForID (any thread).
 class HYReportingServiceDelegateProtocol {
@@ -38,7 +39,10 @@ public:
     // Sends what changed since the session's snapshot.
     virtual void sendDriverLogsForSession(const Session& session) = 0;
     virtual void removeClient(const HYReportingClientServerInstance& client) = 0;
-    // Offers the message to the issue capture of internal builds.
+    // What every message is offered to.
+    virtual MessageSinks& sinks() = 0;
+    // Offers the message to the issue capture of internal builds alone, the last
+    // of the sinks.
     virtual void handleEventForIBX(const Dictionary& message, AudioEventCategory category,
                                    AudioEventType type, const Session& session,
                                    const std::optional<std::string>& processName) = 0;

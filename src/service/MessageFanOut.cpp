@@ -4,9 +4,7 @@
 #include "platform/Log.h"
 #include "platform/Platform.h"
 #include "platform/TraceMarks.h"
-#include "sinks/HYReportingEnergyLedgerUtility.h"
-#include "sinks/HYReportingTMXBridge.h"
-#include "sinks/HYReportingTallyhubBridge.h"
+#include "sinks/MessageSinks.h"
 
 namespace halyard {
 namespace {
@@ -57,7 +55,6 @@ void MessageFanOut::sendToAddressed(const std::vector<std::int64_t>& reporterIDs
         }
         if (const Session session = findAcrossAllClients(reporterID)) {
             offerToSinks(session);
-            offerToIssueCapture(session);
             // The last takes it over, and may change what nobody else holds.
             const bool last = &reporterID == &reporterIDs.back();
             session->sendMessage(last ? std::move(message_.payload) : message_.payload,
@@ -75,7 +72,6 @@ void MessageFanOut::broadcast() const {
         // store rely on either order.
         session->sendMessage(message_.payload, message_.category, message_.type, nullptr);
         offerToSinks(session);
-        offerToIssueCapture(session);
     }
     if (sessions.empty()) {
         sendStandalone();
@@ -89,7 +85,6 @@ void MessageFanOut::sendStandalone() const {
     standalone->updateConfigurationWithContentsOfConfiguration(
         Dictionary{{"HostApplicationDisplayID", "Unknown"}});
     offerToSinks(standalone);
-    offerToIssueCapture(standalone);
     HY_LOG_DEFAULT(HYReportingClientCategory,
                    "no active reporting sessions found, sending as standalone");
     HYReportingSession::sendSingleMessage(message_.payload, message_.category, message_.type,
@@ -98,15 +93,7 @@ void MessageFanOut::sendStandalone() const {
 }
 
 void MessageFanOut::offerToSinks(const Session& session) const {
-    const auto& [payload, category, type] = message_;
-    HYReportingTallyhubBridge::handleEvent(&payload, category, type, session);
-    HYReportingEnergyLedgerUtility::handleEvent(&payload, category, type, session);
-    HYReportingTMXBridge::handleEvent(&payload, category, type, session);
-}
-
-void MessageFanOut::offerToIssueCapture(const Session& session) const {
-    delegate_.handleEventForIBX(message_.payload, message_.category, message_.type, session,
-                                processName_);
+    delegate_.sinks().handleEvent(message_, session, processName_);
 }
 
 } // namespace halyard

@@ -42,7 +42,6 @@ private:
     void broadcast() const;
     void sendStandalone() const;
     void offerToSinks(const Session& session) const;
-    void offerToIssueCapture(const Session& session) const;
 
     HYReportingServiceDelegateProtocol& delegate_;
     Message message_;

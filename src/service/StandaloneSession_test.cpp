@@ -2,6 +2,7 @@
 
 #include "service/MessageFanOut.h"
 #include "service/ServiceFixture.h"
+#include "sinks/MessageSinks.h"
 
 namespace halyard {
 namespace {
@@ -9,7 +10,20 @@ namespace {
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 
-// A service without sessions, which keeps what issue capture is offered.
+// Keeps what the sinks are offered.
+class RecordingSinks final : public MessageSinks {
+public:
+    void handleEvent(const Message&, const std::shared_ptr<const SessionFacts>& session,
+                     const std::optional<std::string>& processName) override {
+        offeredFor.push_back(std::dynamic_pointer_cast<const HYReportingSession>(session));
+        sender = processName;
+    }
+
+    std::vector<std::shared_ptr<const HYReportingSession>> offeredFor;
+    std::optional<std::string> sender;
+};
+
+// A service without sessions.
 class LonelyService final : public HYReportingServiceDelegateProtocol {
 public:
     Dictionary getDefaults() const override { return {}; }
@@ -22,17 +36,13 @@ public:
     platform::DriverSnapshotRef getSnapShot() override { return nullptr; }
     void sendDriverLogsForSession(const Session&) override {}
     void removeClient(const HYReportingClientServerInstance&) override {}
-    void handleEventForIBX(const Dictionary&, AudioEventCategory, AudioEventType,
-                           const Session& session,
-                           const std::optional<std::string>& processName) override {
-        offeredFor.push_back(session);
-        sender = processName;
-    }
+    MessageSinks& sinks() override { return recorded; }
+    void handleEventForIBX(const Dictionary&, AudioEventCategory, AudioEventType, const Session&,
+                           const std::optional<std::string>&) override {}
     std::int64_t activeSessionCount() const override { return 0; }
     void setActiveSessionCount(std::int64_t) override {}
 
-    std::vector<Session> offeredFor;
-    std::optional<std::string> sender;
+    RecordingSinks recorded;
 };
 
 class StandaloneSessionTest : public ::testing::Test {
@@ -50,18 +60,18 @@ protected:
 TEST_F(StandaloneSessionTest, IsOfTheDaemonsOwnProcessAndOfAnUnknownApplication) {
     platform_.ownProcess.ownPID = 4711;
     broadcast();
-    ASSERT_EQ(service_.offeredFor.size(), 1U);
-    const HYReportingSession& session = *service_.offeredFor[0];
+    ASSERT_EQ(service_.recorded.offeredFor.size(), 1U);
+    const HYReportingSession& session = *service_.recorded.offeredFor[0];
     EXPECT_THAT(session.processIdentifiers(), ElementsAre(4711));
     EXPECT_EQ(session.reporterID(), 1);
     EXPECT_EQ(session.serviceType(), kAudioServiceTypeStandalone);
     EXPECT_EQ(session.configuration(), (Dictionary{{"HostApplicationDisplayID", "Unknown"}}));
-    EXPECT_EQ(service_.sender, sender_);
+    EXPECT_EQ(service_.recorded.sender, sender_);
 }
 
 TEST_F(StandaloneSessionTest, IsNeitherStartedNorFed) {
     broadcast();
-    EXPECT_FALSE(service_.offeredFor.at(0)->started());
+    EXPECT_FALSE(service_.recorded.offeredFor.at(0)->started());
     EXPECT_EQ(platform_.log.count("starting session owned by 1"), 0U);
     EXPECT_EQ(platform_.log.count("sending message for session owned by 1"), 0U);
     EXPECT_THAT(platform_.relayReporting.uploads, IsEmpty());
