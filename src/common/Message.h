@@ -1,6 +1,8 @@
 // A message on its way from the client to the sinks, the batch and the upload.
 #pragma once
 
+#include <cstdint>
+
 #include "common/HYReportingUtility.h"
 #include "common/Value.h"
 
@@ -13,5 +15,10 @@ struct Message {
     AudioEventCategory category = kAudioEventCategoryUndefined;
     AudioEventType type = kAudioEventTypeUnknown;
 };
+
+// Log lines show categories and types as signed numbers: a summary's category is -1.
+inline std::int32_t shownInLog(std::uint32_t number) {
+    return static_cast<std::int32_t>(number);
+}
 
 } // namespace halyard

@@ -1,10 +1,8 @@
 #include "session/HYReportingSession.h"
 
-#include <cstdlib>
 #include <fmt/format.h>
 #include <utility>
 
-#include "common/Json.h"
 #include "platform/Clock.h"
 #include "platform/Files.h"
 #include "platform/HYReportingUtilityDevice.h"
@@ -13,7 +11,6 @@
 #include "platform/TraceMarks.h"
 #include "session/SummaryFile.h"
 #include "sinks/HYReportingTallyhubBridge.h"
-#include "tracing/TraceRunner.h"
 
 namespace halyard {
 namespace {
@@ -44,7 +41,8 @@ HYReportingSession::initWithID(std::int64_t reporterID,
 
 HYReportingSession::HYReportingSession(std::int64_t reporterID,
                                        std::vector<std::int32_t> processIdentifiers)
-    : reporterID_(reporterID), processIdentifiers_(std::move(processIdentifiers)) {
+    : reporterID_(reporterID), processIdentifiers_(std::move(processIdentifiers)),
+      upload_(reporterID, *this), trace_(std::make_shared<TraceControl>(*this)) {
     HY_LOG_INFO(HYReportingSessionCategory, "created reporting session for ID: {}", reporterID_);
     mark(kCreatedMark);
 }
@@ -55,42 +53,37 @@ HYReportingSession::~HYReportingSession() {
 }
 
 std::string HYReportingSession::description() const {
-    const MutexLock lock(stateMutex_);
     return fmt::format(
         "reporterID={},serviceName={},ownerPid={},HostApplicationDisplayID={},started={}",
-        reporterID_, serviceName_, processIdentifiers_.empty() ? 0 : processIdentifiers_.front(),
-        describe(HYReportingUtilityRetrieveAppName(configuration_)), started() ? 1 : 0);
+        reporterID_, HYReportingUtilityGenerateServiceNameFromServiceType(serviceType()),
+        processIdentifiers_.empty() ? 0 : processIdentifiers_.front(),
+        describe(HYReportingUtilityRetrieveAppName(configuration())), started() ? 1 : 0);
 }
 
 std::string HYReportingSession::serviceName() const {
-    const MutexLock lock(stateMutex_);
-    return serviceName_;
+    return std::string(HYReportingUtilityGenerateServiceNameFromServiceType(serviceType()));
 }
 
 void HYReportingSession::setServiceType(AudioServiceType type) {
-    const std::string_view name = HYReportingUtilityGenerateServiceNameFromServiceType(type);
-    {
-        const MutexLock lock(stateMutex_);
-        serviceType_ = type;
-        serviceName_ = name;
-    }
-    HY_LOG_INFO(HYReportingSessionCategory, "setting service type {}", name);
+    serviceType_.store(type);
+    HY_LOG_INFO(HYReportingSessionCategory, "setting service type {}",
+                HYReportingUtilityGenerateServiceNameFromServiceType(type));
 }
 
 Dictionary HYReportingSession::configuration() const {
-    const MutexLock lock(stateMutex_);
+    const MutexLock lock(mutex_);
     return configuration_;
 }
 
 void HYReportingSession::setConfiguration(const Dictionary* configuration) {
     if (configuration != nullptr) {
-        const MutexLock lock(stateMutex_);
+        const MutexLock lock(mutex_);
         configuration_.merge(*configuration);
     }
 }
 
 void HYReportingSession::updateConfigurationWithContentsOfConfiguration(const Dictionary& update) {
-    const MutexLock lock(stateMutex_);
+    const MutexLock lock(mutex_);
     if (const Value* application = update.find(kClientApplicationKey)) {
         configuration_.set(kHostApplicationKey, *application);
     }
@@ -99,17 +92,17 @@ void HYReportingSession::updateConfigurationWithContentsOfConfiguration(const Di
 
 HYReportingSession::TransactionCompleteBlock
 HYReportingSession::exchangeTransactionCompleteBlock(TransactionCompleteBlock block) {
-    const MutexLock lock(stateMutex_);
+    const MutexLock lock(mutex_);
     return std::exchange(transactionCompleteBlock_, std::move(block));
 }
 
 platform::DriverSnapshotRef HYReportingSession::driverSnapShot() const {
-    const MutexLock lock(stateMutex_);
+    const MutexLock lock(mutex_);
     return driverSnapShot_;
 }
 
 void HYReportingSession::setDriverSnapShot(platform::DriverSnapshotRef snapshot) {
-    const MutexLock lock(stateMutex_);
+    const MutexLock lock(mutex_);
     driverSnapShot_.swap(snapshot); // The old one goes once the lock is released.
 }
 
@@ -119,19 +112,13 @@ void HYReportingSession::start() {
         HY_LOG_INFO(HYReportingSessionCategory, "{} is already started", reporterID_);
         return;
     }
-    {
-        const MessageBatch::Options options{
-            .keepsMessages = HYReportingUtilityIsInternalBuild(),
-            .minimumPlaytime = HYReportingUtilityVolumeMinimumPlayingTime(serviceType())};
-        const MutexLock lock(batchMutex_);
-        batch_ = std::make_unique<MessageBatch>(options);
-        started_.store(true);
-    }
+    batch_.start({.keepsMessages = HYReportingUtilityIsInternalBuild(),
+                  .minimumPlaytime = HYReportingUtilityVolumeMinimumPlayingTime(serviceType())});
     mark(kStartMark);
     if (relayReportingEnabled()) {
-        startRelayReporting();
+        upload_.start(shared_from_this());
     }
-    startTracing();
+    trace_->start();
 }
 
 void HYReportingSession::stop() {
@@ -145,26 +132,10 @@ void HYReportingSession::stop() {
     writeSummaryJson();
     sendSummaryEvent();
     if (relayReportingEnabled()) {
-        stopRelayReporting();
+        upload_.stop(shared_from_this());
     }
-    stopTracing();
-    std::unique_ptr<MessageBatch> finished; // Freed after the lock.
-    {
-        const MutexLock lock(batchMutex_);
-        finished = std::move(batch_);
-        started_.store(false);
-    }
-}
-
-std::vector<Dictionary> HYReportingSession::createVolumeMessages() const {
-    const MutexLock lock(batchMutex_);
-    return batch_ != nullptr ? batch_->volumeEvents() : std::vector<Dictionary>();
-}
-
-std::optional<Dictionary> HYReportingSession::createSummaryEventForSession() {
-    const AudioServiceType type = serviceType();
-    const MutexLock lock(batchMutex_);
-    return batch_ != nullptr ? batch_->takeSummary(type) : std::nullopt;
+    trace_->stop();
+    batch_.stop();
 }
 
 void HYReportingSession::sendVolumeEvents() {
@@ -184,13 +155,9 @@ void HYReportingSession::writeSummaryJson() const {
     if (!HYReportingUtilityIsInternalBuild()) {
         return;
     }
-    std::string text;
-    {
-        const MutexLock lock(batchMutex_);
-        if (batch_ == nullptr || batch_->empty()) {
-            return;
-        }
-        text = toPrettyJson(summaryFileContents(batch_->entries()));
+    const auto text = batch_.summaryFileText();
+    if (!text) {
+        return;
     }
     platform::Files& files = *platform::current().files;
     if (const auto error = files.createDirectories(HYReportingLogsDirectory, kLogsMode)) {
@@ -203,7 +170,7 @@ void HYReportingSession::writeSummaryJson() const {
         summaryFileName(clock.wallTime(), clock.utcOffset(clock.wallTime()),
                         describe(HYReportingUtilityRetrieveAppName(configuration())),
                         HYReportingUtilityGenerateServiceNameFromServiceType(serviceType()));
-    if (const auto error = files.writeFileAtomically(path, text)) {
+    if (const auto error = files.writeFileAtomically(path, *text)) {
         HY_LOG_ERROR(HYReportingSessionCategory, "jsonOutput writeToURL: {}", error->message);
     } else {
         HY_LOG_INFO(HYReportingSessionCategory, "jsonOutput writeToURL: {}", files.located(path));
@@ -218,57 +185,32 @@ void HYReportingSession::sendSummaryEvent() {
     }
 }
 
-bool HYReportingSession::createMessageIdentifierWithCategory(AudioEventCategory category,
-                                                             AudioEventType type,
-                                                             const Dictionary& message) {
-    if (batch_ == nullptr) {
-        return false; // Not started: nothing is recorded, nothing is a repeat.
-    }
-    const bool redundant = batch_->addUnlessRedundant(category, type, message);
-    if (redundant) {
-        redundantMessages_.fetch_add(1, std::memory_order_relaxed);
-        HY_LOG_DEBUG(HYReportingSessionCategory, "dropping redundant event");
-    }
-    return redundant;
-}
-
 void HYReportingSession::sendMessage(Dictionary message, AudioEventCategory category,
                                      AudioEventType type, bool /*sync*/, const SendReply& reply) {
     HY_LOG_DEBUG(HYReportingSessionCategory, "sending message for session owned by {}",
                  reporterID_);
     auto original = platform::logEnabled(LogLevel::Debug) ? std::optional(message) : std::nullopt;
-    Dictionary tagged = HYReportingUtilityAddAudioMessageTag(
-        HYReportingUtilityRemoveWhiteSpaceFromKeys(std::move(message)), category, type);
-    bool redundant = false;
-    {
-        const MutexLock lock(batchMutex_);
-        redundant = createMessageIdentifierWithCategory(category, type, tagged);
-    }
+    Message tagged{
+        HYReportingUtilityAddAudioMessageTag(
+            HYReportingUtilityRemoveWhiteSpaceFromKeys(std::move(message)), category, type),
+        category, type};
+    const bool redundant =
+        batch_.createMessageIdentifierWithCategory(category, type, tagged.payload);
     mark(kMessageMark);
     const bool wasStarted = started();
     if (relayReportingEnabled()) {
-        relay({std::move(tagged), std::move(original), category, type, wasStarted, redundant});
+        upload_.relay(shared_from_this(),
+                      {std::move(tagged), std::move(original), wasStarted, redundant});
     }
     if (reply) {
         reply(std::nullopt);
     }
 }
 
-std::uint32_t HYReportingSession::messageIdentifierCount(std::string_view base) const {
-    const MutexLock lock(batchMutex_);
-    return batch_ != nullptr ? batch_->countFor(base) : 0;
-}
-
-std::vector<HYReportingSession::BatchedMessage>
-HYReportingSession::nestedAggregatedPayloadData() const {
-    const MutexLock lock(batchMutex_);
-    std::vector<BatchedMessage> messages;
-    if (batch_ != nullptr) {
-        for (const MessageBatch::Entry& entry : batch_->entries()) {
-            messages.push_back({entry.identifier(), entry.message});
-        }
-    }
-    return messages;
+void HYReportingSession::sendSingleMessage(Dictionary message, AudioEventCategory category,
+                                           AudioEventType type, AudioServiceType serviceType,
+                                           const Dictionary& /*userInfo*/, SendReply reply) {
+    halyard::sendSingleMessage({std::move(message), category, type}, serviceType, std::move(reply));
 }
 
 } // namespace halyard

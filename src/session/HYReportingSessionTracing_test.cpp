@@ -50,7 +50,7 @@ protected:
             ++waits_;
             waitedSince_ = session_->stopWaitsSince();
             heldWhileWaiting_ = !performance()[0]->destroyed;
-            session_->performanceTraceDidComplete(url, "", error);
+            session_->trace().performanceTraceDidComplete(url, "", error);
             return true;
         };
         session_ = makeSession();
@@ -252,7 +252,8 @@ TEST_F(SessionTracingTest, ATraceThatCompletesWithAnErrorLeavesTheURLOfTheLast) 
     session_->start();
     session_->stop();
     ASSERT_EQ(session_->getPSTraceFileURL(), "/traces/one.dat");
-    session_->performanceTraceDidComplete("/traces/broken.dat", "", Error{"posix", 5, "broken"});
+    session_->trace().performanceTraceDidComplete("/traces/broken.dat", "",
+                                                  Error{"posix", 5, "broken"});
     EXPECT_EQ(session_->getPSTraceFileURL(), "/traces/one.dat");
     EXPECT_TRUE(loggedByTrace(LogLevel::Error, "performanceTraceDidComplete broken"));
     EXPECT_FALSE(loggedByTrace(LogLevel::Info, "Performance Trace Completed: /traces/broken.dat"));

@@ -1,9 +1,6 @@
-// The performance traces of a session of type test.
+#include "session/TraceControl.h"
 
-#include "session/HYReportingSession.h"
-
-#include <utility>
-
+#include "common/Description.h"
 #include "platform/Device.h"
 #include "platform/Log.h"
 #include "platform/Platform.h"
@@ -24,37 +21,41 @@ bool isEvtapConstant(const Value& kind) {
 
 } // namespace
 
-bool HYReportingSession::tracesPerformance() const {
+TraceControl::TraceControl(const SessionFacts& session) : session_(session) {}
+
+TraceControl::~TraceControl() = default;
+
+bool TraceControl::isWanted() const {
     return platform::current().featureFlags->isEnabled("AudioAnalytics", "Tracing") &&
-           serviceType() == kAudioServiceTypeTest;
+           session_.serviceType() == kAudioServiceTypeTest;
 }
 
-std::optional<std::string> HYReportingSession::tracingFileName() const {
-    const MutexLock lock(stateMutex_);
+std::optional<std::string> TraceControl::tracingFileName() const {
+    const MutexLock lock(mutex_);
     return tracingFileName_;
 }
 
-std::string HYReportingSession::getPSTraceFileURL() const {
-    const MutexLock lock(stateMutex_);
+std::string TraceControl::getPSTraceFileURL() const {
+    const MutexLock lock(mutex_);
     return finalTraceURL_;
 }
 
-std::shared_ptr<platform::PerformanceTraceSession> HYReportingSession::traceSession() const {
-    const MutexLock lock(stateMutex_);
+std::shared_ptr<platform::PerformanceTraceSession> TraceControl::traceSession() const {
+    const MutexLock lock(mutex_);
     return traceSession_;
 }
 
-void HYReportingSession::dropTraceSession() {
+void TraceControl::dropTraceSession() {
     std::shared_ptr<platform::PerformanceTraceSession> dropped; // Freed after the lock.
-    const MutexLock lock(stateMutex_);
+    const MutexLock lock(mutex_);
     dropped.swap(traceSession_);
 }
 
-void HYReportingSession::startTracing() {
-    if (startedTracing_.load() || !tracesPerformance()) {
+void TraceControl::start() {
+    if (startedTracing_.load() || !isWanted()) {
         return;
     }
-    const Dictionary configured = configuration();
+    const Dictionary configured = session_.configuration();
     const Value& kind = configured[HYReportingTraceType];
     const Value& path = configured[HYReportingLoomisPlistFilePath];
     if ((!kind.isNone() && !isEvtapConstant(kind)) || path.isNone()) {
@@ -70,28 +71,29 @@ void HYReportingSession::startTracing() {
     }
 }
 
-void HYReportingSession::setupTracing(const std::string* fileName) {
+void TraceControl::setupTracing(const std::string* fileName) {
     if (fileName == nullptr) {
         HY_LOG_ERROR(HYReportingTraceCategory, "TracefileName empty. Failed to setup tracing");
         return;
     }
     {
-        const MutexLock lock(stateMutex_);
+        const MutexLock lock(mutex_);
         tracingFileName_ = *fileName;
     }
     traceParams_ = std::make_unique<TraceParams>(TraceParamsParser(*fileName).loadTraceParams());
     traceRunner_ = std::make_unique<TraceRunner>();
     traceRunner_->createTraceFromTraceParams(traceParams_.get());
     startedTracing_.store(false);
-    HY_LOG_INFO(HYReportingTraceCategory, "Setting up tracing for {}", serviceName());
+    HY_LOG_INFO(HYReportingTraceCategory, "Setting up tracing for {}",
+                HYReportingUtilityGenerateServiceNameFromServiceType(session_.serviceType()));
 }
 
-void HYReportingSession::startPerformanceTrace() {
+void TraceControl::startPerformanceTrace() {
     const auto config = platform::PerformanceTraceConfig::configWithTemplate(kTraceTemplate);
     // Held here: a start that fails drops it from the session.
     const auto traceSession = platform::current().performanceTraces->initWithConfig(config);
     {
-        const MutexLock lock(stateMutex_);
+        const MutexLock lock(mutex_);
         traceConfig_ = config;
         traceSession_ = traceSession;
     }
@@ -100,8 +102,8 @@ void HYReportingSession::startPerformanceTrace() {
     traceSession->startPerformanceTrace();
 }
 
-void HYReportingSession::stopTracing() {
-    if (!startedTracing_.load() || !tracesPerformance()) {
+void TraceControl::stop() {
+    if (!startedTracing_.load() || !isWanted()) {
         return;
     }
     startedTracing_.store(false);
@@ -110,7 +112,7 @@ void HYReportingSession::stopTracing() {
     setStopWaitsSince(std::nullopt);
 }
 
-void HYReportingSession::waitForTrace() {
+void TraceControl::waitForTrace() {
     if (tracingFileName()) {
         stopEventTrace();
         return;
@@ -124,7 +126,7 @@ void HYReportingSession::waitForTrace() {
 // The name of the file stays when its trace has ended, the runner does not: it
 // holds every event that was recorded. A performance trace that the session
 // takes later thus has nobody to stop it, and runs until the session goes.
-void HYReportingSession::stopEventTrace() {
+void TraceControl::stopEventTrace() {
     if (traceRunner_ != nullptr) {
         traceRunner_->stopTracingandProcessResults();
     }
@@ -132,17 +134,17 @@ void HYReportingSession::stopEventTrace() {
     traceParams_.reset();
 }
 
-std::optional<platform::SteadyTime> HYReportingSession::stopWaitsSince() const {
-    const MutexLock lock(stateMutex_);
+std::optional<platform::SteadyTime> TraceControl::stopWaitsSince() const {
+    const MutexLock lock(mutex_);
     return stopWaitsSince_;
 }
 
-void HYReportingSession::setStopWaitsSince(std::optional<platform::SteadyTime> since) {
-    const MutexLock lock(stateMutex_);
+void TraceControl::setStopWaitsSince(std::optional<platform::SteadyTime> since) {
+    const MutexLock lock(mutex_);
     stopWaitsSince_ = since;
 }
 
-void HYReportingSession::performanceTraceDidStart(const MaybeError& error) {
+void TraceControl::performanceTraceDidStart(const MaybeError& error) {
     HY_LOG_DEFAULT(HYReportingPlatformCategory, "started performance trace.");
     if (!error) {
         HY_LOG_INFO(HYReportingTraceCategory, "Performance Trace Started");
@@ -150,13 +152,13 @@ void HYReportingSession::performanceTraceDidStart(const MaybeError& error) {
     }
     dropTraceSession();
     {
-        const MutexLock lock(stateMutex_);
+        const MutexLock lock(mutex_);
         traceConfig_.reset();
     }
     HY_LOG_ERROR(HYReportingTraceCategory, "performanceTraceDidStart {}", error->message);
 }
 
-void HYReportingSession::performanceTraceDidStop(const MaybeError& error) {
+void TraceControl::performanceTraceDidStop(const MaybeError& error) {
     if (!error) {
         HY_LOG_INFO(HYReportingTraceCategory, "Performance Trace Stopped");
         return;
@@ -165,9 +167,9 @@ void HYReportingSession::performanceTraceDidStop(const MaybeError& error) {
     HY_LOG_ERROR(HYReportingTraceCategory, "performanceTraceDidStop {}", error->message);
 }
 
-void HYReportingSession::performanceTraceDidComplete(std::string_view traceURL,
-                                                     std::string_view /*token*/,
-                                                     const MaybeError& error) {
+void TraceControl::performanceTraceDidComplete(std::string_view traceURL,
+                                               std::string_view /*token*/,
+                                               const MaybeError& error) {
     if (const auto completed = traceSession()) {
         completed->setDelegate({});
     }
@@ -178,7 +180,7 @@ void HYReportingSession::performanceTraceDidComplete(std::string_view traceURL,
         return;
     }
     {
-        const MutexLock lock(stateMutex_);
+        const MutexLock lock(mutex_);
         finalTraceURL_ = traceURL;
     }
     HY_LOG_INFO(HYReportingTraceCategory, "Performance Trace Completed: {}", traceURL);

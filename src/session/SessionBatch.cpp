@@ -1,0 +1,70 @@
+#include "session/SessionBatch.h"
+
+#include <utility>
+
+#include "common/Json.h"
+#include "platform/Log.h"
+#include "session/SummaryFile.h"
+
+namespace halyard {
+
+void SessionBatch::start(const MessageBatch::Options& options) {
+    const MutexLock lock(mutex_);
+    batch_ = std::make_unique<MessageBatch>(options);
+    started_.store(true);
+}
+
+void SessionBatch::stop() {
+    std::unique_ptr<MessageBatch> finished; // Freed after the lock.
+    const MutexLock lock(mutex_);
+    finished = std::move(batch_);
+    started_.store(false);
+}
+
+bool SessionBatch::createMessageIdentifierWithCategory(AudioEventCategory category,
+                                                       AudioEventType type,
+                                                       const Dictionary& message) {
+    const MutexLock lock(mutex_);
+    if (batch_ == nullptr || !batch_->addUnlessRedundant(category, type, message)) {
+        return false;
+    }
+    redundantMessages_.fetch_add(1, std::memory_order_relaxed);
+    HY_LOG_DEBUG(HYReportingSessionCategory, "dropping redundant event");
+    return true;
+}
+
+std::vector<Dictionary> SessionBatch::volumeMessages() const {
+    const MutexLock lock(mutex_);
+    return batch_ != nullptr ? batch_->volumeEvents() : std::vector<Dictionary>();
+}
+
+std::optional<Dictionary> SessionBatch::takeSummary(AudioServiceType serviceType) {
+    const MutexLock lock(mutex_);
+    return batch_ != nullptr ? batch_->takeSummary(serviceType) : std::nullopt;
+}
+
+std::optional<std::string> SessionBatch::summaryFileText() const {
+    const MutexLock lock(mutex_);
+    if (batch_ == nullptr || batch_->empty()) {
+        return std::nullopt;
+    }
+    return toPrettyJson(summaryFileContents(batch_->entries()));
+}
+
+std::uint32_t SessionBatch::countFor(std::string_view base) const {
+    const MutexLock lock(mutex_);
+    return batch_ != nullptr ? batch_->countFor(base) : 0;
+}
+
+std::vector<SessionBatch::Entry> SessionBatch::entries() const {
+    const MutexLock lock(mutex_);
+    std::vector<Entry> entries;
+    if (batch_ != nullptr) {
+        for (const MessageBatch::Entry& entry : batch_->entries()) {
+            entries.push_back({entry.identifier(), entry.message});
+        }
+    }
+    return entries;
+}
+
+} // namespace halyard

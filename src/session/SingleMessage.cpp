@@ -1,0 +1,75 @@
+#include "session/SingleMessage.h"
+
+#include <chrono>
+#include <utility>
+
+#include "platform/Log.h"
+#include "platform/Platform.h"
+#include "platform/Random.h"
+#include "platform/RelayReporting.h"
+#include "platform/TraceMarks.h"
+#include "platform/WorkQueue.h"
+#include "session/RelayClient.h"
+
+namespace halyard {
+namespace {
+
+using namespace platform; // The many kRelayReporting... names.
+
+constexpr std::uint32_t kMessageMark = 0x21044838;
+constexpr std::int64_t kSingleMessageSessionID = -1;
+constexpr std::uint32_t kAlarmSpreadSeconds = 60;
+constexpr std::chrono::nanoseconds kSingleMessageDelay{1'000'000'000};
+
+MaybeError upload(const Message& message, AudioServiceType serviceType) {
+    const Dictionary sessionInfo{{kRelayReportingSessionInfoClientType, kRelayClientType},
+                                 {kRelayReportingSessionInfoClientVersion, relayClientVersion()},
+                                 {kRelayReportingSessionInfoSessionID, kSingleMessageSessionID}};
+    const Dictionary userInfo{
+        {kRelayReportingUserInfoClientName, kRelayClientName},
+        {kRelayReportingUserInfoServiceName,
+         Value(HYReportingUtilityGenerateServiceNameFromServiceType(serviceType))}};
+    const Dictionary payload = HYReportingUtilityRemoveWhiteSpaceFromKeys(message.payload);
+    if (!HYReportingUtilityShouldSendMessage()) {
+        HY_LOG_INFO(HYReportingSessionCategory, "event sampled {}", Value(message.payload));
+        return std::nullopt;
+    }
+    MaybeError error = current().relayReporting->sendOneMessageWithSessionInfo(
+        sessionInfo, userInfo,
+        HYReportingUtilityRetrieveRelayReportingCategoryFromCategory(message.category),
+        message.type, payload);
+    if (error) {
+        HY_LOG_ERROR(HYReportingSessionCategory, "sendOneMessageWithSessionInfo {}",
+                     error->message);
+    } else {
+        HY_LOG_DEBUG(HYReportingSessionCategory, "message {} : category {} : type {}",
+                     Value(message.payload), shownInLog(message.category),
+                     shownInLog(message.type));
+    }
+    return error;
+}
+
+void deliver(const Message& message, AudioServiceType serviceType, const SendReply& reply) {
+    current().traceMarks->mark(kMessageMark, 0, 0, 0, 0);
+    HY_LOG_DEBUG(HYReportingSessionCategory, "sending single message");
+    const MaybeError error = upload(message, serviceType);
+    if (reply) {
+        reply(error);
+    }
+}
+
+} // namespace
+
+void sendSingleMessage(Message message, AudioServiceType serviceType, SendReply reply) {
+    // The delay of an alarm's message is drawn and told, but not applied.
+    const std::uint32_t delta =
+        serviceType == kAudioServiceTypeAlarms ? current().random->uniform(kAlarmSpreadSeconds) : 0;
+    HY_LOG_DEBUG(HYReportingSessionCategory, "sending single message after delta {} for service {}",
+                 delta, serviceType);
+    current().queues->backgroundQueue().asyncAfter(
+        kSingleMessageDelay, [message = std::move(message), serviceType, reply = std::move(reply)] {
+            deliver(message, serviceType, reply);
+        });
+}
+
+} // namespace halyard
