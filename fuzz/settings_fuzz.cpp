@@ -4,14 +4,12 @@
 #include <cstdint>
 #include <cstdlib>
 #include <string_view>
-#include <variant>
 
 #include "Require.h"
 #include "linux/config/Settings.h"
 
 using halyard::fuzz::require;
 using halyard::linux_::ParsedSettings;
-using halyard::linux_::SettingsError;
 
 namespace {
 
@@ -33,10 +31,10 @@ void check(const ParsedSettings& parsed) {
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     const auto result =
         halyard::linux_::parseSettings({reinterpret_cast<const char*>(data), size}, "fuzz");
-    if (const auto* const error = std::get_if<SettingsError>(&result)) {
-        require(!error->message.empty() && error->file == "fuzz");
+    if (result.ok()) {
+        check(result.value());
     } else {
-        check(std::get<ParsedSettings>(result));
+        require(!result.failure().text.empty() && result.failure().file == "fuzz");
     }
     return 0;
 }

@@ -38,21 +38,21 @@ Configuration::Outcome Configuration::reload() {
     auto text = readSmallFile(file_, kMaxFileBytes);
     if (const auto* const error = std::get_if<std::errc>(&text)) {
         if (!isMissing(*error)) {
-            return refuse({file_, 0, 0, std::make_error_code(*error).message()});
+            return refuse({{*error, {}}, file_});
         }
         return putInForce(Settings());
     }
     auto parsed = parseSettings(std::get<std::string>(text), file_.native());
-    if (const auto* const error = std::get_if<SettingsError>(&parsed)) {
-        return refuse(*error);
+    if (!parsed.ok()) {
+        return refuse(parsed.failure());
     }
-    logWarnings(file_, std::get<ParsedSettings>(parsed));
-    return putInForce(std::get<ParsedSettings>(std::move(parsed)).settings);
+    logWarnings(file_, parsed.value());
+    return putInForce(std::move(parsed.value().settings));
 }
 
-Configuration::Outcome Configuration::refuse(const SettingsError& error) {
-    HY_LOG_ERROR(HYReportingPlatformCategory, "{}:{}:{}: {}; {} in force", error.file, error.line,
-                 error.column, error.message,
+Configuration::Outcome Configuration::refuse(const SettingsFailure& failure) {
+    HY_LOG_ERROR(HYReportingPlatformCategory, "{}:{}:{}: {}; {} in force", failure.file,
+                 failure.line, failure.column, failure.message(),
                  taken_ ? "the last good configuration stays" : "the defaults are");
     return Outcome::Refused;
 }

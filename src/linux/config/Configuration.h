@@ -51,7 +51,7 @@ public:
     std::optional<bool> boolean(std::string_view name) const override;
 
 private:
-    Outcome refuse(const SettingsError& error) HY_REQUIRES(reloading_);
+    Outcome refuse(const SettingsFailure& failure) HY_REQUIRES(reloading_);
     Outcome putInForce(Settings settings) HY_REQUIRES(reloading_);
 
     const std::filesystem::path file_;

@@ -34,7 +34,7 @@ class SettingsReader {
 public:
     explicit SettingsReader(std::string_view path) : path_(path) {}
 
-    std::variant<ParsedSettings, SettingsError> read(const toml::table& root);
+    Result<ParsedSettings, SettingsFailure> read(const toml::table& root);
 
 private:
     // `name` is the dotted path of the key, for messages.
@@ -117,8 +117,8 @@ private:
 
     const std::string path_;
     ParsedSettings result_;
-    std::optional<SettingsError> error_;
-    DriverChannel channel_; // the one that is being read
+    std::optional<SettingsFailure> failure_; // the first of the file so far
+    DriverChannel channel_;                  // the one that is being read
     bool channelHasFormat_ = false;
 };
 
@@ -126,7 +126,7 @@ std::string join(const std::string& parent, std::string_view key) {
     return parent.empty() ? std::string(key) : fmt::format("{}.{}", parent, key);
 }
 
-std::variant<ParsedSettings, SettingsError> SettingsReader::read(const toml::table& root) {
+Result<ParsedSettings, SettingsFailure> SettingsReader::read(const toml::table& root) {
     static constexpr Key kKeys[] = {{"preferences", &SettingsReader::readPreferences},
                                     {"feature_flags", &SettingsReader::readFeatureFlags},
                                     {"device_properties", &SettingsReader::readDeviceProperties},
@@ -136,8 +136,8 @@ std::variant<ParsedSettings, SettingsError> SettingsReader::read(const toml::tab
                                     {"log", &SettingsReader::readLog},
                                     {"drivers", &SettingsReader::readDrivers}};
     readSection(root, "", kKeys);
-    if (error_) {
-        return std::move(*error_);
+    if (failure_) {
+        return std::move(*failure_);
     }
     auto& warnings = result_.warnings;
     std::stable_sort(warnings.begin(), warnings.end(),
@@ -153,8 +153,8 @@ std::variant<ParsedSettings, SettingsError> SettingsReader::read(const toml::tab
 
 void SettingsReader::fail(const toml::node& where, std::string message) {
     const toml::source_position at = where.source().begin;
-    if (!error_ || std::pair(at.line, at.column) < std::pair(error_->line, error_->column)) {
-        error_ = SettingsError{path_, at.line, at.column, std::move(message)};
+    if (!failure_ || std::pair(at.line, at.column) < std::pair(failure_->line, failure_->column)) {
+        failure_ = SettingsFailure{{{}, std::move(message)}, path_, at.line, at.column};
     }
 }
 
@@ -400,18 +400,19 @@ std::optional<std::uint32_t> lineOfTooManyDots(std::string_view text) {
 
 } // namespace
 
-std::variant<ParsedSettings, SettingsError> parseSettings(std::string_view text,
-                                                          std::string_view path) {
+Result<ParsedSettings, SettingsFailure> parseSettings(std::string_view text,
+                                                      std::string_view path) {
+    const auto refused = [&](std::string why, std::uint32_t line, std::uint32_t column) {
+        return SettingsFailure{{{}, std::move(why)}, std::string(path), line, column};
+    };
     if (const auto line = lineOfTooManyDots(text)) {
-        return SettingsError{std::string(path), *line, 1,
-                             fmt::format("more than {} dots in one file", kMaxKeyDots)};
+        return refused(fmt::format("more than {} dots in one file", kMaxKeyDots), *line, 1);
     }
     try {
         return SettingsReader(path).read(toml::parse(text, std::string_view()));
     } catch (const toml::parse_error& error) {
         const toml::source_position at = error.source().begin;
-        return SettingsError{std::string(path), at.line, at.column,
-                             std::string(error.description())};
+        return refused(std::string(error.description()), at.line, at.column);
     }
 }
 

@@ -10,10 +10,10 @@
 #include <optional>
 #include <string>
 #include <string_view>
-#include <variant>
 #include <vector>
 
 #include "common/LogCategory.h"
+#include "common/Result.h"
 #include "common/Value.h"
 #include "linux/drivers/DriverChannel.h"
 #include "linux/net/Peer.h"
@@ -38,13 +38,10 @@ struct Settings {
 
 // Why a file was not taken. Line and column count from 1; 0 is the file as a
 // whole.
-struct SettingsError {
+struct SettingsFailure : Failure {
     std::string file;
     std::uint32_t line = 0;
     std::uint32_t column = 0;
-    std::string message;
-
-    bool operator==(const SettingsError&) const = default;
 };
 
 // Something that has no effect, though its writer must have meant one.
@@ -67,7 +64,6 @@ inline constexpr int kMaxPreferenceDepth = 32;
 
 // Reads the text of halyard.toml. All or nothing: of several mistakes the first
 // in the file is told. `path` only names the file in the error.
-[[nodiscard]] std::variant<ParsedSettings, SettingsError> parseSettings(std::string_view text,
-                                                                        std::string_view path);
+Result<ParsedSettings, SettingsFailure> parseSettings(std::string_view text, std::string_view path);
 
 } // namespace halyard::linux_

@@ -15,11 +15,12 @@ using ::testing::HasSubstr;
 
 ParsedSettings parsed(std::string_view text) {
     auto result = parseSettings(text, "/etc/halyard/halyard.toml");
-    if (const auto* error = std::get_if<SettingsError>(&result)) {
-        ADD_FAILURE() << error->line << ":" << error->column << ": " << error->message;
+    if (!result.ok()) {
+        const SettingsFailure& failure = result.failure();
+        ADD_FAILURE() << failure.line << ":" << failure.column << ": " << failure.text;
         return {};
     }
-    return std::get<ParsedSettings>(std::move(result));
+    return std::move(result).value();
 }
 
 Settings settings(std::string_view text) {
@@ -31,12 +32,12 @@ Settings settings(std::string_view text) {
 // "LINE:COLUMN: MESSAGE", empty when the text is taken.
 std::string mistake(std::string_view text) {
     const auto result = parseSettings(text, "f");
-    const auto* const error = std::get_if<SettingsError>(&result);
-    if (error == nullptr) {
+    if (result.ok()) {
         return "";
     }
-    return std::to_string(error->line) + ":" + std::to_string(error->column) + ": " +
-           error->message;
+    const SettingsFailure& failure = result.failure();
+    return std::to_string(failure.line) + ":" + std::to_string(failure.column) + ": " +
+           failure.text;
 }
 
 std::vector<SettingsWarning> warnings(std::string_view text) {
@@ -173,12 +174,11 @@ TEST(SettingsTest, AChannelWithoutFormatHasTheUsualOneOfItsSource) {
 TEST(SettingsErrorTest, SyntaxErrorsNameFileLineAndColumn) {
     const auto result = parseSettings("[log]\nlevel = = 1\n", "/etc/halyard/halyard.toml");
 
-    ASSERT_TRUE(std::holds_alternative<SettingsError>(result));
-    const auto& error = std::get<SettingsError>(result);
-    EXPECT_EQ(error.file, "/etc/halyard/halyard.toml");
-    EXPECT_EQ(error.line, 2u);
-    EXPECT_EQ(error.column, 9u);
-    EXPECT_FALSE(error.message.empty());
+    ASSERT_FALSE(result.ok());
+    EXPECT_EQ(result.failure().file, "/etc/halyard/halyard.toml");
+    EXPECT_EQ(result.failure().line, 2u);
+    EXPECT_EQ(result.failure().column, 9u);
+    EXPECT_FALSE(result.failure().text.empty());
 }
 
 TEST(SettingsErrorTest, InvalidUtf8AndDuplicateKeysAreErrors) {
