@@ -4,7 +4,6 @@
 #include <cstdint>
 #include <cstdlib>
 #include <string_view>
-#include <variant>
 
 #include "Require.h"
 #include "linux/drivers/SourceKinds.h"
@@ -33,9 +32,8 @@ void checkBuckets(const std::optional<SourceBuckets>& buckets) {
 void checkSource(std::string_view text) {
     SourceRoot root{"/nonexistent"};
     const auto made = makeChannelSource(text, root);
-    const auto* const fault = std::get_if<std::string>(&made);
-    require(fault == nullptr || !fault->empty());
-    require(fault != nullptr || findSourceKind(text) != nullptr);
+    require(made.ok() || !made.failure().text.empty());
+    require(!made.ok() || findSourceKind(text) != nullptr);
 }
 
 } // namespace

@@ -17,11 +17,10 @@ std::string& scratch() {
     return text;
 }
 
-Reading missing(const SampledFile& file, std::errc error) {
+Reading missing(const SampledFile& file, const Failure& failure) {
     Reading reading;
-    reading.status = meansAbsent(error) ? ReadStatus::Absent : ReadStatus::Failed;
-    reading.fault =
-        fmt::format("{}: {}", file.path().native(), std::make_error_code(error).message());
+    reading.status = meansAbsent(failure) ? ReadStatus::Absent : ReadStatus::Failed;
+    reading.fault = fmt::format("{}: {}", file.path().native(), failure.message());
     return reading;
 }
 
@@ -49,8 +48,8 @@ void settle(ReadingShapeRef& shape, ReadingShape now) {
 // none, and then the reading says why.
 bool addNumber(SampledFile& file, Reading& reading, std::size_t place) {
     std::string& text = scratch();
-    if (const std::errc error = file.read(text); error != std::errc{}) {
-        reading = missing(file, error);
+    if (const auto result = file.read(text); !result.ok()) {
+        reading = missing(file, result.failure());
         return false;
     }
     const auto value = parseInteger(text);
@@ -66,8 +65,8 @@ bool addNumber(SampledFile& file, Reading& reading, std::size_t place) {
 
 Reading CounterSource::read(platform::SteadyTime) {
     std::string& text = scratch();
-    if (const std::errc error = file_.read(text); error != std::errc{}) {
-        return missing(file_, error);
+    if (const auto result = file_.read(text); !result.ok()) {
+        return missing(file_, result.failure());
     }
     const auto value = parse_(text);
     return value ? simple(static_cast<std::uint64_t>(*value)) : malformed(file_);
@@ -111,8 +110,8 @@ Reading InterruptSource::read(platform::SteadyTime) {
     std::uint64_t sum = 0;
     std::string& text = scratch();
     for (SampledFile& file : counts_) {
-        if (const std::errc error = file.read(text); error != std::errc{}) {
-            return missing(file, error);
+        if (const auto result = file.read(text); !result.ok()) {
+            return missing(file, result.failure());
         }
         const auto count = parsePerCpuCount(text);
         if (!count) {
@@ -215,7 +214,7 @@ Reading RuntimePowerSource::read(platform::SteadyTime) {
 // kernels that keep none.
 void StateTableSource::addTransitions(SourceStates& states) {
     std::string& text = scratch();
-    if (!transitions_ || transitions_->read(text) != std::errc{}) {
+    if (!transitions_ || !transitions_->read(text).ok()) {
         return;
     }
     const auto table = parseTransitionTable(text);
@@ -233,8 +232,8 @@ void StateTableSource::addTransitions(SourceStates& states) {
 
 Reading StateTableSource::read(platform::SteadyTime) {
     std::string& text = scratch();
-    if (const std::errc error = file_.read(text); error != std::errc{}) {
-        return missing(file_, error);
+    if (const auto result = file_.read(text); !result.ok()) {
+        return missing(file_, result.failure());
     }
     auto states = parse_(text);
     if (!states) {
@@ -256,8 +255,8 @@ Reading StateTableSource::read(platform::SteadyTime) {
 
 Reading BucketSource::read(platform::SteadyTime) {
     std::string& text = scratch();
-    if (const std::errc error = file_.read(text); error != std::errc{}) {
-        return missing(file_, error);
+    if (const auto result = file_.read(text); !result.ok()) {
+        return missing(file_, result.failure());
     }
     const auto buckets = parse_(text);
     if (!buckets) {
@@ -354,11 +353,11 @@ void PcmSource::advance(const PcmStatus& status, platform::SteadyTime now) {
 
 Reading PcmSource::read(platform::SteadyTime now) {
     std::string& text = scratch();
-    if (const std::errc error = file_.read(text); error != std::errc{}) {
-        if (meansAbsent(error)) { // And its history with it.
+    if (const auto result = file_.read(text); !result.ok()) {
+        if (meansAbsent(result.failure())) { // And its history with it.
             last_.reset();
         }
-        return missing(file_, error);
+        return missing(file_, result.failure());
     }
     auto status = parsePcmStatus(text);
     if (!status) {

@@ -19,18 +19,16 @@ protected:
     // Of the captured device, or of `root`.
     static std::unique_ptr<ChannelSource> make(const std::string& text, SourceRoot& root) {
         auto made = makeChannelSource(text, root);
-        auto* const source = std::get_if<std::unique_ptr<ChannelSource>>(&made);
-        EXPECT_NE(source, nullptr) << std::get<std::string>(made);
-        return source != nullptr ? std::move(*source) : nullptr;
+        EXPECT_TRUE(made.ok()) << made.failure().text;
+        return made.ok() ? std::move(made).value() : nullptr;
     }
     Reading read(const std::string& text) {
         const auto source = make(text, device_);
         return source != nullptr ? source->read(now_) : Reading();
     }
     std::string refusal(const std::string& text) {
-        auto made = makeChannelSource(text, device_);
-        const auto* const why = std::get_if<std::string>(&made);
-        return why != nullptr ? *why : "taken";
+        const auto made = makeChannelSource(text, device_);
+        return made.ok() ? "taken" : made.failure().text;
     }
 
     testing::TempTree tree_;

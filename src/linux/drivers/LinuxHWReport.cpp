@@ -58,11 +58,10 @@ LinuxHWReport::LinuxHWReport(const platform::Clock& clock,
 
 void LinuxHWReport::add(const DriverChannel& names, bool configured) {
     auto made = makeChannelSource(names.source, *root_);
-    auto* const source = std::get_if<std::unique_ptr<ChannelSource>>(&made);
     const SourceKind* const kind = findSourceKind(names.source);
     std::string fault;
-    if (source == nullptr) {
-        fault = std::get<std::string>(made);
+    if (!made.ok()) {
+        fault = made.failure().text;
     } else if (kind->format != names.format) {
         fault =
             fmt::format("gives the format {}, not {}", nameOf(kind->format), nameOf(names.format));
@@ -77,7 +76,7 @@ void LinuxHWReport::add(const DriverChannel& names, bool configured) {
     Channel channel;
     channel.facts =
         std::make_shared<const ChannelFacts>(ChannelFacts{names, kind->residencyPerSecond});
-    channel.source = withRoot(std::move(*source), root_);
+    channel.source = withRoot(std::move(made).value(), root_);
     channel.configured = configured;
     const auto same = std::find_if(channels_.begin(), channels_.end(), [&](const Channel& each) {
         return identity(each.facts->names) == identity(names);

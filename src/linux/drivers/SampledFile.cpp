@@ -13,10 +13,6 @@ namespace {
 
 constexpr std::size_t kFirstRead = 4096;
 
-std::errc lastError() {
-    return static_cast<std::errc>(errno);
-}
-
 } // namespace
 
 SampledFile::SampledFile(std::filesystem::path path, DescriptorBudget& budget)
@@ -39,15 +35,16 @@ void SampledFile::close() {
     }
 }
 
-std::errc SampledFile::open() {
+Result<void> SampledFile::open() {
     const int descriptor = ::open(path_.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
     if (descriptor < 0) {
-        return lastError();
+        return Failure::ofErrno();
     }
     struct stat facts {};
     if (::fstat(descriptor, &facts) != 0 || !S_ISREG(facts.st_mode)) {
         ::close(descriptor);
-        return S_ISDIR(facts.st_mode) ? std::errc::is_a_directory : std::errc::invalid_argument;
+        return Failure{S_ISDIR(facts.st_mode) ? std::errc::is_a_directory
+                                              : std::errc::invalid_argument};
     }
     struct statfs system {};
     if (::fstatfs(descriptor, &system) == 0) {
@@ -58,7 +55,7 @@ std::errc SampledFile::open() {
     }
     descriptor_ = descriptor;
     budget_->fetch_sub(1);
-    return std::errc{};
+    return {};
 }
 
 // Scripts write a new file and move it over the old one, which stays readable
@@ -73,13 +70,13 @@ bool SampledFile::isStillTheFile() const {
            opened.st_dev == named.st_dev && opened.st_ino == named.st_ino;
 }
 
-std::errc SampledFile::readOpen(std::string& text) const {
+Result<void> SampledFile::readOpen(std::string& text) const {
     text.resize(kFirstRead);
     std::size_t have = 0;
     for (;;) {
         if (have == text.size()) {
             if (have > kMaxSampledFile) {
-                return std::errc::file_too_large;
+                return Failure{std::errc::file_too_large};
             }
             text.resize(have * 4);
         }
@@ -89,7 +86,7 @@ std::errc SampledFile::readOpen(std::string& text) const {
             continue;
         }
         if (got < 0) {
-            return lastError();
+            return Failure::ofErrno();
         }
         have += static_cast<std::size_t>(got);
         if (got == 0 || (oneRead_ && have < text.size())) {
@@ -97,30 +94,31 @@ std::errc SampledFile::readOpen(std::string& text) const {
         }
     }
     text.resize(have);
-    return have > kMaxSampledFile ? std::errc::file_too_large : std::errc{};
+    if (have > kMaxSampledFile) {
+        return Failure{std::errc::file_too_large};
+    }
+    return {};
 }
 
-std::errc SampledFile::read(std::string& text) {
+Result<void> SampledFile::read(std::string& text) {
     text.clear();
     if (descriptor_ >= 0) {
-        if (isStillTheFile() && readOpen(text) == std::errc{}) {
-            return std::errc{};
+        if (isStillTheFile() && readOpen(text).ok()) {
+            return {};
         }
         close();
     }
-    std::errc error = open();
-    if (error != std::errc{}) {
-        text.clear();
-        return error;
+    Result<void> result = open();
+    if (result.ok()) {
+        result = readOpen(text);
+        if (!result.ok() || budget_->load() < 0) {
+            close();
+        }
     }
-    error = readOpen(text);
-    if (error != std::errc{} || budget_->load() < 0) {
-        close();
-    }
-    if (error != std::errc{}) {
+    if (!result.ok()) {
         text.clear();
     }
-    return error;
+    return result;
 }
 
 } // namespace halyard::linux_

@@ -13,7 +13,8 @@
 #include <cstddef>
 #include <filesystem>
 #include <string>
-#include <system_error>
+
+#include "common/Result.h"
 
 namespace halyard::linux_ {
 
@@ -31,14 +32,14 @@ public:
     ~SampledFile();
 
     // The whole of the file as it is now, in `text`; or why not.
-    [[nodiscard]] std::errc read(std::string& text);
+    Result<void> read(std::string& text);
     const std::filesystem::path& path() const { return path_; }
 
 private:
-    [[nodiscard]] std::errc open();
+    Result<void> open();
     void close();
     bool isStillTheFile() const;
-    [[nodiscard]] std::errc readOpen(std::string& text) const;
+    Result<void> readOpen(std::string& text) const;
 
     std::filesystem::path path_;
     DescriptorBudget* budget_;
@@ -48,9 +49,11 @@ private:
 };
 
 // Nothing is there, or no longer: the device is missing, not broken.
-inline bool meansAbsent(std::errc error) {
-    return error == std::errc::no_such_file_or_directory || error == std::errc::no_such_device ||
-           error == std::errc::no_such_device_or_address || error == std::errc::not_a_directory;
+inline bool meansAbsent(const Failure& failure) {
+    return failure.code == std::errc::no_such_file_or_directory ||
+           failure.code == std::errc::no_such_device ||
+           failure.code == std::errc::no_such_device_or_address ||
+           failure.code == std::errc::not_a_directory;
 }
 
 } // namespace halyard::linux_

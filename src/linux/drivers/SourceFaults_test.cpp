@@ -12,7 +12,7 @@ using ::testing::ElementsAre;
 class SourceFaultsTest : public ::testing::Test {
 protected:
     static std::unique_ptr<ChannelSource> make(const std::string& text, SourceRoot& root) {
-        return std::get<std::unique_ptr<ChannelSource>>(makeChannelSource(text, root));
+        return makeChannelSource(text, root).value();
     }
 
     testing::TempTree tree_;

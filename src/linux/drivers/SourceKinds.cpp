@@ -12,7 +12,7 @@
 namespace halyard::linux_ {
 namespace {
 
-using Made = std::variant<std::unique_ptr<ChannelSource>, std::string>;
+using Made = Result<std::unique_ptr<ChannelSource>>;
 
 constexpr std::size_t kMostColumn = 10000;
 
@@ -35,6 +35,10 @@ struct Order {
     }
 };
 
+Failure mistake(std::string text) {
+    return {{}, std::move(text)};
+}
+
 template <class Source, class... Arguments> Made make(Arguments&&... arguments) {
     return std::make_unique<Source>(std::forward<Arguments>(arguments)...);
 }
@@ -49,12 +53,12 @@ Made makeField(Order order) {
     const auto row = order.takeLast();
     FieldPlace place;
     if (!column || !row) {
-        return "needs the form field:PATH:ROW:COLUMN";
+        return mistake("needs the form field:PATH:ROW:COLUMN");
     }
     const char* const end = column->data() + column->size();
     if (std::from_chars(column->data(), end, place.column).ptr != end || place.column < 1 ||
         place.column > kMostColumn) {
-        return fmt::format("COLUMN must be a number from 1 to {}", kMostColumn);
+        return mistake(fmt::format("COLUMN must be a number from 1 to {}", kMostColumn));
     }
     place.row = *row;
     return make<CounterSource>(order.file(),
@@ -64,7 +68,7 @@ Made makeField(Order order) {
 Made makePressure(Order order) {
     const auto line = order.takeLast();
     if (line != "some" && line != "full") {
-        return "needs the form pressure:PATH:some or pressure:PATH:full";
+        return mistake("needs the form pressure:PATH:some or pressure:PATH:full");
     }
     return make<CounterSource>(order.file(), [word = std::string(*line)](std::string_view text) {
         return parsePressure(text, word);
@@ -154,15 +158,15 @@ const SourceKind* findSourceKind(std::string_view source) {
 Made makeChannelSource(std::string_view source, SourceRoot& root) {
     const Kind* const kind = findKind(source);
     if (kind == nullptr) {
-        return fmt::format("\"{}\" is no kind of source", kindName(source));
+        return mistake(fmt::format("\"{}\" is no kind of source", kindName(source)));
     }
     std::string_view rest = source.substr(kind->name.size());
     rest.remove_prefix(rest.empty() ? 0 : 1);
     if (kind->takesPath && !rest.starts_with('/')) {
-        return "needs a path that begins with \"/\"";
+        return mistake("needs a path that begins with \"/\"");
     }
     if (rest.empty() || rest.find('\0') != std::string_view::npos) {
-        return "needs something behind the \":\"";
+        return mistake("needs something behind the \":\"");
     }
     return kind->make({rest, root});
 }

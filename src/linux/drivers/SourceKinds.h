@@ -6,10 +6,9 @@
 
 #include <cstdint>
 #include <memory>
-#include <string>
 #include <string_view>
-#include <variant>
 
+#include "common/Result.h"
 #include "linux/drivers/ChannelSource.h"
 #include "linux/drivers/DriverChannel.h"
 
@@ -26,9 +25,8 @@ struct SourceKind {
 // of none.
 const SourceKind* findSourceKind(std::string_view source);
 
-// Understands the whole of the source; the text says what is wrong. Nothing needs
+// Understands the whole of the source, or says what is wrong with it. Nothing needs
 // to be there yet, but interrupts (irq:), which are looked for now.
-[[nodiscard]] std::variant<std::unique_ptr<ChannelSource>, std::string>
-makeChannelSource(std::string_view source, SourceRoot& root);
+Result<std::unique_ptr<ChannelSource>> makeChannelSource(std::string_view source, SourceRoot& root);
 
 } // namespace halyard::linux_
