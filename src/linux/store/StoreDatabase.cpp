@@ -1,7 +1,6 @@
 #include "linux/store/StoreDatabase.h"
 
 #include <algorithm>
-#include <cerrno>
 #include <fmt/format.h>
 #include <fstream>
 #include <string_view>
@@ -53,6 +52,15 @@ std::int64_t versionInHeader(const std::filesystem::path& path) {
     return version;
 }
 
+// Said without SQLite, which finds nothing wrong.
+StoreFailure refusal(int sqlite, std::string why) {
+    return {{{}, std::move(why)}, sqlite};
+}
+
+StoreFailure newerSchema() {
+    return refusal(SQLITE_CANTOPEN, "its schema is newer than this program");
+}
+
 int rememberLogPages(void* pages, sqlite3*, const char*, int count) {
     *static_cast<std::uint64_t*>(pages) = static_cast<std::uint64_t>(count);
     return SQLITE_OK;
@@ -66,98 +74,91 @@ StoreDatabase::~StoreDatabase() {
     abandon();
 }
 
-StoreDatabase::Opened StoreDatabase::open() {
+StoreResult StoreDatabase::open() {
     if (versionInHeader(settings_.path) > kStoreSchemaVersion) {
-        errorText_ = "its schema is newer than this program";
-        return Opened::NewerSchema;
+        return newerSchema();
     }
-    const Opened result = openFile();
-    if (result != Opened::Yes) {
+    StoreResult result = openFile();
+    if (!result.ok()) {
         abandon();
     }
     return result;
 }
 
-StoreDatabase::Opened StoreDatabase::openFile() {
-    int code = sqlite3_open_v2(settings_.path.c_str(), &database_,
-                               SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOMUTEX |
-                                   SQLITE_OPEN_EXRESCODE,
-                               settings_.vfs);
+StoreResult StoreDatabase::openFile() {
+    const int code = sqlite3_open_v2(settings_.path.c_str(), &database_,
+                                     SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE |
+                                         SQLITE_OPEN_NOMUTEX | SQLITE_OPEN_EXRESCODE,
+                                     settings_.vfs);
     if (code != SQLITE_OK) {
-        return classify(note(code));
+        return failureOf(code);
     }
     sqlite3_db_config(database_, SQLITE_DBCONFIG_NO_CKPT_ON_CLOSE, 1, nullptr);
     sqlite3_busy_timeout(database_, static_cast<int>(settings_.busyTimeout.count()));
     // Takes the place of SQLite's own checkpoints.
     sqlite3_wal_hook(database_, rememberLogPages, &logPages_);
     logPages_ = triedLogPages_ = 0;
-    std::int64_t version = 0;
-    code = query("PRAGMA user_version", version);
-    if (code == SQLITE_OK && version > kStoreSchemaVersion) {
-        errorText_ = "its schema is newer than this program";
-        return Opened::NewerSchema;
+    const auto version = query("PRAGMA user_version");
+    if (version.ok() && version.value() > kStoreSchemaVersion) {
+        return newerSchema();
     }
-    if (code == SQLITE_OK && sqlite3_db_readonly(database_, "main") == 1) {
-        errorText_ = "it is read-only";
-        return Opened::Refused;
+    if (version.ok() && sqlite3_db_readonly(database_, "main") == 1) {
+        return refusal(SQLITE_READONLY, "it is read-only");
     }
+    StoreResult result = version.ok() ? StoreResult() : version.failure();
     for (const auto step :
          {&StoreDatabase::configure, &StoreDatabase::check, &StoreDatabase::migrate,
           &StoreDatabase::prepare, &StoreDatabase::refreshIds, &StoreDatabase::readPageCounts}) {
-        code = code == SQLITE_OK ? (this->*step)() : code;
+        result = result.ok() ? (this->*step)() : result;
     }
     ++generation_;
     firstUpload_ = firstUpload_ == 0 ? nextID_[0] : firstUpload_;
-    return classify(code);
+    return result;
 }
 
-int StoreDatabase::configure() {
-    int code = execute(kConfiguration);
+StoreResult StoreDatabase::configure() {
+    if (StoreResult done = execute(kConfiguration); !done.ok()) {
+        return done;
+    }
     StoreStatement mode;
+    int code = mode.prepare(database_, "PRAGMA journal_mode = WAL");
     if (code == SQLITE_OK) {
-        code = note(mode.prepare(database_, "PRAGMA journal_mode = WAL"));
+        code = mode.step();
     }
-    if (code != SQLITE_OK) {
-        return code;
-    }
-    code = mode.step();
     if (code == SQLITE_ROW && mode.text(0) != "wal") {
-        errorText_ = "its file system does not support shared memory";
-        return SQLITE_CANTOPEN;
+        return refusal(SQLITE_CANTOPEN, "its file system does not support shared memory");
     }
-    return code == SQLITE_ROW ? SQLITE_OK : note(code);
+    return resultOf(code == SQLITE_ROW ? SQLITE_OK : code);
 }
 
-int StoreDatabase::check() {
+StoreResult StoreDatabase::check() {
     std::error_code ignored;
     const auto bytes = std::filesystem::file_size(settings_.path, ignored);
     if (ignored || bytes > kCheckedBytes) {
-        return SQLITE_OK;
+        return {};
     }
     StoreStatement quick;
-    int code = note(quick.prepare(database_, "PRAGMA quick_check(1)"));
+    int code = quick.prepare(database_, "PRAGMA quick_check(1)");
     if (code == SQLITE_OK) {
         code = quick.step();
     }
-    if (code == SQLITE_ROW && quick.text(0) == "ok") {
-        return SQLITE_OK;
+    if (code == SQLITE_ROW && quick.text(0) != "ok") {
+        return refusal(SQLITE_CORRUPT, std::string(quick.text(0)));
     }
-    if (code == SQLITE_ROW) {
-        errorText_ = std::string(quick.text(0));
-        return SQLITE_CORRUPT;
-    }
-    return note(code);
+    return resultOf(code == SQLITE_ROW ? SQLITE_OK : code);
 }
 
-int StoreDatabase::migrate() {
-    std::int64_t version = 0;
-    int code = query("PRAGMA user_version", version);
-    if (code == SQLITE_OK && version < 0) {
-        errorText_ = "its schema version is negative";
-        return SQLITE_CORRUPT;
+StoreResult StoreDatabase::migrate() {
+    const auto found = query("PRAGMA user_version");
+    if (!found.ok()) {
+        return found.failure();
     }
-    if (code != SQLITE_OK || version == kStoreSchemaVersion) {
-        return code;
+    const std::int64_t version = found.value();
+    if (version < 0) {
+        return refusal(SQLITE_CORRUPT, "its schema version is negative");
+    }
+    if (version == kStoreSchemaVersion) {
+        return {};
     }
     std::string sql = "BEGIN IMMEDIATE;";
     if (version == 0) {
@@ -169,11 +170,11 @@ int StoreDatabase::migrate() {
     return execute(fmt::format("{}PRAGMA user_version = {}; COMMIT", sql, kStoreSchemaVersion));
 }
 
-int StoreDatabase::prepare() {
+StoreResult StoreDatabase::prepare() {
     int code = SQLITE_OK;
     const auto add = [&](StoreStatement& statement, std::string_view sql) {
         if (code == SQLITE_OK) {
-            code = note(statement.prepare(database_, sql));
+            code = statement.prepare(database_, sql);
         }
     };
     for (std::size_t i = 0; i < kStoreTables; ++i) {
@@ -186,78 +187,60 @@ int StoreDatabase::prepare() {
     add(countPages_, "PRAGMA page_count");
     // Tables of another shape than ours are as good as damaged.
     if (code == SQLITE_ERROR) {
-        return SQLITE_CORRUPT;
+        return refusal(SQLITE_CORRUPT, failureOf(code).text);
     }
-    return code;
+    return resultOf(code);
 }
 
-int StoreDatabase::refreshIds() {
+StoreResult StoreDatabase::refreshIds() {
     for (std::size_t i = 0; i < kStoreTables; ++i) {
-        std::int64_t newest = 0;
-        const int code = query(fmt::format("SELECT max(id) FROM {}", kStoreSchema[i].name), newest);
-        if (code != SQLITE_OK) {
-            return code;
+        const auto newest = query(fmt::format("SELECT max(id) FROM {}", kStoreSchema[i].name));
+        if (!newest.ok()) {
+            return newest.failure();
         }
-        nextID_[i] = std::max(nextID_[i], newest + 1);
+        nextID_[i] = std::max(nextID_[i], newest.value() + 1);
     }
-    return SQLITE_OK;
+    return {};
 }
 
-int StoreDatabase::readPageCounts() {
-    std::int64_t size = 0;
-    const int code = query("PRAGMA page_size", size);
-    pageSize_ = static_cast<std::uint64_t>(size);
-    if (code == SQLITE_OK && countPages_.step() == SQLITE_ROW) {
+StoreResult StoreDatabase::readPageCounts() {
+    const auto size = query("PRAGMA page_size");
+    if (!size.ok()) {
+        return size.failure();
+    }
+    pageSize_ = static_cast<std::uint64_t>(size.value());
+    if (countPages_.step() == SQLITE_ROW) {
         pageCount_ = static_cast<std::uint64_t>(countPages_.integer(0));
         countPages_.reset();
     }
-    return code;
+    return {};
 }
 
-int StoreDatabase::execute(const std::string& sql) {
-    return note(sqlite3_exec(database_, sql.c_str(), nullptr, nullptr, nullptr));
+StoreResult StoreDatabase::execute(const std::string& sql) {
+    return resultOf(sqlite3_exec(database_, sql.c_str(), nullptr, nullptr, nullptr));
 }
 
-int StoreDatabase::query(std::string_view sql, std::int64_t& result) {
+Result<std::int64_t, StoreFailure> StoreDatabase::query(std::string_view sql) {
     StoreStatement statement;
     int code = statement.prepare(database_, sql);
     if (code == SQLITE_OK) {
         code = statement.step();
     }
     if (code != SQLITE_ROW) {
-        return note(code == SQLITE_DONE ? SQLITE_ERROR : code);
+        return failureOf(code == SQLITE_DONE ? SQLITE_ERROR : code);
     }
-    result = statement.integer(0);
-    return SQLITE_OK;
+    return statement.integer(0);
 }
 
-int StoreDatabase::note(int code) {
-    if (code != SQLITE_OK) {
-        errorCode_ = code;
-        systemError_ = database_ == nullptr ? 0 : sqlite3_system_errno(database_);
-        const char* text = database_ == nullptr ? nullptr : sqlite3_errmsg(database_);
-        errorText_ = fmt::format("{} ({})", text == nullptr ? sqlite3_errstr(code) : text, code);
-    }
-    return code;
+StoreResult StoreDatabase::resultOf(int code) const {
+    return code == SQLITE_OK ? StoreResult() : failureOf(code);
 }
 
-StoreDatabase::Opened StoreDatabase::classify(int code) const {
-    const bool noSpace = systemError_ == ENOSPC || systemError_ == EDQUOT;
-    switch (code & 0xFF) {
-    case SQLITE_OK:
-        return Opened::Yes;
-    case SQLITE_NOTADB:
-    case SQLITE_CORRUPT:
-        return Opened::Damaged;
-    case SQLITE_FULL:
-    case SQLITE_BUSY:
-    case SQLITE_LOCKED:
-    case SQLITE_PROTOCOL:
-    case SQLITE_NOMEM:
-        return Opened::NotNow;
-    default:
-        return noSpace ? Opened::NotNow : Opened::Refused;
-    }
+StoreFailure StoreDatabase::failureOf(int code) const {
+    const int system = database_ == nullptr ? 0 : sqlite3_system_errno(database_);
+    const char* const said = database_ == nullptr ? nullptr : sqlite3_errmsg(database_);
+    std::string text = fmt::format("{} ({})", said == nullptr ? sqlite3_errstr(code) : said, code);
+    return {{static_cast<std::errc>(system), std::move(text)}, code};
 }
 
 bool StoreDatabase::hasMoved() {
@@ -287,18 +270,17 @@ void StoreDatabase::close() {
     abandon();
 }
 
-int StoreDatabase::begin() {
+StoreResult StoreDatabase::begin() {
     nextIDBefore_ = nextID_;
     groupRows_ = {};
     groupUploads_.clear();
-    return note(begin_.run());
+    return resultOf(begin_.run());
 }
 
-int StoreDatabase::commit() {
-    const int code = note(commit_.run());
-    if (code != SQLITE_OK) {
+StoreResult StoreDatabase::commit() {
+    if (StoreResult done = resultOf(commit_.run()); !done.ok()) {
         rollback();
-        return code;
+        return done;
     }
     committedRows_ = groupRows_;
     groupUploads_.clear();
@@ -306,7 +288,7 @@ int StoreDatabase::commit() {
         pageCount_ = static_cast<std::uint64_t>(countPages_.integer(0));
         countPages_.reset();
     }
-    return SQLITE_OK;
+    return {};
 }
 
 void StoreDatabase::rollback() {
@@ -320,10 +302,10 @@ void StoreDatabase::rollback() {
     groupUploads_.clear();
 }
 
-int StoreDatabase::boundLog(std::uint64_t maxBytes, std::uint64_t checkpointBytes) {
+StoreResult StoreDatabase::boundLog(std::uint64_t maxBytes, std::uint64_t checkpointBytes) {
     const std::uint64_t step = checkpointBytes / pageSize_;
     if (logPages_ < step || logPages_ < triedLogPages_ + step / 4) {
-        return SQLITE_OK;
+        return {};
     }
     const bool tooLong = logBytes() > maxBytes;
     const int mode = tooLong ? SQLITE_CHECKPOINT_TRUNCATE : SQLITE_CHECKPOINT_PASSIVE;
@@ -334,109 +316,109 @@ int StoreDatabase::boundLog(std::uint64_t maxBytes, std::uint64_t checkpointByte
         if (code == SQLITE_OK) {
             logPages_ = triedLogPages_ = 0;
         }
-        return note(code);
+        return resultOf(code);
     }
     // Once all of it has moved, the next commit begins the log anew.
     triedLogPages_ = code == SQLITE_OK && logged == moved ? 0 : logPages_;
     if (triedLogPages_ == 0) {
         logPages_ = 0;
     }
-    return code == SQLITE_BUSY ? SQLITE_OK : note(code);
+    return resultOf(code == SQLITE_BUSY ? SQLITE_OK : code);
 }
 
 // Ids are given here and not by SQLite, so that they are known without asking and
 // are not used twice when retention has emptied a table. When somebody else has
 // inserted rows meanwhile, ours go behind them.
 template <class... Values>
-int StoreDatabase::insertInto(StoreTable table, const Values&... values) {
+StoreResult StoreDatabase::insertInto(StoreTable table, const Values&... values) {
     const auto index = static_cast<std::size_t>(table);
     StoreStatement& insert = inserts_[index];
     insert.bindFrom(1, nextID_[index], values...);
     int code = insert.run();
     if (code == SQLITE_CONSTRAINT_PRIMARYKEY || code == SQLITE_CONSTRAINT_ROWID) {
-        code = refreshIds();
-        if (code == SQLITE_OK) {
-            insert.bind(1, nextID_[index]);
-            code = insert.run();
+        if (StoreResult refreshed = refreshIds(); !refreshed.ok()) {
+            return refreshed;
         }
+        insert.bind(1, nextID_[index]);
+        code = insert.run();
     }
     if (code != SQLITE_OK) {
-        return note(code);
+        return failureOf(code);
     }
     ++nextID_[index];
     ++groupRows_[index];
-    return SQLITE_OK;
+    return {};
 }
 
-int StoreDatabase::ensureUpload(const StoreUploadPtr& upload) {
+StoreResult StoreDatabase::ensureUpload(const StoreUploadPtr& upload) {
     if (upload->row != 0 && upload->generation != generation_) {
         findUpload_.bindFrom(1, upload->row, upload->sessionID);
         const int code = findUpload_.step();
         findUpload_.reset();
         if (code != SQLITE_ROW && code != SQLITE_DONE) {
-            return note(code);
+            return failureOf(code);
         }
         upload->row = code == SQLITE_ROW ? upload->row : 0;
         upload->generation = generation_;
     }
     if (upload->row != 0) {
-        return SQLITE_OK;
+        return {};
     }
-    const int code = insertInto(StoreTable::UploadSession, upload->sessionID,
-                                sessionInfo_.write(upload->sessionInfo),
-                                userInfo_.write(upload->userInfo), upload->opened, nullptr);
-    if (code != SQLITE_OK) {
-        return code;
+    StoreResult inserted = insertInto(StoreTable::UploadSession, upload->sessionID,
+                                      sessionInfo_.write(upload->sessionInfo),
+                                      userInfo_.write(upload->userInfo), upload->opened, nullptr);
+    if (!inserted.ok()) {
+        return inserted;
     }
     upload->row = nextID_[static_cast<std::size_t>(StoreTable::UploadSession)] - 1;
     upload->generation = generation_;
     groupUploads_.push_back(upload);
-    return SQLITE_OK;
+    return inserted;
 }
 
-int StoreDatabase::insert(const StoreOpenRow& row) {
+StoreResult StoreDatabase::insert(const StoreOpenRow& row) {
     return ensureUpload(row.upload);
 }
 
-int StoreDatabase::insert(const StoreCloseRow& row) {
-    if (const int code = ensureUpload(row.upload); code != SQLITE_OK) {
-        return code;
+StoreResult StoreDatabase::insert(const StoreCloseRow& row) {
+    if (StoreResult done = ensureUpload(row.upload); !done.ok()) {
+        return done;
     }
     closeUpload_.bindFrom(1, row.time, row.upload->row);
-    return note(closeUpload_.run());
+    return resultOf(closeUpload_.run());
 }
 
-int StoreDatabase::insert(const StoreMessageRow& row) {
-    if (const int code = ensureUpload(row.upload); code != SQLITE_OK) {
-        return code;
+StoreResult StoreDatabase::insert(const StoreMessageRow& row) {
+    if (StoreResult done = ensureUpload(row.upload); !done.ok()) {
+        return done;
     }
     return insertInto(StoreTable::UploadMessage, row.upload->row, nullptr, nullptr,
                       std::int64_t{row.category}, std::int64_t{row.type},
                       payload_.write(row.payload), row.time);
 }
 
-int StoreDatabase::insert(const StoreSingleRow& row) {
+StoreResult StoreDatabase::insert(const StoreSingleRow& row) {
     return insertInto(StoreTable::UploadMessage, nullptr, sessionInfo_.write(row.sessionInfo),
                       userInfo_.write(row.userInfo), std::int64_t{row.category},
                       std::int64_t{row.type}, payload_.write(row.payload), row.time);
 }
 
-int StoreDatabase::insert(const StoreAnalyticsRow& row) {
+StoreResult StoreDatabase::insert(const StoreAnalyticsRow& row) {
     return insertInto(StoreTable::AnalyticsEvent, row.name.text(), payload_.write(row.payload),
                       row.time);
 }
 
-int StoreDatabase::insert(const StoreEnergyRow& row) {
+StoreResult StoreDatabase::insert(const StoreEnergyRow& row) {
     return insertInto(StoreTable::EnergyEvent, std::int64_t{row.client}, row.name.text(),
                       payload_.write(row.payload), row.time);
 }
 
-int StoreDatabase::insert(const StoreMetricRow& row) {
+StoreResult StoreDatabase::insert(const StoreMetricRow& row) {
     return insertInto(StoreTable::Metric, std::int64_t{row.metricID}, StoreBlob{row.message},
                       row.time);
 }
 
-int StoreDatabase::insert(const StoreIncidentRow& row) {
+StoreResult StoreDatabase::insert(const StoreIncidentRow& row) {
     const std::string report = replaceInvalidUtf8(row.report.text());
     return insertInto(StoreTable::Incident, payload_.write(row.signature), std::string_view(report),
                       row.time);

@@ -8,7 +8,6 @@
 // has grown.
 //
 // Not thread-safe: the store's writer, or whoever opens it before that starts.
-// Results are SQLite's extended codes unless they say otherwise.
 #pragma once
 
 #include <array>
@@ -38,19 +37,13 @@ public:
         std::chrono::milliseconds busyTimeout{1000};
         const char* vfs = nullptr; // SQLite's default
     };
-    enum class Opened {
-        Yes,
-        Damaged,     // Or no database at all.
-        NewerSchema, // Left as it is.
-        Refused,     // Read-only, no access, no such folder.
-        NotNow,      // Locked, or no space: worth another try.
-    };
     using RowCounts = std::array<std::uint64_t, kStoreTables>;
 
     explicit StoreDatabase(Settings settings);
     ~StoreDatabase();
 
-    [[nodiscard]] Opened open();
+    // A file of a newer schema is left as it is.
+    StoreResult open();
     bool isOpen() const { return database_ != nullptr; }
     // The file was removed or replaced behind our back.
     bool hasMoved();
@@ -59,58 +52,54 @@ public:
     // Moves everything from the log into the file first.
     void close();
 
-    [[nodiscard]] int begin();
+    StoreResult begin();
     // Requires begin(), and of an analytics event that its payload is built.
     // SQLITE_TOOBIG, SQLITE_CONSTRAINT and SQLITE_MISMATCH concern this row alone,
     // every other error the whole group.
-    [[nodiscard]] int insert(const StoreOpenRow& row);
-    [[nodiscard]] int insert(const StoreCloseRow& row);
-    [[nodiscard]] int insert(const StoreMessageRow& row);
-    [[nodiscard]] int insert(const StoreSingleRow& row);
-    [[nodiscard]] int insert(const StoreAnalyticsRow& row);
-    [[nodiscard]] int insert(const StoreEnergyRow& row);
-    [[nodiscard]] int insert(const StoreMetricRow& row);
-    [[nodiscard]] int insert(const StoreIncidentRow& row);
+    StoreResult insert(const StoreOpenRow& row);
+    StoreResult insert(const StoreCloseRow& row);
+    StoreResult insert(const StoreMessageRow& row);
+    StoreResult insert(const StoreSingleRow& row);
+    StoreResult insert(const StoreAnalyticsRow& row);
+    StoreResult insert(const StoreEnergyRow& row);
+    StoreResult insert(const StoreMetricRow& row);
+    StoreResult insert(const StoreIncidentRow& row);
     // Rolls back when it fails.
-    [[nodiscard]] int commit();
+    StoreResult commit();
     void rollback();
     // What the last commit wrote.
     const RowCounts& committedRows() const { return committedRows_; }
 
     // Bounds the write-ahead log, which cannot be reused while a reader stays in
     // one transaction. SQLITE_BUSY when a reader keeps more of it than `maxBytes`.
-    [[nodiscard]] int boundLog(std::uint64_t maxBytes, std::uint64_t checkpointBytes);
+    StoreResult boundLog(std::uint64_t maxBytes, std::uint64_t checkpointBytes);
 
-    // Why the last operation failed, and the system's errno for it.
-    const std::string& errorText() const { return errorText_; }
-    int errorCode() const { return errorCode_; }
-    int systemError() const { return systemError_; }
     std::uint64_t fileBytes() const { return pageCount_ * pageSize_; }
     std::uint64_t logBytes() const { return logPages_ * pageSize_; }
 
     // For retention and salvage, which work inside our transactions.
     sqlite3* handle() { return database_; }
+    // What SQLite says about the code that its last call returned.
+    StoreResult resultOf(int code) const;
     // The first upload session of this run, to tell those that nobody will close.
     std::int64_t firstUploadOfRun() const { return firstUpload_; }
     // After rows were brought in from elsewhere.
-    [[nodiscard]] int refreshIds();
+    StoreResult refreshIds();
 
 private:
-    Opened openFile();
-    [[nodiscard]] int configure();
-    [[nodiscard]] int migrate();
-    [[nodiscard]] int check();
-    [[nodiscard]] int prepare();
-    [[nodiscard]] int execute(const std::string& sql);
-    [[nodiscard]] int query(std::string_view sql, std::int64_t& result);
-    [[nodiscard]] int readPageCounts();
-    Opened classify(int code) const;
-    // Keeps what SQLite says about `code`, which it returns.
-    int note(int code);
+    StoreResult openFile();
+    StoreResult configure();
+    StoreResult migrate();
+    StoreResult check();
+    StoreResult prepare();
+    StoreResult execute(const std::string& sql);
+    Result<std::int64_t, StoreFailure> query(std::string_view sql);
+    StoreResult readPageCounts();
+    // Requires a code that is an error.
+    StoreFailure failureOf(int code) const;
 
-    [[nodiscard]] int ensureUpload(const StoreUploadPtr& upload);
-    template <class... Values>
-    [[nodiscard]] int insertInto(StoreTable table, const Values&... values);
+    StoreResult ensureUpload(const StoreUploadPtr& upload);
+    template <class... Values> StoreResult insertInto(StoreTable table, const Values&... values);
 
     const Settings settings_;
     sqlite3* database_ = nullptr;
@@ -134,9 +123,6 @@ private:
     JsonWriter payload_;
     JsonWriter sessionInfo_;
     JsonWriter userInfo_;
-    std::string errorText_;
-    int errorCode_ = 0;
-    int systemError_ = 0;
 };
 
 } // namespace halyard::linux_

@@ -97,8 +97,8 @@ int StoreRetention::prepare(sqlite3* database) {
     return code;
 }
 
-int StoreRetention::trim(StoreDatabase& database, std::uint64_t maxBytes,
-                         std::optional<double> oldest, bool& more) {
+StoreResult StoreRetention::trim(StoreDatabase& database, std::uint64_t maxBytes,
+                                 std::optional<double> oldest, bool& more) {
     more = false;
     int code = SQLITE_OK;
     if (database_ != database.handle()) {
@@ -112,7 +112,7 @@ int StoreRetention::trim(StoreDatabase& database, std::uint64_t maxBytes,
     if (code == SQLITE_OK && oldest) {
         code = trimAge(*oldest, more);
     }
-    return code == SQLITE_OK ? shrink(maxPages, more) : code;
+    return database.resultOf(code == SQLITE_OK ? shrink(maxPages, more) : code);
 }
 
 int StoreRetention::pages(StoreStatement& statement, std::int64_t& result) {

@@ -30,8 +30,8 @@ public:
     // Requires an open transaction. Deletes what is too much and, with `oldest` (in
     // seconds since 1970), what is older than that. Sets `more` when there is more
     // to delete than was deleted.
-    [[nodiscard]] int trim(StoreDatabase& database, std::uint64_t maxBytes,
-                           std::optional<double> oldest, bool& more);
+    StoreResult trim(StoreDatabase& database, std::uint64_t maxBytes, std::optional<double> oldest,
+                     bool& more);
     // To be called before the database is closed.
     void reset();
 
@@ -48,6 +48,7 @@ private:
         double time = 0;
     };
 
+    // These return SQLite's codes.
     [[nodiscard]] int prepare(sqlite3* database);
     [[nodiscard]] int pages(StoreStatement& statement, std::int64_t& result);
     [[nodiscard]] int findCut(std::size_t table, std::int64_t share, Cut& cut);

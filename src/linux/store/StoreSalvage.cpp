@@ -107,16 +107,23 @@ public:
         readable_ =
             read_.prepare(from, fmt::format("SELECT {}, {} FROM {} WHERE id > ? ORDER BY id",
                                             storeColumnNames(table), validity(table), table.name));
-        result_.code = insert_.prepare(to, storeInsert(table, "INSERT OR REPLACE"));
+        code_ = insert_.prepare(to, storeInsert(table, "INSERT OR REPLACE"));
     }
 
-    void run() {
-        if (readable_ != SQLITE_OK) {
+    // SQLite's code for the new database.
+    [[nodiscard]] int run() {
+        if (readable_ == SQLITE_OK) {
+            carryAll();
+        } else {
             ++result_.holes;
-            return;
         }
+        return code_;
+    }
+
+private:
+    void carryAll() {
         std::int64_t step = 0;
-        while (result_.code == SQLITE_OK && step <= kLargestStep) {
+        while (code_ == SQLITE_OK && step <= kLargestStep) {
             const std::int64_t from = last_;
             if (readFrom(last_ > std::numeric_limits<std::int64_t>::max() - step ? last_
                                                                                  : last_ + step)) {
@@ -127,12 +134,11 @@ public:
         }
     }
 
-private:
     // True when it came to the end of the table.
     bool readFrom(std::int64_t id) {
         read_.bind(1, id);
         int code = read_.step();
-        for (; code == SQLITE_ROW && result_.code == SQLITE_OK; code = read_.step()) {
+        for (; code == SQLITE_ROW && code_ == SQLITE_OK; code = read_.step()) {
             last_ = read_.integer(0);
             if (read_.integer(columns_) == 1) {
                 carry();
@@ -148,9 +154,9 @@ private:
         for (int i = 0; i < columns_; ++i) {
             insert_.bindColumn(i + 1, read_, i);
         }
-        result_.code = insert_.run();
-        if (result_.code == SQLITE_OK && ++result_.carried % kRowsPerCommit == 0) {
-            result_.code = sqlite3_exec(to_, "COMMIT; BEGIN IMMEDIATE", nullptr, nullptr, nullptr);
+        code_ = insert_.run();
+        if (code_ == SQLITE_OK && ++result_.carried % kRowsPerCommit == 0) {
+            code_ = sqlite3_exec(to_, "COMMIT; BEGIN IMMEDIATE", nullptr, nullptr, nullptr);
         }
     }
 
@@ -160,12 +166,14 @@ private:
     StoreStatement read_;
     StoreStatement insert_;
     int readable_ = SQLITE_OK;
+    int code_ = SQLITE_OK;
     std::int64_t last_ = 0;
 };
 
 } // namespace
 
-fs::path storeSetAside(const fs::path& path, platform::WallTime now, std::error_code& error) {
+Result<fs::path> storeSetAside(const fs::path& path, platform::WallTime now) {
+    std::error_code error;
     const std::string base = path.string() + std::string(kMark) + stampOf(now);
     fs::path aside = base;
     for (int i = 2; fs::exists(aside, error); ++i) {
@@ -173,7 +181,7 @@ fs::path storeSetAside(const fs::path& path, platform::WallTime now, std::error_
     }
     fs::rename(path, aside, error);
     if (error) {
-        return {};
+        return Failure{static_cast<std::errc>(error.value())};
     }
     for (const std::string_view companion : kCompanions) {
         std::error_code absent;
@@ -192,16 +200,16 @@ StoreSalvage storeCarryOver(const fs::path& damaged, sqlite3* fresh) {
         sqlite3_db_config(from, SQLITE_DBCONFIG_NO_CKPT_ON_CLOSE, 1, nullptr);
         // A table of contents that contradicts the file is what we came for.
         sqlite3_exec(from, "PRAGMA writable_schema = ON", nullptr, nullptr, nullptr);
-        result.code = sqlite3_exec(fresh, "BEGIN IMMEDIATE", nullptr, nullptr, nullptr);
+        int code = sqlite3_exec(fresh, "BEGIN IMMEDIATE", nullptr, nullptr, nullptr);
         for (const StoreTableSchema& table : kStoreSchema) {
-            if (result.code == SQLITE_OK) {
-                TableCarrier(table, from, fresh, result).run();
-            }
+            code = code == SQLITE_OK ? TableCarrier(table, from, fresh, result).run() : code;
         }
-        const bool whole = result.code == SQLITE_OK;
         if (sqlite3_get_autocommit(fresh) == 0) {
-            const int code = sqlite3_exec(fresh, "COMMIT", nullptr, nullptr, nullptr);
-            result.code = whole ? code : result.code;
+            const int committed = sqlite3_exec(fresh, "COMMIT", nullptr, nullptr, nullptr);
+            code = code == SQLITE_OK ? committed : code;
+        }
+        if (code != SQLITE_OK) {
+            result.whole = StoreFailure{{{}, sqlite3_errstr(code)}, code};
         }
     } else {
         ++result.holes;

@@ -11,6 +11,7 @@
 #include <cstdint>
 #include <filesystem>
 
+#include "common/Result.h"
 #include "linux/store/StoreSqlite.h"
 #include "platform/Clock.h"
 
@@ -20,16 +21,16 @@ namespace halyard::linux_ {
 inline constexpr std::size_t kDamagedStoresKept = 3;
 
 // Moves the file and its companions (write-ahead log, shared memory) out of the
-// way and returns the file's new path; empty, and `error` set, when it cannot.
-std::filesystem::path storeSetAside(const std::filesystem::path& path, platform::WallTime now,
-                                    std::error_code& error);
+// way; the file's new path.
+Result<std::filesystem::path> storeSetAside(const std::filesystem::path& path,
+                                            platform::WallTime now);
 
 struct StoreSalvage {
     std::uint64_t carried = 0;
     // Places at which reading failed. One may stand for many rows.
     std::uint64_t holes = 0;
-    // Not SQLITE_OK when the new database did not take them all.
-    int code = SQLITE_OK;
+    // Whether the new database took them all.
+    StoreResult whole;
 };
 // Ids stay as they are. Requires that `fresh` has the tables and no open
 // transaction.

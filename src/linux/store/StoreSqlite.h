@@ -1,13 +1,38 @@
 // The little of SQLite's interface that the store uses, with owners.
 #pragma once
 
+#include <cerrno>
 #include <cstddef>
 #include <cstdint>
 #include <sqlite3.h>
 #include <string_view>
 #include <utility>
 
+#include "common/Result.h"
+
 namespace halyard::linux_ {
+
+// What SQLite refuses, in its words. The code is the system's, where SQLite met one.
+struct StoreFailure : Failure {
+    int sqlite = SQLITE_ERROR; // SQLite's extended code
+
+    int primary() const { return sqlite & 0xFF; }
+    // The file is damaged, or no database at all.
+    bool isDamage() const { return primary() == SQLITE_CORRUPT || primary() == SQLITE_NOTADB; }
+    bool isWantOfSpace() const {
+        const int system = static_cast<int>(code);
+        return primary() == SQLITE_FULL || system == ENOSPC || system == EDQUOT;
+    }
+    bool isLock() const {
+        return primary() == SQLITE_BUSY || primary() == SQLITE_LOCKED ||
+               primary() == SQLITE_PROTOCOL;
+    }
+    // Worth another try.
+    bool mayPass() const {
+        return !isDamage() && (isWantOfSpace() || isLock() || primary() == SQLITE_NOMEM);
+    }
+};
+using StoreResult = Result<void, StoreFailure>;
 
 struct StoreBlob {
     std::string_view bytes;

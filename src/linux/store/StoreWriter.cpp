@@ -1,7 +1,6 @@
 #include "linux/store/StoreWriter.h"
 
 #include <algorithm>
-#include <cerrno>
 #include <fmt/format.h>
 #include <numeric>
 #include <utility>
@@ -53,14 +52,23 @@ std::uint64_t sum(const StoreLosses& losses) {
     return std::accumulate(losses.begin(), losses.end(), std::uint64_t{0});
 }
 
-bool concernsOneRow(int code) {
-    const int primary = code & 0xFF;
+bool concernsOneRow(const StoreFailure& failure) {
+    const int primary = failure.primary();
     return primary == SQLITE_TOOBIG || primary == SQLITE_CONSTRAINT || primary == SQLITE_MISMATCH;
 }
 
-bool isDamage(int code) {
-    const int primary = code & 0xFF;
-    return primary == SQLITE_CORRUPT || primary == SQLITE_NOTADB;
+StoreLoss lossOf(const StoreFailure& failure) {
+    if (failure.primary() == SQLITE_READONLY) {
+        return StoreLoss::ReadOnly;
+    }
+    if (failure.isLock()) {
+        return StoreLoss::Locked;
+    }
+    if (failure.isWantOfSpace()) {
+        return StoreLoss::DiskFull;
+    }
+    return failure.code == std::errc::read_only_file_system ? StoreLoss::ReadOnly
+                                                            : StoreLoss::IoError;
 }
 
 } // namespace
@@ -72,15 +80,14 @@ StoreWriter::StoreWriter(const StoreOptions& options, const platform::Clock& clo
       retention_(platform::secondsSince1970(clock.wallTime())), limits_(options_.limits) {}
 
 bool StoreWriter::open() {
-    const StoreDatabase::Opened opened = openDatabase();
-    const bool usable =
-        opened == StoreDatabase::Opened::Yes || opened == StoreDatabase::Opened::NotNow;
+    const StoreResult opened = openDatabase();
+    const bool usable = opened.ok() || opened.failure().mayPass();
     if (!usable) {
         HY_LOG_ERROR(HYReportingPlatformCategory, "running without a store: {}: {}",
-                     options_.path.string(), database_.errorText());
+                     options_.path.string(), opened.failure().text);
         queue_->stop();
-    } else if (opened == StoreDatabase::Opened::NotNow) {
-        beginEpisode(lossOf(database_.errorCode()), database_.errorText());
+    } else if (!opened.ok()) {
+        beginEpisode(lossOf(opened.failure()), opened.failure().text);
     }
     noteSizes();
     const MutexLock lock(mutex_);
@@ -88,27 +95,28 @@ bool StoreWriter::open() {
     return usable;
 }
 
-StoreDatabase::Opened StoreWriter::openDatabase() {
-    const StoreDatabase::Opened opened = database_.open();
-    return opened == StoreDatabase::Opened::Damaged ? replaceDamaged() : opened;
+StoreResult StoreWriter::openDatabase() {
+    StoreResult opened = database_.open();
+    if (!opened.ok() && opened.failure().isDamage()) {
+        return replaceDamaged(opened.failure());
+    }
+    return opened;
 }
 
-StoreDatabase::Opened StoreWriter::replaceDamaged() {
-    const std::string why = database_.errorText();
+StoreResult StoreWriter::replaceDamaged(const StoreFailure& damage) {
     retention_.reset();
     database_.abandon();
-    std::error_code error;
-    const auto aside = storeSetAside(options_.path, clock_.wallTime(), error);
-    if (error) {
+    const auto aside = storeSetAside(options_.path, clock_.wallTime());
+    if (!aside.ok()) {
         HY_LOG_ERROR(HYReportingPlatformCategory, "{} is damaged and cannot be set aside: {}",
-                     options_.path.string(), error.message());
-        return StoreDatabase::Opened::Refused;
+                     options_.path.string(), aside.failure().message());
+        return damage;
     }
     HY_LOG_ERROR(HYReportingPlatformCategory, "{} is damaged, set aside as {}: {}",
-                 options_.path.string(), aside.filename().string(), why);
-    const StoreDatabase::Opened opened = database_.open();
-    if (opened == StoreDatabase::Opened::Yes) {
-        carryOver(aside);
+                 options_.path.string(), aside.value().filename().string(), damage.text);
+    StoreResult opened = database_.open();
+    if (opened.ok()) {
+        carryOver(aside.value());
     }
     return opened;
 }
@@ -118,9 +126,9 @@ void StoreWriter::carryOver(const std::filesystem::path& aside) {
     HY_LOG_DEFAULT(HYReportingPlatformCategory,
                    "carried over {} rows of {}, failed to read in {} places", salvage.carried,
                    aside.filename().string(), salvage.holes);
-    if (salvage.code != SQLITE_OK) {
+    if (!salvage.whole.ok()) {
         HY_LOG_ERROR(HYReportingPlatformCategory, "not all rows could be carried over: {}",
-                     sqlite3_errstr(salvage.code));
+                     salvage.whole.failure().text);
     }
     (void)database_.refreshIds(); // Falls back on the ids' own conflicts.
 }
@@ -178,12 +186,12 @@ void StoreWriter::writeGroup(std::span<StoreItem> group) {
         if (surrendered_) {
             return giveUp(group, *surrendered_);
         }
-        const int code = attempt(group);
-        if (code == SQLITE_OK) {
+        const StoreResult written = attempt(group);
+        if (written.ok()) {
             return settle(group);
         }
-        const StoreLoss reason = lossOf(code);
-        beginEpisode(reason, database_.errorText());
+        const StoreLoss reason = lossOf(written.failure());
+        beginEpisode(reason, written.failure().text);
         if (queue_->isStopping()) {
             surrendered_ = reason;
             continue;
@@ -199,85 +207,85 @@ void StoreWriter::maintain() {
         return;
     }
     trimMore_ = false;
-    if (const int code = attempt({}); code != SQLITE_OK) {
-        beginEpisode(lossOf(code), database_.errorText());
+    if (const StoreResult done = attempt({}); !done.ok()) {
+        beginEpisode(lossOf(done.failure()), done.failure().text);
     }
 }
 
-int StoreWriter::attempt(std::span<StoreItem> group) {
+StoreResult StoreWriter::attempt(std::span<StoreItem> group) {
     busySince_.store(clock_.steadyTime().time_since_epoch().count());
-    int code = reopenIfNeeded();
-    if (code == SQLITE_OK) {
-        code = writeRows(group);
-        if (isDamage(code)) {
-            code = replaceDamaged() == StoreDatabase::Opened::Yes ? writeRows(group)
-                                                                  : database_.errorCode();
+    StoreResult result = reopenIfNeeded();
+    if (result.ok()) {
+        result = writeRows(group);
+        if (!result.ok() && result.failure().isDamage()) {
+            result = replaceDamaged(result.failure());
+            result = result.ok() ? writeRows(group) : result;
         }
     }
     busySince_.store(0);
-    if (code == SQLITE_OK) {
+    if (result.ok()) {
         noteSizes();
         endEpisode();
     }
-    return code;
+    return result;
 }
 
-int StoreWriter::reopenIfNeeded() {
+StoreResult StoreWriter::reopenIfNeeded() {
     if (database_.hasMoved()) {
         HY_LOG_ERROR(HYReportingPlatformCategory, "{} was removed or replaced, opening it anew",
                      options_.path.string());
         retention_.reset();
         database_.abandon();
     }
-    if (database_.isOpen() || openDatabase() == StoreDatabase::Opened::Yes) {
-        return SQLITE_OK;
-    }
-    return database_.errorCode();
+    return database_.isOpen() ? StoreResult() : openDatabase();
 }
 
-int StoreWriter::writeRows(std::span<StoreItem> group) {
+StoreResult StoreWriter::writeRows(std::span<StoreItem> group) {
     const bool ageDue = limitsChanged_.exchange(false) || isAgeDue();
     const StoreLimits bounds = limits();
     bool more = false;
-    int code = database_.boundLog(
+    StoreResult result = database_.boundLog(
         bounds.maxBytes + kLogAllowance,
         std::clamp(bounds.maxBytes / 8, kLeastCheckpointBytes, kCheckpointBytes));
-    code = code == SQLITE_OK ? database_.begin() : code;
-    if (code != SQLITE_OK) {
-        return code;
+    result = result.ok() ? database_.begin() : result;
+    if (!result.ok()) {
+        return result;
     }
-    code = insertAll(group);
-    code = code == SQLITE_OK ? trim(bounds, ageDue, more) : code;
-    if (code != SQLITE_OK) {
+    result = insertAll(group);
+    result = result.ok() ? trim(bounds, ageDue, more) : result;
+    if (!result.ok()) {
         database_.rollback();
-        return code;
+        return result;
     }
-    code = database_.commit();
-    if (code == SQLITE_OK) {
+    result = database_.commit();
+    if (result.ok()) {
         trimMore_ = more;
         if (ageDue) {
             agedAt_ = more ? platform::SteadyTime() : clock_.steadyTime();
         }
     }
-    return code;
+    return result;
 }
 
-int StoreWriter::insertAll(std::span<StoreItem> group) {
+StoreResult StoreWriter::insertAll(std::span<StoreItem> group) {
     rejected_ = 0;
     for (StoreItem& item : group) {
         buildPayload(item.row);
-        const int code =
+        StoreResult inserted =
             std::visit([this](const auto& row) { return database_.insert(row); }, item.row);
-        if (concernsOneRow(code)) {
-            ++rejected_;
-        } else if (code != SQLITE_OK) {
-            return code;
+        if (inserted.ok()) {
+            continue;
         }
+        if (!concernsOneRow(inserted.failure())) {
+            return inserted;
+        }
+        ++rejected_;
+        rejection_ = inserted.failure().text;
     }
-    return SQLITE_OK;
+    return {};
 }
 
-int StoreWriter::trim(const StoreLimits& bounds, bool ageDue, bool& more) {
+StoreResult StoreWriter::trim(const StoreLimits& bounds, bool ageDue, bool& more) {
     std::optional<double> oldest;
     if (ageDue) {
         oldest = platform::secondsSince1970(clock_.wallTime()) -
@@ -317,7 +325,7 @@ void StoreWriter::settle(std::span<StoreItem> group) {
     if (rejected_ > 0) {
         queue_->countLost(StoreLoss::Rejected, rejected_);
         HY_LOG_ERROR(HYReportingPlatformCategory, "the store rejected {} rows: {}", rejected_,
-                     database_.errorText());
+                     rejection_);
     }
     queue_->settle(group.size(), bytes);
 }
@@ -335,30 +343,6 @@ void StoreWriter::giveUp(std::span<StoreItem> group, StoreLoss reason) {
 
 bool StoreWriter::isAgeDue() const {
     return clock_.steadyTime() - agedAt_ >= options_.agePeriod;
-}
-
-StoreLoss StoreWriter::lossOf(int code) const {
-    switch (code & 0xFF) {
-    case SQLITE_FULL:
-        return StoreLoss::DiskFull;
-    case SQLITE_READONLY:
-        return StoreLoss::ReadOnly;
-    case SQLITE_BUSY:
-    case SQLITE_LOCKED:
-    case SQLITE_PROTOCOL:
-        return StoreLoss::Locked;
-    default:
-        break;
-    }
-    switch (database_.systemError()) {
-    case ENOSPC:
-    case EDQUOT:
-        return StoreLoss::DiskFull;
-    case EROFS:
-        return StoreLoss::ReadOnly;
-    default:
-        return StoreLoss::IoError;
-    }
 }
 
 void StoreWriter::beginEpisode(StoreLoss reason, const std::string& text) {

@@ -80,23 +80,22 @@ private:
         StoreLosses lostBefore;
     };
 
-    [[nodiscard]] StoreDatabase::Opened openDatabase();
-    [[nodiscard]] StoreDatabase::Opened replaceDamaged();
+    StoreResult openDatabase();
+    StoreResult replaceDamaged(const StoreFailure& damage);
     void carryOver(const std::filesystem::path& aside);
     void closeDatabase();
-    [[nodiscard]] int reopenIfNeeded();
+    StoreResult reopenIfNeeded();
     void writeGroup(std::span<StoreItem> group);
     void maintain();
-    [[nodiscard]] int attempt(std::span<StoreItem> group);
-    [[nodiscard]] int writeRows(std::span<StoreItem> group);
-    [[nodiscard]] int insertAll(std::span<StoreItem> group);
-    [[nodiscard]] int trim(const StoreLimits& bounds, bool ageDue, bool& more);
+    StoreResult attempt(std::span<StoreItem> group);
+    StoreResult writeRows(std::span<StoreItem> group);
+    StoreResult insertAll(std::span<StoreItem> group);
+    StoreResult trim(const StoreLimits& bounds, bool ageDue, bool& more);
     void buildPayload(StoreRow& row);
     void noteSizes() HY_EXCLUDES(mutex_);
     void settle(std::span<StoreItem> group);
     void giveUp(std::span<StoreItem> group, StoreLoss reason);
     [[nodiscard]] bool isAgeDue() const;
-    StoreLoss lossOf(int code) const;
 
     void beginEpisode(StoreLoss reason, const std::string& text) HY_EXCLUDES(mutex_);
     void endEpisode() HY_EXCLUDES(mutex_);
@@ -109,6 +108,7 @@ private:
     StoreRetention retention_;
     std::vector<StoreItem> taken_;
     std::uint64_t rejected_ = 0; // rows of the running attempt
+    std::string rejection_;      // why the last of them was
     bool trimMore_ = false;
     // Set once stop() has found that rows cannot be written: no more attempts.
     std::optional<StoreLoss> surrendered_;
