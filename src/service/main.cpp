@@ -1,6 +1,5 @@
 #include <fmt/core.h>
 #include <unistd.h>
-#include <variant>
 
 #include "halyard/halyard.h"
 #include "linux/LinuxPlatform.h"
@@ -33,16 +32,15 @@ int main(int argc, char** /*argv*/) {
     if (argc > 1) {
         return fail("takes no arguments; see docs/configuration.md");
     }
-    auto resolved = linux_::resolveDirectories(linux_::processEnvironment, ::getuid());
-    if (const auto* error = std::get_if<std::string>(&resolved)) {
-        return fail(*error);
+    const auto directories = linux_::resolveDirectories(linux_::processEnvironment, ::getuid());
+    if (!directories.ok()) {
+        return fail(directories.failure().message());
     }
-    const auto& directories = std::get<linux_::Directories>(resolved);
-    if (const auto error = linux_::createDirectories(directories)) {
-        return fail(*error);
+    if (const auto created = linux_::createDirectories(directories.value()); !created.ok()) {
+        return fail(created.failure().message());
     }
     LibraryTraceMarks traceMarks;
-    linux_::LinuxPlatform linuxPlatform(directories, traceMarks);
+    linux_::LinuxPlatform linuxPlatform(directories.value(), traceMarks);
     const auto service = HYReportingServiceDelegate::make();
     if (const auto error = linuxPlatform.open(service.get())) {
         return fail(*error);

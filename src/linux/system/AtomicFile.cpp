@@ -1,7 +1,6 @@
 #include "linux/system/AtomicFile.h"
 
 #include <atomic>
-#include <cerrno>
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <unistd.h>
@@ -11,10 +10,6 @@ namespace halyard::linux_ {
 namespace {
 
 constexpr mode_t kMode = 0644;
-
-std::errc lastError() {
-    return static_cast<std::errc>(errno);
-}
 
 // Unique among those who write here, and never followed when it is a link that
 // somebody planted.
@@ -50,8 +45,8 @@ AtomicFile::~AtomicFile() {
 }
 
 void AtomicFile::failed() {
-    if (error_ == std::errc{}) {
-        error_ = lastError();
+    if (result_.ok()) {
+        result_ = Failure::ofErrno();
     }
 }
 
@@ -61,23 +56,26 @@ void AtomicFile::write(std::string_view text) {
     }
 }
 
-std::errc AtomicFile::syncDirectory() const {
+Result<void> AtomicFile::syncDirectory() const {
     const auto parent = path_.has_parent_path() ? path_.parent_path() : ".";
     const int fd = ::open(parent.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
     if (fd < 0) {
-        return lastError();
+        return Failure::ofErrno();
     }
-    const std::errc result = ::fsync(fd) == 0 ? std::errc{} : lastError();
+    Result<void> result;
+    if (::fsync(fd) != 0) {
+        result = Failure::ofErrno();
+    }
     ::close(fd);
     return result;
 }
 
-std::errc AtomicFile::commit() {
+Result<void> AtomicFile::commit() {
     if (stream_ == nullptr) {
-        return error_;
+        return result_;
     }
-    if (std::ferror(stream_) != 0 && error_ == std::errc{}) {
-        error_ = std::errc::io_error;
+    if (std::ferror(stream_) != 0 && result_.ok()) {
+        result_ = Failure{std::errc::io_error};
     }
     if (std::fflush(stream_) != 0 || ::fsync(::fileno(stream_)) != 0) {
         failed();
@@ -85,12 +83,12 @@ std::errc AtomicFile::commit() {
     if (std::fclose(std::exchange(stream_, nullptr)) != 0) {
         failed();
     }
-    if (error_ == std::errc{} && ::rename(temporary_.c_str(), path_.c_str()) != 0) {
+    if (result_.ok() && ::rename(temporary_.c_str(), path_.c_str()) != 0) {
         failed();
     }
-    if (error_ != std::errc{}) {
+    if (!result_.ok()) {
         (void)::unlink(temporary_.c_str());
-        return error_;
+        return result_;
     }
     return syncDirectory();
 }

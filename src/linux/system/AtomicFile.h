@@ -7,7 +7,8 @@
 #include <cstdio>
 #include <filesystem>
 #include <string_view>
-#include <system_error>
+
+#include "common/Result.h"
 
 namespace halyard::linux_ {
 
@@ -18,23 +19,21 @@ public:
     AtomicFile(const AtomicFile&) = delete;
     AtomicFile& operator=(const AtomicFile&) = delete;
 
-    // What opening or the first write that failed came to; none so far.
-    std::errc error() const { return error_; }
     void write(std::string_view text);
     // For writers that want a stream; null when the file could not be opened.
     std::FILE* stream() const { return stream_; }
 
-    // Once, last. The default value is success.
-    [[nodiscard]] std::errc commit();
+    // Once, last. Opening and writing fail here, too.
+    Result<void> commit();
 
 private:
     void failed();
-    std::errc syncDirectory() const;
+    Result<void> syncDirectory() const;
 
     const std::filesystem::path path_;
     std::filesystem::path temporary_;
     std::FILE* stream_ = nullptr;
-    std::errc error_{};
+    Result<void> result_; // the first failure
 };
 
 } // namespace halyard::linux_

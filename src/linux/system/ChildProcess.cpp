@@ -13,10 +13,6 @@
 namespace halyard::linux_ {
 namespace {
 
-std::errc lastError() {
-    return static_cast<std::errc>(errno);
-}
-
 // After fork in a process of many threads: nothing but system calls.
 [[noreturn]] void become(char* const* arguments, int errors, ::pid_t parent) {
     ::setpgid(0, 0);
@@ -44,7 +40,7 @@ ChildProcess::~ChildProcess() {
     (void)finish();
 }
 
-std::errc ChildProcess::start(const std::vector<std::string>& arguments) {
+Result<void> ChildProcess::start(const std::vector<std::string>& arguments) {
     std::vector<char*> pointers;
     for (const std::string& argument : arguments) {
         pointers.push_back(const_cast<char*>(argument.c_str()));
@@ -52,25 +48,30 @@ std::errc ChildProcess::start(const std::vector<std::string>& arguments) {
     pointers.push_back(nullptr);
     int errors[2];
     if (::pipe2(errors, O_CLOEXEC) != 0) {
-        return lastError();
+        return Failure::ofErrno();
     }
     const ::pid_t parent = ::getpid();
     pid_ = ::fork();
     if (pid_ == 0) {
         become(pointers.data(), errors[1], parent);
     }
-    std::errc result = pid_ < 0 ? lastError() : std::errc{};
+    Result<void> result;
+    if (pid_ < 0) {
+        result = Failure::ofErrno();
+    }
     ::close(errors[1]);
     int error = 0;
     if (pid_ > 0 && ::read(errors[0], &error, sizeof error) == sizeof error) {
-        result = static_cast<std::errc>(error);
+        result = Failure{static_cast<std::errc>(error)};
     }
     ::close(errors[0]);
-    if (result == std::errc{}) {
+    if (result.ok()) {
         pidfd_ = static_cast<int>(::syscall(SYS_pidfd_open, pid_, 0));
-        result = pidfd_ < 0 ? lastError() : std::errc{};
+        if (pidfd_ < 0) {
+            result = Failure::ofErrno();
+        }
     }
-    if (result != std::errc{}) {
+    if (!result.ok()) {
         (void)finish();
     }
     return result;

@@ -7,8 +7,9 @@
 #include <chrono>
 #include <string>
 #include <sys/types.h>
-#include <system_error>
 #include <vector>
+
+#include "common/Result.h"
 
 namespace halyard::linux_ {
 
@@ -20,9 +21,8 @@ public:
     ChildProcess(const ChildProcess&) = delete;
     ChildProcess& operator=(const ChildProcess&) = delete;
 
-    // The program is looked up in PATH; its output goes nowhere. The default
-    // value is success.
-    [[nodiscard]] std::errc start(const std::vector<std::string>& arguments);
+    // The program is looked up in PATH; its output goes nowhere.
+    Result<void> start(const std::vector<std::string>& arguments);
     void interrupt();
     // Waits for the child, for `wake` to become readable, or for `limit` (negative
     // is none). True when the child has ended.

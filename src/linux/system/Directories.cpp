@@ -1,7 +1,6 @@
 #include "linux/system/Directories.h"
 
 #include <algorithm>
-#include <cerrno>
 #include <cstdlib>
 #include <fmt/format.h>
 #include <sys/stat.h>
@@ -50,31 +49,36 @@ std::optional<std::filesystem::path> absolutePath(const Environment& environment
                                           : std::nullopt;
 }
 
-std::variant<std::filesystem::path, std::string> userDirectory(const Place& place,
-                                                               const Environment& environment) {
+Failure noDirectory(std::string why) {
+    return {{}, std::move(why)};
+}
+
+Result<std::filesystem::path> userDirectory(const Place& place, const Environment& environment) {
     if (const auto base = absolutePath(environment, place.userVariable)) {
         return *base / place.userPath;
     }
     if (place.homeFallback == nullptr) {
-        return fmt::format("no runtime directory: neither {} nor {} is set to an absolute path",
-                           place.managerVariable, place.userVariable);
+        return noDirectory(
+            fmt::format("no runtime directory: neither {} nor {} is set to an absolute path",
+                        place.managerVariable, place.userVariable));
     }
     if (const auto home = absolutePath(environment, "HOME")) {
         return *home / place.homeFallback / place.userPath;
     }
-    return fmt::format("none of {}, {} and HOME is set to an absolute path", place.managerVariable,
-                       place.userVariable);
+    return noDirectory(fmt::format("none of {}, {} and HOME is set to an absolute path",
+                                   place.managerVariable, place.userVariable));
 }
 
-std::variant<std::filesystem::path, std::string>
-resolve(const Place& place, const Environment& environment, std::uint32_t uid) {
+Result<std::filesystem::path> resolve(const Place& place, const Environment& environment,
+                                      std::uint32_t uid) {
     if (const auto managed = nonEmpty(environment, place.managerVariable)) {
         // A unit with several directories gets them all, colons between.
         const std::filesystem::path first(managed->substr(0, managed->find(':')));
         if (first.is_absolute()) {
             return first;
         }
-        return fmt::format("{} is no absolute path: {}", place.managerVariable, *managed);
+        return noDirectory(
+            fmt::format("{} is no absolute path: {}", place.managerVariable, *managed));
     }
     if (uid == 0) {
         return std::filesystem::path(place.systemPath);
@@ -82,44 +86,38 @@ resolve(const Place& place, const Environment& environment, std::uint32_t uid) {
     return userDirectory(place, environment);
 }
 
-std::string failure(const std::filesystem::path& path) {
-    return fmt::format("cannot make directory {}: {}", path.native(),
-                       std::generic_category().message(errno));
+Failure cannotMake(const std::filesystem::path& path) {
+    return Failure::ofErrno("cannot make directory " + path.native());
 }
 
 // Like mkdir -p; whatever is made gets `mode`, whatever the umask says.
-std::optional<std::string> makeDirectory(const std::filesystem::path& path, mode_t mode) {
+Result<void> makeDirectory(const std::filesystem::path& path, mode_t mode) {
     std::error_code ignored;
     if (std::filesystem::is_directory(path, ignored)) {
-        return std::nullopt;
+        return {};
     }
     if (path.has_parent_path() && path.parent_path() != path) {
-        if (auto problem = makeDirectory(path.parent_path(), mode)) {
-            return problem;
+        if (auto parent = makeDirectory(path.parent_path(), mode); !parent.ok()) {
+            return parent;
         }
     }
     if (::mkdir(path.c_str(), mode) == 0) {
-        return ::chmod(path.c_str(), mode) == 0 ? std::nullopt : std::optional(failure(path));
+        return ::chmod(path.c_str(), mode) == 0 ? Result<void>() : cannotMake(path);
     }
+    const Failure failure = cannotMake(path);
     // Somebody else may have been quicker.
-    const int why = errno;
-    if (std::filesystem::is_directory(path, ignored)) {
-        return std::nullopt;
-    }
-    errno = why;
-    return failure(path);
+    return std::filesystem::is_directory(path, ignored) ? Result<void>() : failure;
 }
 
 // Only adds to the mode: the directory may be one that others share.
-std::optional<std::string> openToClients(const std::filesystem::path& path) {
+Result<void> openToClients(const std::filesystem::path& path) {
     struct stat facts {};
     const bool known = ::stat(path.c_str(), &facts) == 0;
     const mode_t wanted = (facts.st_mode & 07777) | kRuntimeMode;
     if (known && ((facts.st_mode & 07777) == wanted || ::chmod(path.c_str(), wanted) == 0)) {
-        return std::nullopt;
+        return {};
     }
-    return fmt::format("cannot open directory {} to clients: {}", path.native(),
-                       std::generic_category().message(errno));
+    return Failure::ofErrno(fmt::format("cannot open directory {} to clients", path.native()));
 }
 
 } // namespace
@@ -129,15 +127,14 @@ std::optional<std::string> processEnvironment(std::string_view name) {
     return value == nullptr ? std::nullopt : std::optional<std::string>(value);
 }
 
-std::variant<Directories, std::string> resolveDirectories(const Environment& environment,
-                                                          std::uint32_t uid) {
+Result<Directories> resolveDirectories(const Environment& environment, std::uint32_t uid) {
     Directories directories;
     for (const Place& place : kPlaces) {
         auto resolved = resolve(place, environment, uid);
-        if (auto* const problem = std::get_if<std::string>(&resolved)) {
-            return std::move(*problem);
+        if (!resolved.ok()) {
+            return resolved.failure();
         }
-        directories.*place.member = std::get<std::filesystem::path>(std::move(resolved));
+        directories.*place.member = std::move(resolved).value();
     }
     return directories;
 }
@@ -156,14 +153,14 @@ std::filesystem::path Directories::mapped(const std::filesystem::path& path) con
     return result;
 }
 
-std::optional<std::string> createDirectories(const Directories& directories) {
+Result<void> createDirectories(const Directories& directories) {
     for (const std::filesystem::path& path : {directories.state, directories.logs}) {
-        if (auto problem = makeDirectory(path, kPrivateMode)) {
-            return problem;
+        if (auto made = makeDirectory(path, kPrivateMode); !made.ok()) {
+            return made;
         }
     }
-    if (auto problem = makeDirectory(directories.runtime, kRuntimeMode)) {
-        return problem;
+    if (auto made = makeDirectory(directories.runtime, kRuntimeMode); !made.ok()) {
+        return made;
     }
     return openToClients(directories.runtime);
 }

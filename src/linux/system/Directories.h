@@ -9,7 +9,8 @@
 #include <optional>
 #include <string>
 #include <string_view>
-#include <variant>
+
+#include "common/Result.h"
 
 namespace halyard::linux_ {
 
@@ -33,15 +34,12 @@ struct Directories {
 };
 
 // Each directory as the service manager set it; else, for root (`uid` 0), the
-// system's; else the user's own. An unset and an empty variable are the same. A
-// text says why there is no answer.
-[[nodiscard]] std::variant<Directories, std::string>
-resolveDirectories(const Environment& environment, std::uint32_t uid);
+// system's; else the user's own. An unset and an empty variable are the same.
+Result<Directories> resolveDirectories(const Environment& environment, std::uint32_t uid);
 
 // Makes state, runtime and logs directory where they are missing; the
 // configuration is the operator's. The runtime directory is 0755, or gets what
-// it lacks of that: who may connect is not decided by its mode. A text says what
-// went wrong.
-[[nodiscard]] std::optional<std::string> createDirectories(const Directories& directories);
+// it lacks of that: who may connect is not decided by its mode.
+Result<void> createDirectories(const Directories& directories);
 
 } // namespace halyard::linux_

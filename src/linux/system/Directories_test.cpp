@@ -16,7 +16,7 @@ using Variables = std::map<std::string, std::string, std::less<>>;
 constexpr std::uint32_t kRoot = 0;
 constexpr std::uint32_t kUser = 1000;
 
-std::variant<Directories, std::string> resolve(const Variables& variables, std::uint32_t uid) {
+Result<Directories> resolve(const Variables& variables, std::uint32_t uid) {
     return resolveDirectories(
         [&](std::string_view name) -> std::optional<std::string> {
             const auto found = variables.find(name);
@@ -27,17 +27,16 @@ std::variant<Directories, std::string> resolve(const Variables& variables, std::
 
 Directories resolved(const Variables& variables, std::uint32_t uid) {
     const auto result = resolve(variables, uid);
-    if (const auto* problem = std::get_if<std::string>(&result)) {
-        ADD_FAILURE() << *problem;
+    if (!result.ok()) {
+        ADD_FAILURE() << result.failure().message();
         return {};
     }
-    return std::get<Directories>(result);
+    return result.value();
 }
 
 std::string problem(const Variables& variables, std::uint32_t uid) {
     const auto result = resolve(variables, uid);
-    const auto* problem = std::get_if<std::string>(&result);
-    return problem == nullptr ? "" : *problem;
+    return result.ok() ? "" : result.failure().message();
 }
 
 mode_t modeOf(const std::filesystem::path& path) {
@@ -132,10 +131,10 @@ TEST(CreateDirectoriesTest, MakesWhatIsMissingWithItsMode) {
     const testing::TempTree tree;
     const Directories directories{tree / "c", tree / "a/b/state", tree / "run", tree / "a/log"};
     const mode_t mask = ::umask(0077);
-    const auto problem = createDirectories(directories);
+    const auto created = createDirectories(directories);
     ::umask(mask);
 
-    EXPECT_EQ(problem, std::nullopt);
+    EXPECT_TRUE(created.ok());
     EXPECT_EQ(modeOf(directories.state), 0750u);
     EXPECT_EQ(modeOf(directories.logs), 0750u);
     EXPECT_EQ(modeOf(directories.runtime), 0755u);
@@ -149,7 +148,7 @@ TEST(CreateDirectoriesTest, OfWhatIsThereOnlyTheRuntimeDirectoryIsOpened) {
         ASSERT_EQ(::mkdir(path.c_str(), 0700), 0);
     }
 
-    EXPECT_EQ(createDirectories(directories), std::nullopt);
+    EXPECT_TRUE(createDirectories(directories).ok());
     EXPECT_EQ(modeOf(directories.state), 0700u);
     EXPECT_EQ(modeOf(directories.logs), 0700u);
     EXPECT_EQ(modeOf(directories.runtime), 0755u);
@@ -161,7 +160,7 @@ TEST(CreateDirectoriesTest, ASharedRuntimeDirectoryStaysShared) {
     ASSERT_EQ(::mkdir(directories.runtime.c_str(), 0700), 0);
     ASSERT_EQ(::chmod(directories.runtime.c_str(), 01777), 0);
 
-    EXPECT_EQ(createDirectories(directories), std::nullopt);
+    EXPECT_TRUE(createDirectories(directories).ok());
     EXPECT_EQ(modeOf(directories.runtime), 01777u);
 }
 
@@ -169,10 +168,13 @@ TEST(CreateDirectoriesTest, TellsWhichDirectoryCannotBeMade) {
     const testing::TempTree tree;
     tree.write("file", "");
 
-    EXPECT_THAT(createDirectories({tree / "c", tree / "file/s", tree / "r", tree / "l"}).value(),
+    EXPECT_THAT(createDirectories({tree / "c", tree / "file/s", tree / "r", tree / "l"})
+                    .failure()
+                    .message(),
                 HasSubstr("cannot make directory " + (tree / "file").native()));
-    EXPECT_THAT(createDirectories({tree / "c", tree / "s", tree / "file", tree / "l"}).value(),
-                HasSubstr("cannot make directory " + (tree / "file").native() + ": File exists"));
+    EXPECT_THAT(
+        createDirectories({tree / "c", tree / "s", tree / "file", tree / "l"}).failure().message(),
+        HasSubstr("cannot make directory " + (tree / "file").native() + ": File exists"));
 }
 
 } // namespace

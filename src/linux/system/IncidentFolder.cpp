@@ -1,7 +1,6 @@
 #include "linux/system/IncidentFolder.h"
 
 #include <algorithm>
-#include <cerrno>
 #include <charconv>
 #include <fmt/format.h>
 #include <fstream>
@@ -42,23 +41,21 @@ std::string safePart(std::string_view text) {
     return safe;
 }
 
-[[noreturn]] void throwSystemError(const fs::path& path) {
-    throw std::system_error(errno, std::generic_category(), path.string());
-}
-
-void makeFolder(const fs::path& folder) {
+Result<void> makeFolder(const fs::path& folder) {
     if (::mkdir(folder.c_str(), S_IRWXU) != 0) {
-        throwSystemError(folder);
+        return Failure::ofErrno(folder.string());
     }
+    return {};
 }
 
-void writeFile(const fs::path& path, std::string_view text) {
+Result<void> writeFile(const fs::path& path, std::string_view text) {
     std::ofstream file(path, std::ios::binary);
     file.write(text.data(), static_cast<std::streamsize>(text.size()));
     file.close();
     if (!file) {
-        throwSystemError(path);
+        return Failure::ofErrno(path.string());
     }
+    return {};
 }
 
 // Our finished folders by number; whatever else lies there is left alone.
@@ -104,13 +101,21 @@ std::string joinLines(const std::vector<std::string>& lines, std::size_t most) {
     return text;
 }
 
-List writeProcesses(const fs::path& folder, const NamedProcesses& named) {
+Result<void> writeFacts(const fs::path& folder, const ProcessFacts& process) {
+    Result<void> result = makeFolder(folder);
+    for (const ProcessFacts::Fact& fact : process.facts) {
+        result = result.ok() ? writeFile(folder / fact.name, fact.text) : result;
+    }
+    return result;
+}
+
+// The process numbers.
+Result<List> writeProcesses(const fs::path& folder, const NamedProcesses& named) {
     List pids;
     for (const ProcessFacts& process : named.processes) {
         const fs::path own = folder / fmt::format("process-{}", process.pid);
-        makeFolder(own);
-        for (const ProcessFacts::Fact& fact : process.facts) {
-            writeFile(own / fact.name, fact.text);
+        if (const auto written = writeFacts(own, process); !written.ok()) {
+            return written.failure();
         }
         pids.append(process.pid);
     }
@@ -166,14 +171,14 @@ void IncidentFolder::snapshotWithSignature(const Dictionary& signature, double d
 }
 
 void IncidentFolder::take(const Snapshot& snapshot) {
-    std::string path;
-    try {
-        path = write(snapshot).string();
-    } catch (const std::exception& error) {
-        reportFailure(error.what());
-        snapshot.reply({{"success", false}, {"error", error.what()}});
+    const Result<fs::path> written = write(snapshot);
+    if (!written.ok()) {
+        const std::string why = written.failure().message();
+        reportFailure(why);
+        snapshot.reply({{"success", false}, {"error", why}});
         return;
     }
+    const std::string path = written.value().string();
     failing_ = false;
     if (options_.record) {
         options_.record(snapshot.signature, path, snapshot.time);
@@ -181,13 +186,17 @@ void IncidentFolder::take(const Snapshot& snapshot) {
     snapshot.reply({{"success", true}, {"path", path}});
 }
 
-fs::path IncidentFolder::write(const Snapshot& snapshot) const {
+// What the standard library throws ends here.
+Result<fs::path> IncidentFolder::write(const Snapshot& snapshot) const try {
     const fs::path& directory = options_.directory;
     fs::create_directories(directory);
     const fs::path unfinished = directory / kUnfinished;
     fs::remove_all(unfinished); // Of a daemon that was killed meanwhile.
-    makeFolder(unfinished);
-    fillFolder(unfinished, snapshot);
+    Result<void> filled = makeFolder(unfinished);
+    filled = filled.ok() ? fillFolder(unfinished, snapshot) : filled;
+    if (!filled.ok()) {
+        return filled.failure();
+    }
 
     const auto folders = finishedFolders(directory);
     const std::uint64_t number = folders.empty() ? 1 : folders.rbegin()->first + 1;
@@ -196,22 +205,28 @@ fs::path IncidentFolder::write(const Snapshot& snapshot) const {
     fs::rename(unfinished, finished);
     removeOldest(directory, kKept);
     return finished;
+} catch (const std::exception& error) {
+    return Failure{{}, error.what()};
 }
 
-void IncidentFolder::fillFolder(const fs::path& folder, const Snapshot& snapshot) const {
+Result<void> IncidentFolder::fillFolder(const fs::path& folder, const Snapshot& snapshot) const {
     NamedProcesses named;
     if (const Value* name = snapshot.signature.find(platform::kIncidentSignatureDetectedProcess)) {
         named = processesNamed(describe(*name), options_.procRoot);
     }
-    const Dictionary incident{
-        {"signature", snapshot.signature},  {"time", dateOf(snapshot.time)},
-        {"duration", snapshot.duration},    {"event", snapshot.event},
-        {"payload", snapshot.payload},      {"processes", writeProcesses(folder, named)},
-        {"processesLeftOut", named.leftOut}};
-    writeFile(folder / "incident.json", toPrettyJson(incident) + '\n');
-    if (options_.recentLines) {
-        writeFile(folder / "log.txt", joinLines(options_.recentLines(), kMostLogBytes));
+    const auto processes = writeProcesses(folder, named);
+    if (!processes.ok()) {
+        return processes.failure();
     }
+    const Dictionary incident{{"signature", snapshot.signature},  {"time", dateOf(snapshot.time)},
+                              {"duration", snapshot.duration},    {"event", snapshot.event},
+                              {"payload", snapshot.payload},      {"processes", processes.value()},
+                              {"processesLeftOut", named.leftOut}};
+    Result<void> result = writeFile(folder / "incident.json", toPrettyJson(incident) + '\n');
+    if (result.ok() && options_.recentLines) {
+        result = writeFile(folder / "log.txt", joinLines(options_.recentLines(), kMostLogBytes));
+    }
+    return result;
 }
 
 void IncidentFolder::reportFailure(std::string_view what) {

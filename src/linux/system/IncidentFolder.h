@@ -23,6 +23,7 @@
 #include <string_view>
 #include <vector>
 
+#include "common/Result.h"
 #include "linux/queues/Worker.h"
 #include "platform/Clock.h"
 #include "platform/IncidentReporter.h"
@@ -62,9 +63,9 @@ public:
 private:
     struct Snapshot;
     void take(const Snapshot& snapshot);
-    // Returns the folder's path. Throws std::exception on what the system refuses.
-    std::filesystem::path write(const Snapshot& snapshot) const;
-    void fillFolder(const std::filesystem::path& folder, const Snapshot& snapshot) const;
+    // The folder's path.
+    Result<std::filesystem::path> write(const Snapshot& snapshot) const;
+    Result<void> fillFolder(const std::filesystem::path& folder, const Snapshot& snapshot) const;
     void reportFailure(std::string_view what);
 
     const platform::Clock& clock_;

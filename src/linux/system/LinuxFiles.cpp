@@ -1,6 +1,5 @@
 #include "linux/system/LinuxFiles.h"
 
-#include <cerrno>
 #include <sys/stat.h>
 
 #include "linux/system/AtomicFile.h"
@@ -11,27 +10,27 @@ namespace {
 
 namespace fs = std::filesystem;
 
-// None when the directory is there afterwards.
-std::errc makeDirectory(const fs::path& path, mode_t mode) {
+// Done when the directory is there afterwards.
+Result<void> makeDirectory(const fs::path& path, mode_t mode) {
     if (::mkdir(path.c_str(), mode) == 0) {
         return {};
     }
-    const auto error = static_cast<std::errc>(errno);
+    const Failure failure = Failure::ofErrno();
     std::error_code ignored;
-    return fs::is_directory(path, ignored) ? std::errc{} : error;
+    return fs::is_directory(path, ignored) ? Result<void>() : failure;
 }
 
 } // namespace
 
-Error systemError(std::errc code) {
-    return {"posix", static_cast<std::int64_t>(code), std::make_error_code(code).message()};
+Error systemError(const Failure& failure) {
+    return {"posix", static_cast<std::int64_t>(failure.code), failure.message()};
 }
 
 std::variant<std::string, Error> LinuxFiles::readFile(std::string_view path,
                                                       std::size_t most) const {
     auto result = readSmallFile(directories_.mapped(path), most);
     if (const auto* const error = std::get_if<std::errc>(&result)) {
-        return systemError(*error);
+        return systemError({*error, {}});
     }
     return std::get<std::string>(std::move(result));
 }
@@ -53,9 +52,9 @@ MaybeError LinuxFiles::createDirectories(std::string_view path, std::uint32_t mo
         if (part.empty() || part == "/") {
             continue; // A trailing slash, the root.
         }
-        const std::errc error = makeDirectory(made, static_cast<mode_t>(mode));
-        if (error != std::errc{}) {
-            return systemError(error);
+        const auto result = makeDirectory(made, static_cast<mode_t>(mode));
+        if (!result.ok()) {
+            return systemError(result.failure());
         }
     }
     return std::nullopt;
@@ -64,8 +63,8 @@ MaybeError LinuxFiles::createDirectories(std::string_view path, std::uint32_t mo
 MaybeError LinuxFiles::writeFileAtomically(std::string_view path, std::string_view contents) {
     AtomicFile file(directories_.mapped(path));
     file.write(contents);
-    const std::errc error = file.commit();
-    return error == std::errc{} ? MaybeError() : systemError(error);
+    const auto result = file.commit();
+    return result.ok() ? MaybeError() : systemError(result.failure());
 }
 
 } // namespace halyard::linux_

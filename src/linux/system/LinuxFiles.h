@@ -24,7 +24,7 @@ private:
     const Directories directories_;
 };
 
-// The error of a system call, with errno as its code.
-Error systemError(std::errc code);
+// What the core is told of the system's refusal: errno as the code.
+Error systemError(const Failure& failure);
 
 } // namespace halyard::linux_

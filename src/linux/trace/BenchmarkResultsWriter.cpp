@@ -103,10 +103,10 @@ private:
         }
         json_.EndArray();
     }
-    static void report(std::errc error, const char* what) {
-        if (error != std::errc{}) {
+    static void report(const Result<void>& result, const char* what) {
+        if (!result.ok()) {
             HY_LOG_ERROR(HYReportingTraceCategory, "trace results are not written: {}: {}", what,
-                         std::make_error_code(error).message());
+                         result.failure().message());
         }
     }
 

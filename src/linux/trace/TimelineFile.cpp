@@ -128,7 +128,7 @@ void TimelineFile::writeMetadata() {
     json_.EndObject();
 }
 
-std::errc TimelineFile::commit() {
+Result<void> TimelineFile::commit() {
     json_.EndArray();
     writeMetadata();
     json_.EndObject();

@@ -10,7 +10,6 @@
 #include <rapidjson/writer.h>
 #include <string>
 #include <string_view>
-#include <system_error>
 #include <vector>
 
 #include "linux/system/AtomicFile.h"
@@ -24,8 +23,8 @@ public:
     explicit TimelineFile(std::unique_ptr<AtomicFile> file);
 
     void add(const platform::TraceTimeline& timeline);
-    // Once, last. The default value is success.
-    [[nodiscard]] std::errc commit();
+    // Once, last.
+    Result<void> commit();
 
 private:
     // What the metadata tells of a trace.

@@ -118,9 +118,8 @@ void Recording::fail(const Error& error) {
 void Recording::run() {
     makeRoom();
     ChildProcess child;
-    if (const std::errc error = child.start(arguments()); error != std::errc{}) {
-        fail({"posix", static_cast<std::int64_t>(error),
-              options_.program + ": " + std::make_error_code(error).message()});
+    if (const auto started = child.start(arguments()); !started.ok()) {
+        fail(systemError({started.failure().code, options_.program}));
         return;
     }
     if (const auto told = delegate()) {
