@@ -1,7 +1,6 @@
 #include "linux/trace/TraceInstance.h"
 
 #include <algorithm>
-#include <cerrno>
 #include <charconv>
 #include <fmt/format.h>
 #include <sys/stat.h>
@@ -74,14 +73,9 @@ TraceInstance::~TraceInstance() {
     }
 }
 
-TraceInstance::Failure TraceInstance::write(const fs::path& file, std::string_view text) const {
-    const std::errc error = writeTracefs(file, text);
-    return error == std::errc{} ? Failure{} : Failure{error, file.string()};
-}
-
-TraceInstance::Failure TraceInstance::create() {
+Result<void> TraceInstance::create() {
     if (::mkdir(directory_.c_str(), S_IRWXU) != 0) {
-        return {static_cast<std::errc>(errno), directory_.string()};
+        return Failure::ofErrno(directory_.string());
     }
     created_ = true;
     const std::pair<const char*, std::string> settings[] = {
@@ -91,46 +85,44 @@ TraceInstance::Failure TraceInstance::create() {
         {"buffer_size_kb", std::to_string(bufferKiB())},
     };
     for (const auto& [file, value] : settings) {
-        if (Failure failure = write(directory_ / file, value); failure.error != std::errc{}) {
-            return failure;
+        if (auto written = writeTracefs(directory_ / file, value); !written.ok()) {
+            return written;
         }
     }
     // Probes are defined there: that nobody may write to it is no probe's fault.
-    const fs::path definitions = tracefs_ / "uprobe_events";
-    if (const std::errc error = writeTracefs(definitions, "", true); error != std::errc{}) {
-        return {error, definitions.string()};
+    if (auto writable = writeTracefs(tracefs_ / "uprobe_events", "", true); !writable.ok()) {
+        return writable;
     }
     // Helps to tell the process of a thread that has ended; nothing depends on it.
     (void)writeTracefs(directory_ / "options/record-tgid", "1");
     return {};
 }
 
-TraceInstance::Failure TraceInstance::record() {
-    return write(directory_ / "tracing_on", "1");
+Result<void> TraceInstance::record() {
+    return writeTracefs(directory_ / "tracing_on", "1");
 }
 
-TraceInstance::Failure TraceInstance::probe(const MarkLibraries::Library& library,
-                                            std::uint32_t first, std::uint32_t last) {
+Result<void> TraceInstance::probe(const MarkLibraries::Library& library, std::uint32_t first,
+                                  std::uint32_t last) {
     const std::string probe = fmt::format("mark{}", probes_.size());
-    const fs::path definitions = tracefs_ / "uprobe_events";
-    const std::errc error =
-        writeTracefs(definitions,
-                     fmt::format("p:{}/{} {}:0x{:x} {}\n", name_, probe, library.file->path(),
-                                 library.offset, kArguments),
-                     true);
-    if (error != std::errc{}) {
-        return {error, definitions.string()};
+    auto result = writeTracefs(tracefs_ / "uprobe_events",
+                               fmt::format("p:{}/{} {}:0x{:x} {}\n", name_, probe,
+                                           library.file->path(), library.offset, kArguments),
+                               true);
+    if (!result.ok()) {
+        return result;
     }
     probes_.push_back(probe); // Removed with the others, also when it cannot be used.
     const fs::path event = directory_ / "events" / name_ / probe;
-    Failure failure = readFormat(event);
-    if (failure.error == std::errc{}) {
-        failure = write(event / "filter", fmt::format("code >= {} && code <= {}", first, last));
+    result = readFormat(event);
+    if (result.ok()) {
+        result =
+            writeTracefs(event / "filter", fmt::format("code >= {} && code <= {}", first, last));
     }
-    return failure.error == std::errc{} ? write(event / "enable", "1") : failure;
+    return result.ok() ? writeTracefs(event / "enable", "1") : result;
 }
 
-TraceInstance::Failure TraceInstance::readFormat(const fs::path& event) {
+Result<void> TraceInstance::readFormat(const fs::path& event) {
     const std::string format = readText(event / "format");
     const auto id = static_cast<std::uint16_t>(numberAfter(format, "ID:"));
     layout_.code = offsetOfField(format, "code");
@@ -140,7 +132,7 @@ TraceInstance::Failure TraceInstance::readFormat(const fs::path& event) {
         layout_.size = std::max(layout_.size, layout_.arguments[i] + sizeof(std::uint64_t));
     }
     if (id == 0 || layout_.code == 0) {
-        return {std::errc::not_supported, (event / "format").string()};
+        return Failure{std::errc::not_supported, (event / "format").string()};
     }
     eventIDs_.push_back(id);
     return {};

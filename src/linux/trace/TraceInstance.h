@@ -8,20 +8,15 @@
 #include <cstdint>
 #include <filesystem>
 #include <string>
-#include <system_error>
 #include <vector>
 
+#include "common/Result.h"
 #include "linux/trace/MarkLibraries.h"
 
 namespace halyard::linux_ {
 
 class TraceInstance {
 public:
-    // What a step that failed was and why; the default is success.
-    struct Failure {
-        std::errc error{};
-        std::string step;
-    };
     // Where the values of a recorded event lie.
     struct Layout {
         std::size_t code = 0;
@@ -35,12 +30,12 @@ public:
     TraceInstance& operator=(const TraceInstance&) = delete;
 
     // Sets the buffer up; nothing is recorded yet.
-    [[nodiscard]] Failure create();
+    Result<void> create();
     // Records from now on what the probes see. Requires create().
-    [[nodiscard]] Failure record();
+    Result<void> record();
     // Probes one more file, also while recording.
-    [[nodiscard]] Failure probe(const MarkLibraries::Library& library, std::uint32_t first,
-                                std::uint32_t last);
+    Result<void> probe(const MarkLibraries::Library& library, std::uint32_t first,
+                       std::uint32_t last);
     // Stops recording, probes first: a probe that records nowhere still costs its
     // callers. What is buffered can still be read.
     void disable();
@@ -52,8 +47,7 @@ public:
     std::uint64_t eventsLost() const;
 
 private:
-    [[nodiscard]] Failure write(const std::filesystem::path& file, std::string_view text) const;
-    [[nodiscard]] Failure readFormat(const std::filesystem::path& event);
+    Result<void> readFormat(const std::filesystem::path& event);
 
     const std::filesystem::path tracefs_;
     const std::string name_;

@@ -1,7 +1,6 @@
 #include "linux/trace/TraceReader.h"
 
 #include <algorithm>
-#include <cerrno>
 #include <charconv>
 #include <cstring>
 #include <ctime>
@@ -66,18 +65,22 @@ TraceReader::~TraceReader() {
     }
 }
 
-std::errc TraceReader::open() {
+Result<void> TraceReader::open() {
+    constexpr const char* kStep = "per_cpu/cpu*/trace_pipe_raw";
     std::error_code error;
     for (const auto& entry : fs::directory_iterator(instance_.directory() / "per_cpu", error)) {
         const std::string name = entry.path().filename().string();
         const int fd =
             ::open((entry.path() / "trace_pipe_raw").c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
         if (fd < 0) {
-            return static_cast<std::errc>(errno);
+            return Failure::ofErrno(kStep);
         }
         processors_.push_back({static_cast<std::uint32_t>(numberAfter(name, "cpu")), fd});
     }
-    return error ? static_cast<std::errc>(error.value()) : std::errc{};
+    if (error) {
+        return Failure{static_cast<std::errc>(error.value()), kStep};
+    }
+    return {};
 }
 
 std::vector<trace_point> TraceReader::read(bool all) {

@@ -10,6 +10,7 @@
 #include <unordered_map>
 #include <vector>
 
+#include "common/Result.h"
 #include "linux/trace/TraceInstance.h"
 #include "platform/EventTrace.h"
 
@@ -25,8 +26,7 @@ public:
     TraceReader(const TraceReader&) = delete;
     TraceReader& operator=(const TraceReader&) = delete;
 
-    // The default value is success.
-    [[nodiscard]] std::errc open();
+    Result<void> open();
     // What has been recorded meanwhile, but for the newest: an event of another
     // processor may still come before those. With `all` they are returned, too.
     // Returns after a bounded number of pages; what is left comes next time.

@@ -1,7 +1,6 @@
 #include "linux/trace/Tracefs.h"
 
 #include <atomic>
-#include <cerrno>
 #include <charconv>
 #include <fcntl.h>
 #include <fmt/format.h>
@@ -79,9 +78,9 @@ std::size_t removeProbes(const fs::path& tracefs) {
     for (std::string line; std::getline(lines, line);) {
         const std::string probe = line.substr(0, line.find(' '));
         if (probe.starts_with("p:") && isLeftover(std::string_view(probe).substr(2))) {
-            const std::errc error =
+            const auto result =
                 writeTracefs(tracefs / "uprobe_events", "-:" + probe.substr(2) + "\n", true);
-            removed += error == std::errc{} ? 1U : 0U;
+            removed += result.ok() ? 1U : 0U;
         }
     }
     return removed;
@@ -89,13 +88,15 @@ std::size_t removeProbes(const fs::path& tracefs) {
 
 } // namespace
 
-std::errc writeTracefs(const fs::path& file, std::string_view text, bool append) {
+Result<void> writeTracefs(const fs::path& file, std::string_view text, bool append) {
     const int fd = ::open(file.c_str(), O_WRONLY | O_CLOEXEC | (append ? O_APPEND : O_TRUNC));
     if (fd < 0) {
-        return static_cast<std::errc>(errno);
+        return Failure::ofErrno(file.string());
     }
-    const ssize_t written = ::write(fd, text.data(), text.size());
-    const std::errc result = written >= 0 ? std::errc{} : static_cast<std::errc>(errno);
+    Result<void> result;
+    if (::write(fd, text.data(), text.size()) < 0) {
+        result = Failure::ofErrno(file.string());
+    }
     ::close(fd);
     return result;
 }

@@ -7,16 +7,17 @@
 #include <filesystem>
 #include <string>
 #include <string_view>
-#include <system_error>
+
+#include "common/Result.h"
 
 namespace halyard::linux_ {
 
 inline constexpr const char* kTracefs = "/sys/kernel/tracing";
 
 // One write of all of `text`. With `append` to a file of definitions, which
-// opening otherwise clears. The default value is success.
-[[nodiscard]] std::errc writeTracefs(const std::filesystem::path& file, std::string_view text,
-                                     bool append = false);
+// opening otherwise clears. A failure names the file.
+Result<void> writeTracefs(const std::filesystem::path& file, std::string_view text,
+                          bool append = false);
 
 // A name for an instance and for a group of probes that no other process uses.
 // It tells its owner, for whoever clears up behind a process that was killed.

@@ -79,7 +79,7 @@ public:
     std::string clockName() const override { return "CLOCK_MONOTONIC"; }
 
 private:
-    TraceInstance::Failure open();
+    Result<void> open();
     void probeNewLibraries();
     void requestStop();
     bool waitForStop();
@@ -105,13 +105,13 @@ private:
     std::thread drainer_;
 };
 
-TraceInstance::Failure TracefsSession::open() {
-    TraceInstance::Failure failure = instance_.create();
-    if (failure.error == std::errc{}) {
+Result<void> TracefsSession::open() {
+    Result<void> result = instance_.create();
+    if (result.ok()) {
         probeNewLibraries();
-        failure = {reader_.open(), "per_cpu/cpu*/trace_pipe_raw"};
+        result = reader_.open();
     }
-    return failure.error == std::errc{} ? instance_.record() : failure;
+    return result.ok() ? instance_.record() : result;
 }
 
 // The libraries are the clients' own files. One that cannot be probed is its
@@ -123,33 +123,32 @@ void TracefsSession::probeNewLibraries() {
         pids.insert(pids.end(), clients.begin(), clients.end());
     }
     for (const MarkLibraries::Library& library : libraries_.newLibrariesOf(pids)) {
-        const TraceInstance::Failure failure = instance_.probe(library, first_, last_);
-        if (failure.error != std::errc{}) {
-            HY_LOG_ERROR(HYReportingTraceCategory, "a client's library is not traced: {}: {}: {}",
-                         library.name, failure.step, std::make_error_code(failure.error).message());
+        const auto probed = instance_.probe(library, first_, last_);
+        if (!probed.ok()) {
+            HY_LOG_ERROR(HYReportingTraceCategory, "a client's library is not traced: {}: {}",
+                         library.name, probed.failure().message());
         }
     }
 }
 
 int TracefsSession::start(std::shared_ptr<platform::SerialQueue> queue) {
     delivery_->setQueue(std::move(queue));
-    TraceInstance::Failure failure = open();
-    if (failure.error == std::errc{}) {
+    Result<void> opened = open();
+    if (opened.ok()) {
         try {
             drainer_ = std::thread([this] { drain(); });
             return 0;
         } catch (const std::system_error& error) {
-            failure = {static_cast<std::errc>(error.code().value()), "a thread"};
+            opened = Failure{static_cast<std::errc>(error.code().value()), "a thread"};
         }
     }
     instance_.disable();
     HY_LOG_ERROR(HYReportingTraceCategory,
-                 "no kernel event trace: {}: {}; it needs tracefs at {} and the right to write "
+                 "no kernel event trace: {}; it needs tracefs at {} and the right to write "
                  "there (root, or CAP_DAC_OVERRIDE and, for clients of other users, "
                  "CAP_SYS_PTRACE); see docs/tracing.md",
-                 failure.step, std::make_error_code(failure.error).message(),
-                 options_.tracefs.string());
-    return static_cast<int>(failure.error);
+                 opened.failure().message(), options_.tracefs.string());
+    return static_cast<int>(opened.failure().code);
 }
 
 void TracefsSession::end() {

@@ -314,13 +314,13 @@ TEST_F(TracefsEventTraceTest, WhatAKilledDaemonLeftIsRemoved) {
     const fs::path instance = fs::path(kTracefs) / "instances" / name;
     const auto libraries = MarkLibraries().newLibrariesOf({::getpid()});
     ASSERT_THAT(libraries, SizeIs(1));
-    ASSERT_EQ(writeTracefs(
-                  fs::path(kTracefs) / "uprobe_events",
-                  fmt::format("p:{}/mark0 {}:0x{:x}\n", name, HALYARD_LIBRARY, libraries[0].offset),
-                  true),
-              std::errc{});
+    ASSERT_TRUE(writeTracefs(fs::path(kTracefs) / "uprobe_events",
+                             fmt::format("p:{}/mark0 {}:0x{:x}\n", name, HALYARD_LIBRARY,
+                                         libraries[0].offset),
+                             true)
+                    .ok());
     ASSERT_EQ(::mkdir(instance.c_str(), 0700), 0);
-    ASSERT_EQ(writeTracefs(instance / "events" / name / "mark0/enable", "1"), std::errc{});
+    ASSERT_TRUE(writeTracefs(instance / "events" / name / "mark0/enable", "1").ok());
 
     TracefsEventTrace facility({});
     EXPECT_FALSE(fs::exists(instance));
