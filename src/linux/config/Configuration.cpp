@@ -8,8 +8,9 @@
 namespace halyard::linux_ {
 namespace {
 
-bool isMissing(std::errc error) {
-    return error == std::errc::no_such_file_or_directory || error == std::errc::not_a_directory;
+bool isMissing(const Failure& failure) {
+    return failure.code == std::errc::no_such_file_or_directory ||
+           failure.code == std::errc::not_a_directory;
 }
 
 void logWarnings(const std::string& file, const ParsedSettings& parsed) {
@@ -35,14 +36,11 @@ std::shared_ptr<const Settings> Configuration::settings() const {
 
 Configuration::Outcome Configuration::reload() {
     const MutexLock lock(reloading_);
-    auto text = readSmallFile(file_, kMaxFileBytes);
-    if (const auto* const error = std::get_if<std::errc>(&text)) {
-        if (!isMissing(*error)) {
-            return refuse({{*error, {}}, file_});
-        }
-        return putInForce(Settings());
+    const auto text = readSmallFile(file_, kMaxFileBytes);
+    if (!text.ok()) {
+        return isMissing(text.failure()) ? putInForce(Settings()) : refuse({text.failure(), file_});
     }
-    auto parsed = parseSettings(std::get<std::string>(text), file_.native());
+    auto parsed = parseSettings(text.value(), file_.native());
     if (!parsed.ok()) {
         return refuse(parsed.failure());
     }

@@ -41,9 +41,11 @@ std::vector<std::string> entries(const fs::path& directory) {
 }
 
 std::optional<std::string> fact(const fs::path& path) {
-    auto read = readSmallFile(path, kMaxFactFile);
-    const auto* const text = std::get_if<std::string>(&read);
-    return text != nullptr ? std::optional(text->substr(0, text->find('\n'))) : std::nullopt;
+    const auto read = readSmallFile(path, kMaxFactFile);
+    if (!read.ok()) {
+        return std::nullopt;
+    }
+    return read.value().substr(0, read.value().find('\n'));
 }
 
 bool isThere(const fs::path& path) {

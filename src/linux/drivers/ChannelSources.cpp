@@ -93,8 +93,8 @@ InterruptSource::InterruptSource(const std::string& action, SourceRoot& root) {
     std::filesystem::directory_iterator lines(root.resolve("/sys/kernel/irq"), ignored);
     for (; lines != std::filesystem::directory_iterator(); lines.increment(ignored)) {
         const auto actions = readSmallFile(lines->path() / "actions", kMaxSampledFile);
-        const auto* const text = std::get_if<std::string>(&actions);
-        if (text != nullptr && hasAction(*text, action) && counts_.size() < kMaxInterruptLines) {
+        if (actions.ok() && hasAction(actions.value(), action) &&
+            counts_.size() < kMaxInterruptLines) {
             counts_.emplace_back(lines->path() / "per_cpu_count", root.descriptors);
         }
     }
@@ -150,8 +150,7 @@ std::vector<std::filesystem::path> stateDirectories(const std::filesystem::path&
 
 std::string firstLine(const std::filesystem::path& path, std::string otherwise) {
     const auto read = readSmallFile(path, kMaxSampledFile);
-    const auto* const text = std::get_if<std::string>(&read);
-    return text != nullptr ? text->substr(0, text->find('\n')) : std::move(otherwise);
+    return read.ok() ? read.value().substr(0, read.value().find('\n')) : std::move(otherwise);
 }
 
 } // namespace

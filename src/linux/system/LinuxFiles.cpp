@@ -29,10 +29,10 @@ Error systemError(const Failure& failure) {
 std::variant<std::string, Error> LinuxFiles::readFile(std::string_view path,
                                                       std::size_t most) const {
     auto result = readSmallFile(directories_.mapped(path), most);
-    if (const auto* const error = std::get_if<std::errc>(&result)) {
-        return systemError({*error, {}});
+    if (!result.ok()) {
+        return systemError(result.failure());
     }
-    return std::get<std::string>(std::move(result));
+    return std::move(result).value();
 }
 
 std::string LinuxFiles::currentDirectory() const {

@@ -14,16 +14,16 @@ constexpr std::size_t kMaxCommFile = 4096;
 
 std::optional<std::string> commandName(const std::filesystem::path& process) {
     auto read = readSmallFile(process / "comm", kMaxCommFile);
-    auto* const name = std::get_if<std::string>(&read);
-    if (name == nullptr) {
+    if (!read.ok()) {
         return std::nullopt;
     }
+    std::string name = std::move(read).value();
     // The last newline is the file's; any other is the name's.
-    if (name->ends_with('\n')) {
-        name->pop_back();
+    if (name.ends_with('\n')) {
+        name.pop_back();
     }
-    name->resize(std::min(name->size(), kMaxCommandName));
-    return std::move(*name);
+    name.resize(std::min(name.size(), kMaxCommandName));
+    return name;
 }
 
 } // namespace

@@ -1,6 +1,5 @@
 #include "linux/system/RegularFile.h"
 
-#include <cerrno>
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <sys/stat.h>
@@ -13,19 +12,16 @@ std::string pathOf(int descriptor) {
     return fmt::format("/proc/self/fd/{}", descriptor);
 }
 
-std::errc lastError() {
-    return static_cast<std::errc>(errno);
-}
-
-std::errc kindError(int descriptor) {
+Result<void> checkKind(int descriptor) {
     struct stat facts {};
     if (::fstat(descriptor, &facts) != 0) {
-        return lastError();
+        return Failure::ofErrno();
     }
-    if (S_ISDIR(facts.st_mode)) {
-        return std::errc::is_a_directory;
+    if (S_ISREG(facts.st_mode)) {
+        return {};
     }
-    return S_ISREG(facts.st_mode) ? std::errc{} : std::errc::invalid_argument;
+    return Failure{S_ISDIR(facts.st_mode) ? std::errc::is_a_directory
+                                          : std::errc::invalid_argument};
 }
 
 } // namespace
@@ -33,13 +29,15 @@ std::errc kindError(int descriptor) {
 RegularFile::RegularFile(const std::filesystem::path& path) {
     const int seen = ::open(path.c_str(), O_PATH | O_CLOEXEC);
     if (seen < 0) {
-        error_ = lastError();
+        opened_ = Failure::ofErrno();
         return;
     }
-    error_ = kindError(seen);
-    if (error_ == std::errc{}) {
+    opened_ = checkKind(seen);
+    if (opened_.ok()) {
         descriptor_ = ::open(pathOf(seen).c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
-        error_ = descriptor_ < 0 ? lastError() : std::errc{};
+        if (descriptor_ < 0) {
+            opened_ = Failure::ofErrno();
+        }
     }
     ::close(seen);
 }

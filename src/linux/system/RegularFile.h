@@ -7,7 +7,8 @@
 
 #include <filesystem>
 #include <string>
-#include <system_error>
+
+#include "common/Result.h"
 
 namespace halyard::linux_ {
 
@@ -18,9 +19,8 @@ public:
     RegularFile(const RegularFile&) = delete;
     RegularFile& operator=(const RegularFile&) = delete;
 
-    // None when it is open; is_a_directory or invalid_argument when it is another
-    // kind of file.
-    [[nodiscard]] std::errc error() const { return error_; }
+    // is_a_directory or invalid_argument when it is another kind of file.
+    const Result<void>& opened() const { return opened_; }
     // Requires that it is open.
     int descriptor() const { return descriptor_; }
     // Leads to this very file, whatever has become of its name.
@@ -28,7 +28,7 @@ public:
 
 private:
     int descriptor_ = -1;
-    std::errc error_{};
+    Result<void> opened_;
 };
 
 } // namespace halyard::linux_

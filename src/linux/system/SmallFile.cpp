@@ -6,19 +6,11 @@
 #include "linux/system/RegularFile.h"
 
 namespace halyard::linux_ {
-namespace {
 
-std::errc lastError() {
-    return static_cast<std::errc>(errno);
-}
-
-} // namespace
-
-std::variant<std::string, std::errc> readSmallFile(const std::filesystem::path& path,
-                                                   std::size_t most) {
+Result<std::string> readSmallFile(const std::filesystem::path& path, std::size_t most) {
     const RegularFile file(path);
-    if (file.error() != std::errc{}) {
-        return file.error();
+    if (!file.opened().ok()) {
+        return file.opened().failure();
     }
     // Sizes of procfs files are not known before they are read.
     std::string text;
@@ -29,14 +21,14 @@ std::variant<std::string, std::errc> readSmallFile(const std::filesystem::path& 
             continue;
         }
         if (got < 0) {
-            return lastError();
+            return Failure::ofErrno();
         }
         if (got == 0) {
             return text;
         }
         text.append(chunk, static_cast<std::size_t>(got));
         if (text.size() > most) {
-            return std::errc::file_too_large;
+            return Failure{std::errc::file_too_large};
         }
     }
 }

@@ -4,14 +4,13 @@
 #include <cstddef>
 #include <filesystem>
 #include <string>
-#include <system_error>
-#include <variant>
+
+#include "common/Result.h"
 
 namespace halyard::linux_ {
 
 // The whole of a regular file. file_too_large when it has more than `most`
 // bytes, invalid_argument when it is none: others are not even opened. Any thread.
-[[nodiscard]] std::variant<std::string, std::errc> readSmallFile(const std::filesystem::path& path,
-                                                                 std::size_t most);
+Result<std::string> readSmallFile(const std::filesystem::path& path, std::size_t most);
 
 } // namespace halyard::linux_

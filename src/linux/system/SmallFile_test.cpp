@@ -10,25 +10,29 @@
 namespace halyard::linux_ {
 namespace {
 
-using Result = std::variant<std::string, std::errc>;
+using Text = Result<std::string>;
+
+Text failed(std::errc code) {
+    return Failure{code};
+}
 
 TEST(SmallFileTest, ReadsAWholeFile) {
     const testing::TempTree tree;
     const std::string text(10000, 'x');
 
-    EXPECT_EQ(readSmallFile(tree.write("f", text), 10000), Result(text));
-    EXPECT_EQ(readSmallFile(tree.write("f", ""), 0), Result(std::string()));
+    EXPECT_EQ(readSmallFile(tree.write("f", text), 10000), Text(text));
+    EXPECT_EQ(readSmallFile(tree.write("f", ""), 0), Text(std::string()));
 }
 
 TEST(SmallFileTest, RefusesAByteMoreThanTheBound) {
     const testing::TempTree tree;
 
-    EXPECT_EQ(readSmallFile(tree.write("f", "1234"), 4), Result(std::string("1234")));
-    EXPECT_EQ(readSmallFile(tree.write("f", "12345"), 4), Result(std::errc::file_too_large));
+    EXPECT_EQ(readSmallFile(tree.write("f", "1234"), 4), Text(std::string("1234")));
+    EXPECT_EQ(readSmallFile(tree.write("f", "12345"), 4), failed(std::errc::file_too_large));
 }
 
 TEST(SmallFileTest, ReadsFilesThatDoNotTellTheirSize) {
-    EXPECT_EQ(readSmallFile("/proc/sys/kernel/ostype", 100), Result(std::string("Linux\n")));
+    EXPECT_EQ(readSmallFile("/proc/sys/kernel/ostype", 100), Text(std::string("Linux\n")));
 }
 
 TEST(SmallFileTest, TellsWhyThereIsNoText) {
@@ -36,10 +40,10 @@ TEST(SmallFileTest, TellsWhyThereIsNoText) {
     tree.write("file", "");
     ASSERT_EQ(::mkfifo((tree / "pipe").c_str(), 0600), 0);
 
-    EXPECT_EQ(readSmallFile(tree / "none", 9), Result(std::errc::no_such_file_or_directory));
-    EXPECT_EQ(readSmallFile(tree / "file/x", 9), Result(std::errc::not_a_directory));
-    EXPECT_EQ(readSmallFile(tree.path(), 9), Result(std::errc::is_a_directory));
-    EXPECT_EQ(readSmallFile(tree / "pipe", 9), Result(std::errc::invalid_argument));
+    EXPECT_EQ(readSmallFile(tree / "none", 9), failed(std::errc::no_such_file_or_directory));
+    EXPECT_EQ(readSmallFile(tree / "file/x", 9), failed(std::errc::not_a_directory));
+    EXPECT_EQ(readSmallFile(tree.path(), 9), failed(std::errc::is_a_directory));
+    EXPECT_EQ(readSmallFile(tree / "pipe", 9), failed(std::errc::invalid_argument));
 }
 
 TEST(SmallFileTest, WhatIsNoRegularFileIsNotEvenOpened) {
@@ -48,7 +52,7 @@ TEST(SmallFileTest, WhatIsNoRegularFileIsNotEvenOpened) {
     const int watcher = ::inotify_init1(IN_NONBLOCK | IN_CLOEXEC);
     ASSERT_GE(::inotify_add_watch(watcher, (tree / "pipe").c_str(), IN_OPEN), 0);
 
-    EXPECT_EQ(readSmallFile(tree / "pipe", 9), Result(std::errc::invalid_argument));
+    EXPECT_EQ(readSmallFile(tree / "pipe", 9), failed(std::errc::invalid_argument));
     char events[4096];
     EXPECT_LT(::read(watcher, events, sizeof events), 0) << "opened";
     ::close(watcher);

@@ -124,8 +124,7 @@ std::optional<std::string> libraryPath(const std::string& line) {
 
 std::optional<std::uint64_t> functionOffset(const fs::path& library, std::string_view function) {
     const RegularFile file(library);
-    return file.error() == std::errc{} ? ElfFile(file.descriptor()).offsetOf(function)
-                                       : std::nullopt;
+    return file.opened().ok() ? ElfFile(file.descriptor()).offsetOf(function) : std::nullopt;
 }
 
 // What a client maps is its own to choose, and so are the bounds that it meets
@@ -148,8 +147,7 @@ MarkLibraries::newLibrariesOf(const std::vector<std::int32_t>& pids) {
 
 void MarkLibraries::addLibrariesOf(std::int32_t pid, std::vector<Library>& found) {
     const auto maps = readSmallFile(fmt::format("/proc/{}/maps", pid), kMostMapBytes);
-    const auto* const text = std::get_if<std::string>(&maps);
-    std::istringstream lines(text != nullptr ? *text : std::string());
+    std::istringstream lines(maps.ok() ? maps.value() : std::string());
     std::set<std::string> paths;
     for (std::string line; paths.size() < kMostOfProcess && std::getline(lines, line);) {
         const auto path = libraryPath(line);
@@ -164,7 +162,7 @@ void MarkLibraries::addLibrary(std::int32_t pid, const std::string& path,
     // A process may live in another root than ours.
     const auto file = std::make_shared<RegularFile>(fmt::format("/proc/{}/root{}", pid, path));
     struct stat facts {};
-    if (file->error() != std::errc{} || ::fstat(file->descriptor(), &facts) != 0) {
+    if (!file->opened().ok() || ::fstat(file->descriptor(), &facts) != 0) {
         return;
     }
     const std::pair<std::uint64_t, std::uint64_t> key{facts.st_dev, facts.st_ino};

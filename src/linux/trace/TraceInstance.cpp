@@ -29,8 +29,7 @@ constexpr const char* kArguments = "code=%x0:u32 a1=%x1:u64 a2=%x2:u64 a3=%x3:u6
 
 std::string readText(const fs::path& file) {
     auto read = readSmallFile(file, 64 * 1024);
-    auto* const text = std::get_if<std::string>(&read);
-    return text != nullptr ? std::move(*text) : std::string();
+    return read.ok() ? std::move(read).value() : std::string();
 }
 
 // The number that follows `label` in `text`; 0 when there is none.

@@ -161,9 +161,8 @@ std::int32_t TraceReader::processOf(std::int32_t thread) {
         return known->second;
     }
     const auto status = readSmallFile(fmt::format("/proc/{}/status", thread), 16 * 1024);
-    const auto* const text = std::get_if<std::string>(&status);
     const std::int32_t process =
-        text != nullptr ? numberAfter(*text, "\nTgid:\t") : savedProcessOf(thread);
+        status.ok() ? numberAfter(status.value(), "\nTgid:\t") : savedProcessOf(thread);
     if (processes_.size() >= kMostThreads) {
         processes_.clear();
     }
@@ -174,8 +173,7 @@ std::int32_t TraceReader::processOf(std::int32_t thread) {
 // Lines of "THREAD PROCESS", for threads that have ended.
 std::int32_t TraceReader::savedProcessOf(std::int32_t thread) const {
     const auto saved = readSmallFile(tracefs_ / "saved_tgids", 1024 * 1024);
-    const auto* const text = std::get_if<std::string>(&saved);
-    return text != nullptr ? numberAfter('\n' + *text, fmt::format("\n{} ", thread)) : 0;
+    return saved.ok() ? numberAfter('\n' + saved.value(), fmt::format("\n{} ", thread)) : 0;
 }
 
 void TraceReader::addWallTimes(std::vector<trace_point>& points) const {

@@ -23,12 +23,11 @@ constexpr std::size_t kMostDefinitions = 4 * 1024 * 1024;
 // What tells a process from a later one of the same number.
 std::optional<std::uint64_t> startTime(int pid) {
     const auto stat = readSmallFile(fmt::format("/proc/{}/stat", pid), 4096);
-    const auto* const text = std::get_if<std::string>(&stat);
-    if (text == nullptr) {
+    if (!stat.ok()) {
         return std::nullopt;
     }
     // The name, in parentheses, may hold anything; the time is field 22.
-    std::istringstream fields(text->substr(text->rfind(')') + 1));
+    std::istringstream fields(stat.value().substr(stat.value().rfind(')') + 1));
     std::string field;
     for (int i = 3; i <= 22; ++i) {
         fields >> field;
@@ -72,9 +71,8 @@ std::size_t removeInstances(const fs::path& tracefs) {
 // Lines like "p:uprobes/name /path:0x0000123 arguments".
 std::size_t removeProbes(const fs::path& tracefs) {
     const auto read = readSmallFile(tracefs / "uprobe_events", kMostDefinitions);
-    const auto* const text = std::get_if<std::string>(&read);
     std::size_t removed = 0;
-    std::istringstream lines(text != nullptr ? *text : std::string());
+    std::istringstream lines(read.ok() ? read.value() : std::string());
     for (std::string line; std::getline(lines, line);) {
         const std::string probe = line.substr(0, line.find(' '));
         if (probe.starts_with("p:") && isLeftover(std::string_view(probe).substr(2))) {

@@ -31,12 +31,12 @@ constexpr std::uint64_t kBytesPerEvent = 320;
 // Events that fit into half of the memory that nobody needs now.
 std::uint64_t eventsThatFit() {
     const auto read = readSmallFile("/proc/meminfo", 64 * 1024);
-    const auto* const text = std::get_if<std::string>(&read);
-    const std::size_t at = text != nullptr ? text->find("MemAvailable:") : std::string::npos;
+    const std::string text = read.ok() ? read.value() : std::string();
+    const std::size_t at = text.find("MemAvailable:");
     std::uint64_t kibibytes = 0;
     if (at != std::string::npos) {
-        const std::size_t digits = text->find_first_of("0123456789", at);
-        std::from_chars(text->data() + std::min(digits, text->size()), text->data() + text->size(),
+        const std::size_t digits = text.find_first_of("0123456789", at);
+        std::from_chars(text.data() + std::min(digits, text.size()), text.data() + text.size(),
                         kibibytes);
     }
     return kibibytes * 1024 / 2 / kBytesPerEvent;
