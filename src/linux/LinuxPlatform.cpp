@@ -4,6 +4,7 @@
 #include <csignal>
 #include <cstdlib>
 #include <future>
+#include <optional>
 #include <systemd/sd-daemon.h>
 #include <unistd.h>
 #include <utility>
@@ -113,21 +114,21 @@ PeerRights LinuxPlatform::rightsOfPeer(const Peer& peer) const {
     return rightsOf(peer, configuration_.configuration.settings()->access, ::getuid());
 }
 
-std::optional<std::string> LinuxPlatform::open(platform::ListenerDelegate* delegate) {
-    ListeningSocket listening{inheritedSocket(kSocketName), {}};
-    if (listening.fd < 0) {
-        listening = listenAt((directories_.runtime / kSocketFile).string());
+Result<void> LinuxPlatform::open(platform::ListenerDelegate* delegate) {
+    const std::optional<int> inherited = inheritedSocket(kSocketName);
+    const Result<int> listening =
+        inherited ? *inherited : listenAt((directories_.runtime / kSocketFile).string());
+    if (!listening.ok()) {
+        return listening.failure();
     }
-    if (listening.fd < 0) {
-        return listening.error;
-    }
-    listener_ = std::make_unique<SocketListener>(
-        context_, pressure_, listening.fd, [this](const Peer& peer) { return rightsOfPeer(peer); });
+    listener_ =
+        std::make_unique<SocketListener>(context_, pressure_, listening.value(),
+                                         [this](const Peer& peer) { return rightsOfPeer(peer); });
     listener_->setDelegate(delegate);
     watchStopSignals();
     watchReloadSignal();
     observeConfiguration();
-    return std::nullopt;
+    return {};
 }
 
 void LinuxPlatform::watchStopSignals() {

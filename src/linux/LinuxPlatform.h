@@ -10,10 +10,10 @@
 #include <asio/steady_timer.hpp>
 #include <cstdint>
 #include <memory>
-#include <optional>
 #include <string>
 #include <vector>
 
+#include "common/Result.h"
 #include "linux/config/ConfigurationServices.h"
 #include "linux/drivers/LinuxHWReport.h"
 #include "linux/net/SocketListener.h"
@@ -39,9 +39,8 @@ public:
 
     const platform::Platform& platform() const { return platform_; }
 
-    // Opens the socket, inherited or made; the text says why there is none.
-    // Requires that the platform is installed.
-    [[nodiscard]] std::optional<std::string> open(platform::ListenerDelegate* delegate);
+    // Opens the socket, inherited or made. Requires that the platform is installed.
+    Result<void> open(platform::ListenerDelegate* delegate);
     // Serves until SIGTERM or SIGINT, then ends every connection, delivers and
     // commits what was accepted.
     void serve();

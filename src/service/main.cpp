@@ -42,8 +42,8 @@ int main(int argc, char** /*argv*/) {
     LibraryTraceMarks traceMarks;
     linux_::LinuxPlatform linuxPlatform(directories.value(), traceMarks);
     const auto service = HYReportingServiceDelegate::make();
-    if (const auto error = linuxPlatform.open(service.get())) {
-        return fail(*error);
+    if (const auto opened = linuxPlatform.open(service.get()); !opened.ok()) {
+        return fail(opened.failure().message());
     }
     linuxPlatform.serve();
     return 0;

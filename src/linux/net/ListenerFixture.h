@@ -54,8 +54,8 @@ protected:
         platform_.log = &log_;
         platform::install(&platform_);
         const auto listening = listenAt(path_);
-        EXPECT_EQ(listening.error, "");
-        listener_ = std::make_unique<SocketListener>(context_, pressure_, listening.fd,
+        EXPECT_TRUE(listening.ok()) << listening.failure().message();
+        listener_ = std::make_unique<SocketListener>(context_, pressure_, listening.value(),
                                                      [this](const Peer&) { return rights_; });
         listener_->setDelegate(&delegate_);
         asio::post(context_, [this] { context_.stop(); });

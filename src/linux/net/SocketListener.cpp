@@ -46,41 +46,45 @@ bool somebodyListens(const sockaddr_un& address) {
     return connected;
 }
 
+Failure inTheWay(std::string what) {
+    return {{}, std::move(what)};
+}
+
 } // namespace
 
-ListeningSocket listenAt(const std::string& path) {
+Result<int> listenAt(const std::string& path) {
     sockaddr_un address{};
     if (!makeAddress(path, address)) {
-        return {-1, fmt::format("the path of the socket is too long: {}", path)};
+        return inTheWay(fmt::format("the path of the socket is too long: {}", path));
     }
     struct stat facts {};
     if (::lstat(path.c_str(), &facts) == 0) {
         if (!S_ISSOCK(facts.st_mode)) {
-            return {-1, fmt::format("{} is in the way: it is no socket", path)};
+            return inTheWay(fmt::format("{} is in the way: it is no socket", path));
         }
         if (somebodyListens(address)) {
-            return {-1, fmt::format("another daemon listens at {}", path)};
+            return inTheWay(fmt::format("another daemon listens at {}", path));
         }
         (void)::unlink(path.c_str());
     }
     const int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
     if (fd < 0 || ::bind(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 ||
         ::chmod(path.c_str(), kSocketMode) != 0 || ::listen(fd, kBacklog) != 0) {
-        const std::string error = std::strerror(errno);
+        Failure failure = Failure::ofErrno("cannot listen at " + path);
         ::close(fd);
-        return {-1, fmt::format("cannot listen at {}: {}", path, error)};
+        return failure;
     }
-    return {fd, {}};
+    return fd;
 }
 
-int inheritedSocket(std::string_view name) {
+std::optional<int> inheritedSocket(std::string_view name) {
     char** names = nullptr;
     const int count = ::sd_listen_fds_with_names(0, &names);
-    int found = -1;
+    std::optional<int> found;
     for (int i = 0; i < count; ++i) {
         const int fd = SD_LISTEN_FDS_START + i;
         const bool fits = ::sd_is_socket_unix(fd, SOCK_STREAM, 1, nullptr, 0) > 0;
-        if (found < 0 && fits && (count == 1 || name == names[i])) {
+        if (!found && fits && (count == 1 || name == names[i])) {
             found = fd;
         }
     }

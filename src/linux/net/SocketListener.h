@@ -15,6 +15,7 @@
 #include <unordered_set>
 #include <vector>
 
+#include "common/Result.h"
 #include "linux/net/Peer.h"
 #include "linux/net/SocketConnection.h"
 #include "linux/queues/Pressure.h"
@@ -61,14 +62,10 @@ private:
 };
 
 // A listening socket at `path` (mode 0666), replacing the leftover of a daemon
-// that is gone. The error says what is in the way.
-struct ListeningSocket {
-    int fd = -1;
-    std::string error;
-};
-ListeningSocket listenAt(const std::string& path);
+// that is gone; else what is in the way.
+Result<int> listenAt(const std::string& path);
 
-// The socket that a service manager passed under `name`; -1 when there is none.
-int inheritedSocket(std::string_view name);
+// The socket that a service manager passed under `name`; it need not have.
+std::optional<int> inheritedSocket(std::string_view name);
 
 } // namespace halyard::linux_

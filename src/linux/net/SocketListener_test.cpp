@@ -98,21 +98,21 @@ TEST_F(SocketListenerTest, ARefusedPeerIsClosedAndLoggedOnceAnEpisode) {
 }
 
 TEST_F(SocketListenerTest, ASecondDaemonIsToldThatThereIsOne) {
-    EXPECT_EQ(listenAt(path_).error, "another daemon listens at " + path_);
+    EXPECT_EQ(listenAt(path_), (Failure{{}, "another daemon listens at " + path_}));
 }
 
 TEST_F(SocketListenerTest, TheLeftoverOfADeadDaemonIsReplaced) {
     const std::string other = directory_ / "other.sock";
-    ::close(listenAt(other).fd);
+    ::close(listenAt(other).value());
     const auto again = listenAt(other);
-    EXPECT_EQ(again.error, "");
-    ::close(again.fd);
+    ASSERT_TRUE(again.ok()) << again.failure().message();
+    ::close(again.value());
 }
 
 TEST_F(SocketListenerTest, AFileInTheWayIsLeftAlone) {
     const std::string other = directory_ / "file";
     std::ofstream(other) << "precious";
-    EXPECT_NE(listenAt(other).error, "");
+    EXPECT_EQ(listenAt(other), (Failure{{}, other + " is in the way: it is no socket"}));
     EXPECT_TRUE(std::filesystem::exists(other));
 }
 
