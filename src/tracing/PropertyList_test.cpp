@@ -31,7 +31,9 @@ TEST(PropertyListTest, XmlScalarsKeepTheirKinds) {
     EXPECT_EQ(parsedXml("<integer>100</integer>").kind(), Value::Kind::Int);
     EXPECT_EQ(parsedXml("<integer>-1</integer>"), Value(-1));
     EXPECT_EQ(parsedXml("<real>0.5</real>"), Value(0.5));
+    EXPECT_EQ(parsedXml("<true/>"), Value(true));
     EXPECT_EQ(parsedXml("<true/>").kind(), Value::Kind::Bool);
+    EXPECT_EQ(parsedXml("<false/>"), Value(false));
     EXPECT_EQ(describe(parsedXml("<date>2024-02-29T12:34:56Z</date>")),
               "2024-02-29 12:34:56 +0000");
     EXPECT_EQ(parsedXml("<data>D713HCc1rg==</data>"), Value("<0fbd771c2735ae>"));
@@ -42,6 +44,17 @@ TEST(PropertyListTest, XmlContainersKeepTheirOrder) {
                                   "<key>a</key><dict/></dict>");
     EXPECT_EQ(value, Value(Dictionary{{"b", List{Value("x")}}, {"a", Dictionary()}}));
     EXPECT_EQ(value.dictionary().begin()->key, Value("b"));
+}
+
+TEST(PropertyListTest, WhatBeginsLikeXmlIsReadAsXml) {
+    for (const char* const begin :
+         {"", " \t\r\n", "<?xml version=\"1.0\"?>", "<!DOCTYPE plist>", "<!-- { -->"}) {
+        const auto result = parsePropertyList(std::string(begin) + "<plist><true/></plist>");
+        EXPECT_EQ(std::get_if<Error>(&result), nullptr) << begin;
+    }
+    for (const char* const damaged : {"<?xml", "<!DOCTYPE", "<plist", "<!--", "\xEF\xBB\xBF<"}) {
+        EXPECT_EQ(errorOf(damaged), "a damaged XML property list") << damaged;
+    }
 }
 
 TEST(PropertyListTest, AnythingElseIsTakenForText) {
@@ -60,7 +73,25 @@ TEST(PropertyListTest, DepthAndSizeAreBounded) {
         deep += "<array>";
     }
     EXPECT_EQ(errorOf(deep), "too many levels");
+    EXPECT_EQ(errorOf(std::string(kMostPropertyListBytes, ' ')), "line 1: the text is empty");
     EXPECT_EQ(errorOf(std::string(kMostPropertyListBytes + 1, ' ')), "too large");
+}
+
+// `pairs` times a list in a dictionary.
+std::string nested(int pairs) {
+    std::string begin = "<plist>";
+    std::string end;
+    for (int i = 0; i < pairs; ++i) {
+        begin += "<dict><key>k</key><array>";
+        end += "</array></dict>";
+    }
+    return begin + end + "</plist>";
+}
+
+TEST(PropertyListTest, AsManyLevelsAsThereMayBeAreRead) {
+    static_assert(kMostPropertyListLevels % 2 == 0);
+    EXPECT_EQ(errorOf(nested(kMostPropertyListLevels / 2)), "none");
+    EXPECT_EQ(errorOf(nested(kMostPropertyListLevels / 2 + 1)), "too many levels");
 }
 
 } // namespace

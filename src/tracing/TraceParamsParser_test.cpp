@@ -148,6 +148,27 @@ TEST_F(TraceParamsParserTest, CodesThatDoNotScanAreZero) {
     EXPECT_EQ(items[1].beginCode, 0U);
     EXPECT_EQ(items[1].endCode, 0xFFFFFFFFU);
     EXPECT_EQ(items[2].beginCode, 0U);
+    EXPECT_TRUE(platform_.log.has(LogLevel::Info, HYReportingTraceCategory,
+                                  "Loading tracepoint : 0 and -1 \n finished parsing."));
+}
+
+TEST_F(TraceParamsParserTest, OnlyBlanksMayStandBeforeACode) {
+    const auto items = loadItems("{ Type = Interval; EvtapCodeBegin = \" \t\r\n12\";"
+                                 "  EvtapCodeEnd = \"~12\"; },"
+                                 "{ Type = Interval; EvtapCodeBegin = 0X1F; EvtapCodeEnd = x1F; }");
+    ASSERT_EQ(items.size(), 2U);
+    EXPECT_EQ(items[0].beginCode, 0x12U);
+    EXPECT_EQ(items[0].endCode, 0U);
+    EXPECT_EQ(items[1].beginCode, 0x1FU);
+    EXPECT_EQ(items[1].endCode, 0U);
+}
+
+TEST_F(TraceParamsParserTest, AFileOfMoreThanAMebibyteIsNotRead) {
+    std::string text = "{ Children = ({ Name = t; Children = (); }); }";
+    text.resize(1024 * 1024, ' ');
+    EXPECT_EQ(load(text).name, "t");
+    EXPECT_EQ(load(text + ' ').name, "");
+    EXPECT_EQ(errors().at(0), "Reading from plist file failed with error: File too large");
 }
 
 TEST_F(TraceParamsParserTest, IntegersAreReadByTheirDecimalDigits) {
@@ -209,6 +230,17 @@ TEST_F(TraceParamsParserTest, TheTypeBeforeAnUnknownOneMayBeAny) {
     EXPECT_EQ(items[1].endCode, 0U);
     EXPECT_EQ(items[2].type, TraceDataParams::Level);
     EXPECT_EQ(items[4].type, TraceDataParams::Impulse);
+}
+
+TEST_F(TraceParamsParserTest, AnUnknownTypeIsAnImpulseAtFirstAndAsBeforeInALaterTrace) {
+    const TraceParams params =
+        load("{ Children = ({ Name = t; Children = ({ EvtapCodeBegin = 1; }, { Type = Level; }); },"
+             "{ Children = ({ Name = later; }); }); }");
+    ASSERT_EQ(params.items.size(), 3U);
+    EXPECT_EQ(params.items[0].type, TraceDataParams::Impulse);
+    EXPECT_EQ(params.items[0].beginCode, 0U);
+    EXPECT_EQ(params.items[0].endCode, 0U);
+    EXPECT_EQ(params.items[2].type, TraceDataParams::Level);
 }
 
 TEST_F(TraceParamsParserTest, TheFilesOwnTextsAreReadAsListsAndDictionaries) {

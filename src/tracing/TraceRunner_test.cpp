@@ -2,6 +2,7 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <tuple>
 
 #include "testing/TestPlatform.h"
 
@@ -131,6 +132,21 @@ TEST_F(TraceRunnerTest, AStoppedTracesSessionIsEndedOnceAndDestroyed) {
     EXPECT_TRUE(session(0).destroyed);
 }
 
+TEST_F(TraceRunnerTest, ASecondStopEndsNothingAgainAndWritesTheSameResults) {
+    create(paramsNamed("one"));
+    runner_->runTraces();
+    session(0).deliver(tracePoint(1, 10));
+    session(0).deliver(tracePoint(2, 40));
+    runner_->stopTracingandProcessResults();
+    runner_->stopTracingandProcessResults();
+    EXPECT_EQ(session(0).ended, 1);
+    ASSERT_THAT(platform_.resultsFiles.files, SizeIs(2));
+    for (const auto& file : platform_.resultsFiles.files) {
+        EXPECT_THAT(file->values, ElementsAre(FakeResultsFiles::NamedValue{"b", 30}));
+        EXPECT_THAT(file->timelines, SizeIs(1));
+    }
+}
+
 TEST_F(TraceRunnerTest, ASignpostTraceIsCountedButNeverRuns) {
     create(paramsNamed("signpost", 1));
     runAndStop();
@@ -218,6 +234,34 @@ TEST_F(TraceRunnerTest, TheTimelineShowsPairedAndUnpairedEvents) {
     EXPECT_TRUE(spans[1].hasBegin && !spans[1].hasEnd && spans[1].begin == 10);
     EXPECT_TRUE(spans[2].hasBegin && !spans[2].hasEnd && spans[2].begin == 50);
     EXPECT_TRUE(!spans[3].hasBegin && spans[3].hasEnd && spans[3].end == 5);
+    EXPECT_TRUE(spans[1].end == 0 && spans[2].end == 0 && spans[3].begin == 0);
+}
+
+TEST_F(TraceRunnerTest, TheTimelineHasATrackForEachItemThatPairsAsTheItemDoes) {
+    platform_.eventTrace.nanosecondsPerUnit = 10;
+    create({"one",
+            0,
+            {{"by thread", TraceDataParams::Interval, 1, 2, true},
+             {"any thread", TraceDataParams::Interval, 1, 2, false}}});
+    runner_->runTraces();
+    for (const auto& [code, time, thread] :
+         std::vector<std::tuple<std::uint32_t, std::uint64_t, std::uint64_t>>{
+             {1, 1, 7}, {1, 2, 8}, {2, 3, 7}}) {
+        trace_point point = tracePoint(code, time, thread);
+        point.pid = static_cast<std::uint32_t>(thread + 100);
+        session(0).deliver(point);
+    }
+    runner_->stopTracingandProcessResults();
+    std::vector<std::string> shown;
+    for (const auto& track : results().timelines.at(0).tracks) {
+        for (const auto& span : track.spans) {
+            shown.push_back(fmt::format("{}: {} to {}, {} of {}", track.item, span.begin, span.end,
+                                        span.threadID, span.pid));
+        }
+    }
+    EXPECT_THAT(shown,
+                ElementsAre("by thread: 10 to 30, 7 of 107", "by thread: 20 to 0, 8 of 108",
+                            "any thread: 20 to 30, 8 of 108", "any thread: 10 to 0, 7 of 107"));
 }
 
 TEST_F(TraceRunnerTest, ARunnerDestroyedWhileItTracesGivesItsSessionsUp) {

@@ -91,6 +91,13 @@ TEST_F(TraceTest, ByThreadDiscardsAreCountedAtDebugLevel) {
     EXPECT_TRUE(logged(LogLevel::Debug, discardedStops(1)));
 }
 
+TEST_F(TraceTest, ByThreadAStartIsUsedUpByItsStop) {
+    process(singleThread_, {start(10), stop(20), stop(30), start(40), stop(45)});
+    EXPECT_THAT(singleThread_.getResults(), ElementsAre(10, 5));
+    EXPECT_EQ(singleThread_.getNumTimesTraced(), 2U);
+    EXPECT_THAT(platform_.log.texts(), ElementsAre(discardedStops(0)));
+}
+
 TEST_F(TraceTest, ATrailingStartLeavesNoTrace) {
     for (TraceInterval* const item : {&anyThread_, &singleThread_}) {
         process(*item, {start(10)});
