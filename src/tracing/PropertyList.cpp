@@ -14,6 +14,7 @@ namespace halyard {
 namespace {
 
 constexpr std::string_view kBinaryMagic = "bplist";
+constexpr int kMostXmlContainers = 10'000;
 // Dates count from 2001 in property lists.
 constexpr std::int64_t kSecondsTo2001 = 978'307'200;
 
@@ -39,22 +40,35 @@ bool beginsXml(std::string_view bytes) {
            begin.starts_with("\xEF\xBB\xBF<");
 }
 
+// Whether what is open at `at`, behind its name, is closed at once: <array/>.
+bool isEmptyElement(std::string_view bytes, std::size_t at) {
+    const std::size_t next = bytes.find_first_not_of(" \t\r\n", at);
+    return next != std::string_view::npos && bytes.substr(next).starts_with("/>");
+}
+
 // The library frees its tree by recursion, so depth is settled before it reads.
-// Counts openings in comments, too; nobody nests that deep.
-bool isTooDeepXml(std::string_view bytes) {
+// Comments and attributes count like the rest; nobody nests that deep. But ends in
+// them would hide levels, so all beginnings together are bounded, too: by what
+// every stack has room for.
+MaybeError depthError(std::string_view bytes) {
     int depth = 0;
+    int openings = 0;
     for (std::size_t at = bytes.find('<'); at != std::string_view::npos;
          at = bytes.find('<', at + 1)) {
         const std::string_view tag = bytes.substr(at + 1, 6);
-        if (tag.starts_with("dict") || tag.starts_with("array")) {
+        const std::size_t name = tag.starts_with("dict") ? 4 : tag.starts_with("array") ? 5 : 0;
+        if (name > 0 && !isEmptyElement(bytes, at + 1 + name)) {
+            ++openings;
             if (++depth > kMostPropertyListLevels) {
-                return true;
+                return propertyListError("too many levels");
             }
         } else if (tag.starts_with("/dict") || tag.starts_with("/array")) {
             --depth;
         }
     }
-    return false;
+    return openings > kMostXmlContainers
+               ? MaybeError(propertyListError("too many lists and dictionaries"))
+               : std::nullopt;
 }
 
 bool isSaneBinary(std::string_view bytes) {
@@ -183,8 +197,8 @@ std::variant<Value, Error> parsePropertyList(std::string_view bytes) {
     if (!beginsXml(bytes)) {
         return parsePropertyListText(bytes);
     }
-    return isTooDeepXml(bytes) ? propertyListError("too many levels")
-                               : parseWithLibrary(bytes, false);
+    const MaybeError error = depthError(bytes);
+    return error ? *error : parseWithLibrary(bytes, false);
 }
 
 } // namespace halyard

@@ -94,5 +94,34 @@ TEST(PropertyListTest, AsManyLevelsAsThereMayBeAreRead) {
     EXPECT_EQ(errorOf(nested(kMostPropertyListLevels / 2 + 1)), "too many levels");
 }
 
+TEST(PropertyListTest, OnlyWhatIsOpenCountsAsALevel) {
+    std::string siblings;
+    for (int i = 0; i <= kMostPropertyListLevels; ++i) {
+        siblings += "<array></array><dict></dict><array/><dict />";
+    }
+    EXPECT_EQ(parsedXml("<array>" + siblings + "</array>").list().size(),
+              4U * (kMostPropertyListLevels + 1));
+}
+
+TEST(PropertyListTest, ListsAndDictionariesOfXmlAreBounded) {
+    std::string most;
+    for (int i = 0; i < 9'999; ++i) {
+        most += "<array></array>";
+    }
+    EXPECT_EQ(errorOf("<plist><array>" + most + "</array></plist>"), "none");
+    EXPECT_EQ(errorOf("<plist><array><dict></dict>" + most + "</array></plist>"),
+              "too many lists and dictionaries");
+}
+
+// What looks like an end may be none.
+TEST(PropertyListTest, LevelsThatAreHiddenAreBoundedToo) {
+    for (const char* const level : {"<array </array>", "<array><!-- </array> -->"}) {
+        std::string text = "<plist>";
+        while (text.size() < kMostPropertyListBytes - 100) {
+            text += level;
+        }
+        EXPECT_EQ(errorOf(text), "too many lists and dictionaries") << level;
+    }
+}
 } // namespace
 } // namespace halyard
