@@ -74,6 +74,15 @@ std::vector<std::string> ourTraces() {
     return names;
 }
 
+int enabledProbes(const std::string& trace) {
+    const std::string probes = fmt::format("{0}/instances/{1}/events/{1}/mark", kTracefs, trace);
+    int enabled = 0;
+    for (int i = 0; i < 3; ++i) {
+        enabled += std::ifstream(fmt::format("{}{}/enable", probes, i)).get() == '1' ? 1 : 0;
+    }
+    return enabled;
+}
+
 std::string libraryBytes() {
     std::ifstream file(HALYARD_LIBRARY, std::ios::binary);
     return {std::istreambuf_iterator<char>(file), {}};
@@ -277,12 +286,7 @@ TEST_F(TracefsEventTraceTest, LibrariesFoundAfterTheStartAreTracedButForThoseTha
     const auto mark = reinterpret_cast<Mark>(::dlsym(library, "evmark_trace"));
     const Child child;
     client = child.pid();
-    const auto probes = [] {
-        std::ifstream file(std::string(kTracefs) + "/uprobe_profile");
-        return std::count(std::istreambuf_iterator<char>(file), {}, '\n');
-    };
-    const auto before = probes();
-    while (probes() < before + 2) { // ctest's limit ends a wait in vain
+    while (enabledProbes(ourTraces().at(0)) < 2) { // ctest's limit ends a wait in vain
         std::this_thread::yield();
     }
     mark(kFirst, 9, 0, 0, 0); // whichever comes first
