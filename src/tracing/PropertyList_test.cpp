@@ -36,6 +36,8 @@ TEST(PropertyListTest, XmlScalarsKeepTheirKinds) {
     EXPECT_EQ(parsedXml("<false/>"), Value(false));
     EXPECT_EQ(describe(parsedXml("<date>2024-02-29T12:34:56Z</date>")),
               "2024-02-29 12:34:56 +0000");
+    EXPECT_EQ(parsedXml("<date>2024-02-29T12:34:56Z</date>"), Value(Date{1'709'210'096, 0}));
+    EXPECT_EQ(parsedXml("<data/>"), Value("<>"));
     EXPECT_EQ(parsedXml("<data>D713HCc1rg==</data>"), Value("<0fbd771c2735ae>"));
 }
 
@@ -65,6 +67,24 @@ TEST(PropertyListTest, AnythingElseIsTakenForText) {
 TEST(PropertyListTest, DamageIsTold) {
     EXPECT_EQ(errorOf("<plist><dict>"), "a damaged XML property list");
     EXPECT_EQ(errorOf("bplist00"), kBadBinary);
+}
+
+TEST(PropertyListTest, ReferencesOfArchivesAreNoValues) {
+    std::string bytes = "bplist00\x80\x01"; // object 0, at 8
+    bytes += '\x08';                        // the table of objects, at 10
+    std::string trailer(32, '\0');
+    trailer[6] = trailer[7] = trailer[15] = 1; // bytes of an offset, of a number; objects
+    trailer[31] = 10;
+    EXPECT_EQ(errorOf(bytes + trailer), "a value of unknown type");
+}
+
+TEST(PropertyListTest, ErrorsSayWhoseTheyAre) {
+    for (const char* const bytes : {"<plist><dict>", "bplist00"}) {
+        const auto result = parsePropertyList(bytes);
+        const auto& error = std::get<Error>(result);
+        EXPECT_EQ(error.domain, kPropertyListErrorDomain);
+        EXPECT_EQ(error.code, 1);
+    }
 }
 
 TEST(PropertyListTest, DepthAndSizeAreBounded) {
