@@ -6,6 +6,7 @@
 #include <string_view>
 
 #include "Require.h"
+#include "linux/config/Quantities.h"
 #include "linux/config/Settings.h"
 
 using halyard::fuzz::require;
