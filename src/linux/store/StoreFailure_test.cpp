@@ -189,8 +189,25 @@ TEST_F(StoreFailureTest, ARowThatIsRefusedForItselfIsLostAlone) {
     EXPECT_EQ(reader().rows("SELECT id, metric_id FROM metric"),
               (std::vector<std::string>{"1|1", "2|3"}));
     EXPECT_EQ(lost(StoreLoss::Rejected), 1U);
-    EXPECT_EQ(log_.count("the store rejected 1 rows", LogLevel::Error), 1U);
+    EXPECT_EQ(log_.count("the store rejected 1 rows: not this one", LogLevel::Error), 1U);
     EXPECT_FALSE(store_->status().failing);
+}
+
+TEST_F(StoreFailureTest, WhyAFileInItsPlaceIsNotTakenIsTold) {
+    open();
+    addSingles(1, {});
+    flush();
+    for (const char* end : {"", "-wal", "-shm"}) {
+        std::filesystem::remove(options_.path.string() + end);
+    }
+    reader().rows("PRAGMA user_version = 2");
+    addSingles(1, {});
+    store_->flush([] {});
+    EXPECT_NE(log_.waitFor("cannot write").find("its schema is newer than this program"),
+              std::string::npos);
+    std::filesystem::remove(options_.path);
+    flush();
+    EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 1);
 }
 
 TEST_F(StoreFailureTest, AFailedGroupIsRolledBackWhole) {
