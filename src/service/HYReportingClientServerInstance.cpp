@@ -7,6 +7,7 @@
 #include "platform/HYReportingUtilityDevice.h"
 #include "platform/Log.h"
 #include "platform/Platform.h"
+#include "platform/QueueCheck.h"
 #include "platform/TraceMarks.h"
 #include "service/MessageFanOut.h"
 
@@ -76,6 +77,7 @@ void HYReportingClientServerInstance::createReportingSession(std::int64_t report
 }
 
 void HYReportingClientServerInstance::create(Delegate& delegate, std::int64_t reporterID) {
+    HY_ASSERT_ON_QUEUE(serviceQueue_);
     HY_LOG_DEBUG(HYReportingClientCategory, "creating session for reporter {}", reporterID);
     mark(kCreateMark);
     auto session = HYReportingSession::initWithID(reporterID, {pid_});
@@ -142,6 +144,7 @@ void HYReportingClientServerInstance::startReportingSessionForID(std::int64_t re
 
 void HYReportingClientServerInstance::start(Delegate& delegate, std::int64_t reporterID,
                                             const BoolReply& reply) {
+    HY_ASSERT_ON_QUEUE(serviceQueue_);
     HY_LOG_DEBUG(HYReportingClientCategory, "starting session for reporter {}", reporterID);
     mark(kStartMark);
     const auto session = findReportingSessionForID(delegate, reporterID, false);
@@ -187,6 +190,7 @@ MaybeError
 HYReportingClientServerInstance::send(Delegate& delegate, Message message,
                                       const std::optional<std::vector<std::int64_t>>& reporterIDs,
                                       const std::optional<std::string>& processName) {
+    HY_ASSERT_ON_QUEUE(serviceQueue_);
     MessageFanOut fanOut(delegate, std::move(message), processName);
     return fanOut.route(reporterIDs, [&](std::int64_t reporterID) {
         return findReportingSessionForID(delegate, reporterID, true);
@@ -202,6 +206,7 @@ void HYReportingClientServerInstance::stopReportingSessionForID(std::int64_t rep
 }
 
 void HYReportingClientServerInstance::stop(Delegate& delegate, std::int64_t reporterID) {
+    HY_ASSERT_ON_QUEUE(serviceQueue_);
     HY_LOG_DEBUG(HYReportingClientCategory, "stopping session for reporter {}", reporterID);
     mark(kStopMark);
     if (reporterID == 0) {
@@ -230,6 +235,7 @@ void HYReportingClientServerInstance::destroyReportingSession(std::int64_t repor
 }
 
 void HYReportingClientServerInstance::destroy(Delegate& delegate, std::int64_t reporterID) {
+    HY_ASSERT_ON_QUEUE(serviceQueue_);
     HY_LOG_DEBUG(HYReportingClientCategory, "destroying session for reporter {}", reporterID);
     mark(kDestroyMark);
     if (reporterID == 0) {
@@ -291,6 +297,7 @@ void HYReportingClientServerInstance::handleConnectionError() {
 }
 
 void HYReportingClientServerInstance::leave(Delegate& delegate) {
+    HY_ASSERT_ON_QUEUE(serviceQueue_);
     const auto clients = delegate.getAllClients();
     if (std::none_of(clients.begin(), clients.end(),
                      [this](const auto& client) { return client.get() == this; })) {

@@ -177,7 +177,8 @@ TEST_F(HYReportingClientServerInstanceTest, AStopTellsWhoIsLeft) {
 TEST_F(HYReportingClientServerInstanceTest, AStartAnswersTheEarlierStartThatIsStillHeld) {
     client_.create(7);
     const auto earlier = client_.start(7);
-    session(7)->stop(); // Not by a request, which would answer it.
+    // Not by a request, which would answer it.
+    onServiceQueue([&] { session(7)->stop(); });
     const auto later = client_.start(7);
     EXPECT_TRUE(succeeded(earlier));
     EXPECT_FALSE(later->given());

@@ -10,6 +10,7 @@
 #include "platform/HYReportingUtilityDevice.h"
 #include "platform/Log.h"
 #include "platform/Platform.h"
+#include "platform/QueueCheck.h"
 #include "service/HYReportingClientServerInstance.h"
 #include "service/MessageFanOut.h"
 #include "service/RequestDispatch.h"
@@ -78,6 +79,7 @@ void HYReportingServiceDelegate::listenForFeatureStateChanges() {
 }
 
 void HYReportingServiceDelegate::featureChanged(int token) {
+    HY_ASSERT_ON_QUEUE(serviceQueue_);
     HY_LOG_INFO(HYReportingServiceDelegateCategory, "feature {} changes", token);
     const auto state = getFeaturesState();
     HY_LOG_INFO(HYReportingServiceDelegateCategory, "defaults {}", state ? Value(*state) : Value());
@@ -109,10 +111,7 @@ bool HYReportingServiceDelegate::shouldAcceptNewConnection(
     connection->setExportedObject(
         std::make_shared<RequestDispatch>(client, weak_from_this(), serviceQueue_));
     serviceQueue_->async([self = shared_from_this(), client] {
-        {
-            const MutexLock lock(self->monitor_);
-            self->clients_.push_back(client);
-        }
+        self->addClient(client);
         client->setIdentity(platform::current().clock->wallTime(),
                             HYReportingUtilityProcessNameForPID(client->processIdentifier()));
     });
@@ -163,10 +162,18 @@ std::vector<HYReportingServiceDelegate::Client> HYReportingServiceDelegate::getA
 }
 
 void HYReportingServiceDelegate::sessionRetired(const HYReportingSession& session) {
+    HY_ASSERT_ON_QUEUE(serviceQueue_);
     repeatsOfRetiredSessions_ += session.redundantMessages();
 }
 
+void HYReportingServiceDelegate::addClient(const Client& client) {
+    HY_ASSERT_ON_QUEUE(serviceQueue_);
+    const MutexLock lock(monitor_);
+    clients_.push_back(client);
+}
+
 void HYReportingServiceDelegate::removeClient(const HYReportingClientServerInstance& client) {
+    HY_ASSERT_ON_QUEUE(serviceQueue_);
     const MutexLock lock(monitor_);
     std::erase_if(clients_, [&](const Client& each) { return each.get() == &client; });
 }
@@ -190,6 +197,11 @@ HYReportingServiceDelegate::findReportingSessionForID(std::int64_t reporterID) c
     return nullptr;
 }
 
+void HYReportingServiceDelegate::setActiveSessionCount(std::int64_t count) {
+    HY_ASSERT_ON_QUEUE(serviceQueue_);
+    activeSessionCount_.store(count);
+}
+
 std::vector<HYReportingServiceDelegate::Session>
 HYReportingServiceDelegate::getAllActiveReportingSessions() const {
     std::vector<Session> active;
@@ -204,10 +216,12 @@ HYReportingServiceDelegate::getAllActiveReportingSessions() const {
 }
 
 platform::DriverSnapshotRef HYReportingServiceDelegate::getSnapShot() {
+    HY_ASSERT_ON_QUEUE(serviceQueue_);
     return driverUtility_->getSnapShot();
 }
 
 void HYReportingServiceDelegate::sendDriverLogsForSession(const Session& session) {
+    HY_ASSERT_ON_QUEUE(serviceQueue_);
     driverUtility_->sendDriverLogsForSession(session);
 }
 
@@ -215,6 +229,7 @@ void HYReportingServiceDelegate::handleEventForIBX(const Dictionary& message,
                                                    AudioEventCategory category, AudioEventType type,
                                                    const Session& session,
                                                    const std::optional<std::string>& processName) {
+    HY_ASSERT_ON_QUEUE(serviceQueue_);
     sinks_.captureIssue({message, category, type}, session, processName);
 }
 

@@ -52,7 +52,7 @@ public:
                            AudioEventType type, const Session& session,
                            const std::optional<std::string>& processName) override;
     std::int64_t activeSessionCount() const override { return activeSessionCount_.load(); }
-    void setActiveSessionCount(std::int64_t count) override { activeSessionCount_.store(count); }
+    void setActiveSessionCount(std::int64_t count) override;
 
     // The master switch, which nothing in the daemon ever turns off.
     void setReportingEnabled(bool enabled) { reportingEnabled_ = enabled; }
@@ -69,6 +69,7 @@ private:
 
     void listenForFeatureStateChanges();
     void featureChanged(int token);
+    void addClient(const Client& client) HY_EXCLUDES(monitor_);
     // The client may be gone already.
     static void reportUptime(std::int32_t pid, const HYReportingClientServerInstance* client);
 

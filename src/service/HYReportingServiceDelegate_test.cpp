@@ -267,9 +267,23 @@ TEST_F(HYReportingServiceDelegateTest, RemovingAStrangerIsNoError) {
     const Peer peer = connect(100);
     const auto stranger =
         HYReportingClientServerInstance::initWithPID(100, service_, service_->serviceQueue());
-    service_->removeClient(*stranger);
+    onServiceQueue([&] { service_->removeClient(*stranger); });
     EXPECT_THAT(service_->getAllClients(), SizeIs(1));
 }
+
+#ifndef NDEBUG
+using HYReportingServiceDelegateDeathTest = HYReportingServiceDelegateTest;
+
+TEST_F(HYReportingServiceDelegateDeathTest, TheClientListChangesOnTheServiceQueueOnly) {
+    const Peer peer = connect(100);
+    EXPECT_DEATH(service_->removeClient(*service_->getAllClients().front()), "isCurrent");
+}
+
+TEST_F(HYReportingServiceDelegateDeathTest, SessionsStopOnTheServiceQueueOnly) {
+    connect(100).createAndStart(7);
+    EXPECT_DEATH(session(7)->stop(), "madeOn_");
+}
+#endif
 
 } // namespace
 } // namespace halyard

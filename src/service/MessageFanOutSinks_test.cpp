@@ -192,9 +192,11 @@ TEST_F(InternalFanOutTest, ASenderWithoutANameIsCapturedWithoutOne) {
 
 TEST_F(InternalFanOutTest, TheServiceObjectOffersToIssueCaptureAlone) {
     for (const int seconds : {1, 2}) {
-        service_->handleEventForIBX({{"Haptic_Active_Hardware_Time_Seconds", seconds}},
-                                    kAudioEventCategoryPlayback, kAudioEventTypeEnergyLedger,
-                                    session(7), "leaker");
+        onServiceQueue([&] {
+            service_->handleEventForIBX({{"Haptic_Active_Hardware_Time_Seconds", seconds}},
+                                        kAudioEventCategoryPlayback, kAudioEventTypeEnergyLedger,
+                                        session(7), "leaker");
+        });
     }
     EXPECT_THAT(platform_.incidentReporter.requests, SizeIs(1));
     EXPECT_THAT(platform_.energyLedger.events, IsEmpty());

@@ -254,7 +254,8 @@ TEST_F(RequestDispatchTest, AStatusThatWaitsLooksAgainEverySecond) {
     answer = tester.ask(Method::AdminStatus);
     platform_.queues.advance(std::chrono::seconds(3));
     EXPECT_FALSE(answer->given()) << "no stop waits yet";
-    session(7)->stop();
+    ASSERT_TRUE(service_->serviceQueue()->resume([&] { session(7)->stop(); }));
+    run();
     EXPECT_EQ(answer->count, 1);
     EXPECT_EQ(platform_.queues.queuesMade("com.kestrel.halyard.status"), 1U);
 }

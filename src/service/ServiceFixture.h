@@ -99,6 +99,11 @@ protected:
     }
 
     void run() { platform_.queues.runUntilIdle(); }
+    // For what belongs there and no request asks for.
+    void onServiceQueue(platform::Task task) {
+        service_->serviceQueue()->async(std::move(task));
+        run();
+    }
     // The session of the client that connected first, second, ...
     std::shared_ptr<HYReportingSession> session(std::int64_t id, std::size_t client = 0) const {
         return service_->getAllClients().at(client)->ownSession(id);

@@ -107,6 +107,7 @@ void HYReportingSession::setDriverSnapShot(platform::DriverSnapshotRef snapshot)
 }
 
 void HYReportingSession::start() {
+    onServiceQueue_.check();
     HY_LOG_DEBUG(HYReportingSessionCategory, "starting session owned by {}", reporterID_);
     if (started()) {
         HY_LOG_INFO(HYReportingSessionCategory, "{} is already started", reporterID_);
@@ -122,6 +123,7 @@ void HYReportingSession::start() {
 }
 
 void HYReportingSession::stop() {
+    onServiceQueue_.check();
     HY_LOG_DEBUG(HYReportingSessionCategory, "ending session {}", reporterID_);
     if (!started()) {
         return;
@@ -187,6 +189,7 @@ void HYReportingSession::sendSummaryEvent() {
 
 void HYReportingSession::sendMessage(Dictionary message, AudioEventCategory category,
                                      AudioEventType type, bool /*sync*/, const SendReply& reply) {
+    onServiceQueue_.check();
     HY_LOG_DEBUG(HYReportingSessionCategory, "sending message for session owned by {}",
                  reporterID_);
     auto original = platform::logEnabled(LogLevel::Debug) ? std::optional(message) : std::nullopt;

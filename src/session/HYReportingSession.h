@@ -21,6 +21,7 @@
 #include "common/Value.h"
 #include "platform/Clock.h"
 #include "platform/HWReport.h"
+#include "platform/QueueCheck.h"
 #include "session/SessionBatch.h"
 #include "session/SingleMessage.h"
 #include "session/TraceControl.h"
@@ -129,6 +130,9 @@ private:
 
     void sendVolumeEvents();
     void sendSummaryEvent();
+
+    // Where sessions are made and, but for what is for any thread, used.
+    const platform::SameQueue onServiceQueue_;
 
     const std::int64_t reporterID_;
     const std::vector<std::int32_t> processIdentifiers_;
