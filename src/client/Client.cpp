@@ -139,10 +139,11 @@ bool Client::countSession() noexcept {
 
 halyard_result Client::flush(std::chrono::milliseconds timeout) {
     const std::uint64_t target = ring_.end();
-    std::unique_lock lock(flushMutex_);
+    const MutexLock lock(flushMutex_);
     flushWaiters_.fetch_add(1);
     wakeUp_.notify(0, true);
-    const bool done = flushed_.wait_for(lock, timeout, [&] { return announced_.load() >= target; });
+    const bool done =
+        flushed_.wait_for(flushMutex_, timeout, [&] { return announced_.load() >= target; });
     flushWaiters_.fetch_sub(1);
     return done ? HALYARD_OK : HALYARD_TIMED_OUT;
 }
@@ -150,7 +151,7 @@ halyard_result Client::flush(std::chrono::milliseconds timeout) {
 void Client::announceReleased() {
     announced_.store(ring_.releasedTo());
     if (flushWaiters_.load() != 0) {
-        const std::lock_guard lock(flushMutex_);
+        const MutexLock lock(flushMutex_);
         flushed_.notify_all();
     }
 }

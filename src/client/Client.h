@@ -12,7 +12,6 @@
 #include <condition_variable>
 #include <cstdint>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <vector>
 
@@ -21,6 +20,7 @@
 #include "client/Record.h"
 #include "client/TimeStamps.h"
 #include "client/WakeUp.h"
+#include "common/Mutex.h"
 
 namespace halyard::client {
 
@@ -134,8 +134,8 @@ private:
     SteadyTime closingDeadline_; // Written before closing_.
     bool leftovers_ = false;     // Read when the thread has ended.
 
-    std::mutex flushMutex_;
-    std::condition_variable flushed_;
+    Mutex flushMutex_; // Orders what is announced with who waits; guards nothing else.
+    std::condition_variable_any flushed_;
     std::atomic<std::uint32_t> flushWaiters_{0};
     std::atomic<std::uint64_t> announced_{0};
 };

@@ -24,7 +24,7 @@ std::uint32_t forkGeneration() noexcept {
 // All connections of the process. Never destroyed: clients may outlive static
 // objects.
 struct ForkRegistry {
-    std::mutex mutex;
+    std::mutex mutex; // A fork holds it from one callback to the next, which no analysis follows.
     std::vector<Connection*> connections;
 
     static ForkRegistry& instance() {

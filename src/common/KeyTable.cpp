@@ -1,15 +1,14 @@
 #include "common/KeyTable.h"
 
-#include <mutex>
-
+#include "common/Mutex.h"
 #include "common/ValueBlocks.h"
 
 namespace halyard {
 namespace {
 
 struct SharedKeys {
-    std::mutex mutex;
-    std::unordered_map<std::string_view, Value> keys;
+    Mutex mutex;
+    std::unordered_map<std::string_view, Value> keys HY_GUARDED_BY(mutex);
 };
 
 SharedKeys& sharedKeys() {
@@ -27,7 +26,7 @@ Value KeyTable::intern(std::string_view key) {
         return known->second;
     }
     SharedKeys& shared = sharedKeys();
-    const std::lock_guard lock(shared.mutex);
+    const MutexLock lock(shared.mutex);
     auto at = shared.keys.find(key);
     if (at == shared.keys.end()) {
         if (shared.keys.size() >= kMaxKeys) {

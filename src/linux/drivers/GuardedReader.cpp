@@ -1,8 +1,12 @@
 #include "linux/drivers/GuardedReader.h"
 
 #include <algorithm>
+#include <condition_variable>
+#include <optional>
 #include <pthread.h>
+#include <utility>
 
+#include "common/Mutex.h"
 #include "linux/queues/BlockingSection.h"
 
 namespace halyard::linux_ {
@@ -16,36 +20,91 @@ Reading stuckReading() {
 
 } // namespace
 
+// Where the caller hands sources to a thread, and gets readings back.
+//
+// Whoever leaves it leaves it to the thread, which may come back at any time or
+// never: a reading that is there then says that it has.
+struct GuardedReader::Desk {
+    struct Job {
+        std::shared_ptr<ChannelSource> source;
+        platform::SteadyTime now;
+    };
+
+    // The caller's. Readings of the first sources: of all, or of those in time.
+    std::vector<Reading> read(Sources wanted, platform::SteadyTime at,
+                              std::chrono::milliseconds patience) HY_EXCLUDES(mutex);
+    void leave() HY_EXCLUDES(mutex);
+    bool isThreadBack() HY_EXCLUDES(mutex);
+
+    // The thread's. No job, and the thread is back, when it has been left.
+    std::optional<Job> takeJob() HY_EXCLUDES(mutex);
+    void hand(Reading reading) HY_EXCLUDES(mutex);
+
+    Mutex mutex;
+    std::condition_variable_any changed;
+    Sources sources HY_GUARDED_BY(mutex);
+    std::vector<Reading> readings HY_GUARDED_BY(mutex); // of the first sources
+    platform::SteadyTime now HY_GUARDED_BY(mutex);
+    bool left HY_GUARDED_BY(mutex) = false;
+    bool threadIsBack HY_GUARDED_BY(mutex) = false;
+};
+
+std::vector<Reading> GuardedReader::Desk::read(Sources wanted, platform::SteadyTime at,
+                                               std::chrono::milliseconds patience) {
+    const BlockingSection blocking;
+    const MutexLock lock(mutex);
+    sources = std::move(wanted);
+    readings.clear();
+    now = at;
+    changed.notify_all();
+    const auto until = std::chrono::steady_clock::now() + patience;
+    while (readings.size() < sources.size() &&
+           changed.wait_until(mutex, until) != std::cv_status::timeout) {
+    }
+    left = readings.size() < sources.size();
+    sources.clear();
+    return std::exchange(readings, {});
+}
+
+void GuardedReader::Desk::leave() {
+    const MutexLock lock(mutex);
+    left = true;
+    changed.notify_all();
+}
+
+bool GuardedReader::Desk::isThreadBack() {
+    const MutexLock lock(mutex);
+    return threadIsBack;
+}
+
+std::optional<GuardedReader::Desk::Job> GuardedReader::Desk::takeJob() {
+    const MutexLock lock(mutex);
+    while (!left && readings.size() == sources.size()) {
+        changed.wait(mutex);
+    }
+    threadIsBack = left;
+    return left ? std::nullopt : std::optional(Job{sources[readings.size()], now});
+}
+
+void GuardedReader::Desk::hand(Reading reading) {
+    const MutexLock lock(mutex);
+    readings.push_back(std::move(reading));
+    if (readings.size() == sources.size()) {
+        changed.notify_all();
+    }
+}
+
 GuardedReader::~GuardedReader() {
     if (thread_.joinable()) {
-        {
-            const std::lock_guard lock(desk_->mutex);
-            desk_->left = true;
-        }
-        desk_->changed.notify_all();
+        desk_->leave();
         const BlockingSection blocking;
         thread_.join();
     }
 }
 
 void GuardedReader::work(const std::shared_ptr<Desk>& desk) {
-    std::unique_lock lock(desk->mutex);
-    for (;;) {
-        desk->changed.wait(
-            lock, [&] { return desk->left || desk->readings.size() < desk->sources.size(); });
-        if (desk->left) {
-            desk->readings.emplace_back(); // Tells that no source is in use here.
-            return;
-        }
-        const auto source = desk->sources[desk->readings.size()];
-        const auto now = desk->now;
-        lock.unlock();
-        Reading reading = source->read(now);
-        lock.lock();
-        desk->readings.push_back(std::move(reading));
-        if (desk->left || desk->readings.size() == desk->sources.size()) {
-            desk->changed.notify_all();
-        }
+    while (auto job = desk->takeJob()) {
+        desk->hand(job->source->read(job->now));
     }
 }
 
@@ -64,10 +123,7 @@ void GuardedReader::leaveThread(const std::shared_ptr<ChannelSource>& source) {
 }
 
 void GuardedReader::forgetThoseThatCameBack() {
-    std::erase_if(stuck_, [](const Stuck& each) {
-        const std::lock_guard lock(each.desk->mutex);
-        return !each.desk->readings.empty();
-    });
+    std::erase_if(stuck_, [](const Stuck& each) { return each.desk->isThreadBack(); });
 }
 
 bool GuardedReader::isStuck(const ChannelSource& source) const {
@@ -89,28 +145,17 @@ std::vector<Reading> GuardedReader::read(std::span<const std::shared_ptr<Channel
         if (desk_ == nullptr) {
             startThread();
         }
-        std::unique_lock lock(desk_->mutex);
-        desk_->now = now;
-        desk_->readings.clear();
-        desk_->sources.clear();
+        Sources wanted;
         for (const std::size_t place : waiting) {
-            desk_->sources.push_back(sources[place]);
+            wanted.push_back(sources[place]);
         }
-        desk_->changed.notify_all();
-        const BlockingSection blocking;
-        const bool inTime = desk_->changed.wait_for(
-            lock, patience_, [&] { return desk_->readings.size() == waiting.size(); });
-        const std::size_t done = desk_->readings.size();
-        for (std::size_t i = 0; i < done; ++i) {
-            result[waiting[i]] = std::move(desk_->readings[i]);
+        std::vector<Reading> readings = desk_->read(std::move(wanted), now, patience_);
+        for (std::size_t i = 0; i < readings.size(); ++i) {
+            result[waiting[i]] = std::move(readings[i]);
         }
-        waiting.erase(waiting.begin(), waiting.begin() + static_cast<std::ptrdiff_t>(done));
-        if (!inTime) {
-            // Only the reading that is under way is still awaited there.
-            desk_->left = true;
-            desk_->readings.clear();
-            desk_->sources.resize(1);
-            lock.unlock();
+        waiting.erase(waiting.begin(),
+                      waiting.begin() + static_cast<std::ptrdiff_t>(readings.size()));
+        if (!waiting.empty()) {
             leaveThread(sources[waiting.front()]);
             waiting.erase(waiting.begin());
         }

@@ -10,10 +10,8 @@
 #pragma once
 
 #include <chrono>
-#include <condition_variable>
 #include <cstddef>
 #include <memory>
-#include <mutex>
 #include <span>
 #include <thread>
 #include <vector>
@@ -38,16 +36,8 @@ public:
                               platform::SteadyTime now);
 
 private:
-    // What the caller hands to a thread, and gets back; guarded by `mutex`.
-    struct Desk {
-        std::mutex mutex;
-        std::condition_variable changed;
-        std::vector<std::shared_ptr<ChannelSource>> sources;
-        std::vector<Reading> readings; // of the first sources
-        platform::SteadyTime now;
-        // Nobody comes back: a reading from now on says that the thread is done.
-        bool left = false;
-    };
+    using Sources = std::vector<std::shared_ptr<ChannelSource>>;
+    struct Desk;
     struct Stuck {
         std::shared_ptr<Desk> desk;
         std::shared_ptr<ChannelSource> source;

@@ -1,5 +1,6 @@
 #include "linux/system/LogWriter.h"
 
+#include <algorithm>
 #include <chrono>
 #include <condition_variable>
 #include <csignal>
@@ -7,7 +8,7 @@
 #include <cstring>
 #include <deque>
 #include <fmt/format.h>
-#include <mutex>
+#include <iterator>
 #include <pthread.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
@@ -19,6 +20,7 @@
 #define SD_JOURNAL_SUPPRESS_LOCATION
 #include <systemd/sd-journal.h>
 
+#include "common/Mutex.h"
 #include "linux/queues/BlockingSection.h"
 
 namespace halyard::linux_ {
@@ -147,15 +149,50 @@ std::string standardErrorLine(const LogRecord& record) {
 }
 
 struct LogWriter::State {
-    std::mutex mutex;
-    std::condition_variable changed;
-    std::deque<LogRecord> queued;
-    std::deque<LogRecord> recent;
-    std::size_t queuedBytes = 0;
-    std::uint64_t untoldDrops = 0;
-    bool writing = false;
-    bool stopping = false;
+    // All that waits to be written, once there is some; nothing at the end.
+    std::deque<LogRecord> take() HY_EXCLUDES(mutex);
+    void written(std::deque<LogRecord> records) HY_EXCLUDES(mutex);
+    bool isIdleLocked() const HY_REQUIRES(mutex) { return queued.empty() && !writing; }
+
+    Mutex mutex;
+    std::condition_variable_any changed;
+    std::deque<LogRecord> queued HY_GUARDED_BY(mutex);
+    std::deque<LogRecord> recent HY_GUARDED_BY(mutex);
+    std::size_t queuedBytes HY_GUARDED_BY(mutex) = 0;
+    std::uint64_t untoldDrops HY_GUARDED_BY(mutex) = 0;
+    bool writing HY_GUARDED_BY(mutex) = false;
+    bool stopping HY_GUARDED_BY(mutex) = false;
 };
+
+std::deque<LogRecord> LogWriter::State::take() {
+    const MutexLock lock(mutex);
+    while (!stopping && queued.empty()) {
+        changed.wait(mutex);
+    }
+    if (queued.empty()) {
+        return {};
+    }
+    std::deque<LogRecord> taken = std::exchange(queued, {});
+    queuedBytes = 0;
+    writing = true;
+    if (const auto drops = std::exchange(untoldDrops, 0); drops > 0) {
+        taken.push_back(
+            {LogLevel::Error, std::string(HYReportingPlatformCategory),
+             fmt::format("{:>25}:{:<5} {} messages dropped", "LogWriter.cpp", __LINE__, drops),
+             "LogWriter.cpp", __LINE__, __func__});
+    }
+    return taken;
+}
+
+void LogWriter::State::written(std::deque<LogRecord> records) {
+    const MutexLock lock(mutex);
+    writing = false;
+    std::move(records.begin(), records.end(), std::back_inserter(recent));
+    while (recent.size() > kRecentLines) {
+        recent.pop_front();
+    }
+    changed.notify_all();
+}
 
 LogWriter::Output LogWriter::defaultOutput() {
     if (leadsToJournal(STDERR_FILENO)) {
@@ -175,14 +212,13 @@ LogWriter::LogWriter(Output output)
 
 LogWriter::~LogWriter() {
     flush();
+    bool stuck = false;
     {
-        const std::lock_guard lock(state_->mutex);
+        const MutexLock lock(state_->mutex);
         state_->stopping = true;
+        stuck = state_->writing;
+        state_->changed.notify_all();
     }
-    state_->changed.notify_all();
-    std::unique_lock lock(state_->mutex);
-    const bool stuck = state_->writing;
-    lock.unlock();
     if (stuck) {
         thread_.detach();
     } else {
@@ -194,7 +230,7 @@ void LogWriter::write(const platform::LogLine& line) {
     LogRecord record{line.level,       std::string(line.category),
                      logMessage(line), std::string(line.file),
                      line.line,        std::string(line.function)};
-    const std::lock_guard lock(state_->mutex);
+    const MutexLock lock(state_->mutex);
     if (state_->queuedBytes + cost(record) > kMaxQueuedBytes) {
         ++state_->untoldDrops;
         dropped_.fetch_add(1, std::memory_order_relaxed);
@@ -208,46 +244,25 @@ void LogWriter::write(const platform::LogLine& line) {
 }
 
 void LogWriter::run(const std::shared_ptr<State>& state, const Output& output) {
-    std::unique_lock lock(state->mutex);
-    for (;;) {
-        state->changed.wait(lock, [&] { return state->stopping || !state->queued.empty(); });
-        if (state->queued.empty()) {
-            return;
-        }
-        std::deque<LogRecord> taken = std::exchange(state->queued, {});
-        state->queuedBytes = 0;
-        if (const auto drops = std::exchange(state->untoldDrops, 0); drops > 0) {
-            taken.push_back(
-                {LogLevel::Error, std::string(HYReportingPlatformCategory),
-                 fmt::format("{:>25}:{:<5} {} messages dropped", "LogWriter.cpp", __LINE__, drops),
-                 "LogWriter.cpp", __LINE__, __func__});
-        }
-        state->writing = true;
-        lock.unlock();
-        for (const LogRecord& record : taken) {
+    for (auto records = state->take(); !records.empty(); records = state->take()) {
+        for (const LogRecord& record : records) {
             output(record);
         }
-        lock.lock();
-        state->writing = false;
-        for (LogRecord& record : taken) {
-            state->recent.push_back(std::move(record));
-        }
-        while (state->recent.size() > kRecentLines) {
-            state->recent.pop_front();
-        }
-        state->changed.notify_all();
+        state->written(std::move(records));
     }
 }
 
 void LogWriter::flush() {
     const BlockingSection blocking;
-    std::unique_lock lock(state_->mutex);
-    (void)state_->changed.wait_for(lock, kFlushLimit,
-                                   [&] { return state_->queued.empty() && !state_->writing; });
+    const MutexLock lock(state_->mutex);
+    const auto until = std::chrono::steady_clock::now() + kFlushLimit;
+    while (!state_->isIdleLocked() &&
+           state_->changed.wait_until(state_->mutex, until) != std::cv_status::timeout) {
+    }
 }
 
 std::vector<std::string> LogWriter::recentLines() const {
-    const std::lock_guard lock(state_->mutex);
+    const MutexLock lock(state_->mutex);
     std::vector<std::string> lines;
     for (const LogRecord& record : state_->recent) {
         lines.push_back(standardErrorLine(record));

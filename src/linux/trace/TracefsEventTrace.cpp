@@ -6,12 +6,12 @@
 #include <charconv>
 #include <chrono>
 #include <condition_variable>
-#include <mutex>
 #include <system_error>
 #include <thread>
 #include <unistd.h>
 #include <utility>
 
+#include "common/Mutex.h"
 #include "linux/queues/BlockingSection.h"
 #include "linux/system/SmallFile.h"
 #include "linux/trace/MarkLibraries.h"
@@ -99,9 +99,9 @@ private:
     std::uint64_t refused_ = 0;
     std::atomic<std::uint64_t> lost_{0};
 
-    std::mutex stopMutex_;
-    std::condition_variable stopChanged_;
-    bool stopRequested_ = false; // under stopMutex_
+    Mutex stopMutex_;
+    std::condition_variable_any stopChanged_;
+    bool stopRequested_ HY_GUARDED_BY(stopMutex_) = false;
     std::thread drainer_;
 };
 
@@ -160,14 +160,18 @@ void TracefsSession::end() {
 }
 
 void TracefsSession::requestStop() {
-    const std::lock_guard lock(stopMutex_);
+    const MutexLock lock(stopMutex_);
     stopRequested_ = true;
     stopChanged_.notify_one();
 }
 
 bool TracefsSession::waitForStop() {
-    std::unique_lock lock(stopMutex_);
-    return stopChanged_.wait_for(lock, kDrainPeriod, [this] { return stopRequested_; });
+    const MutexLock lock(stopMutex_);
+    const auto until = std::chrono::steady_clock::now() + kDrainPeriod;
+    while (!stopRequested_ &&
+           stopChanged_.wait_until(stopMutex_, until) != std::cv_status::timeout) {
+    }
+    return stopRequested_;
 }
 
 void TracefsSession::drain() {
