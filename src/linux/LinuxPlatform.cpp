@@ -176,6 +176,12 @@ void LinuxPlatform::serve() {
     listener_->resume();
 }
 
+// The end, in the order in which work comes in: nobody new, then no connection
+// (which stops its sessions, as when it is lost, and so leaves their last
+// deliveries), then everything that is on its way, down to the disk. Only then does
+// the loop stop that draining needs for its timers. What a hanging disk or a
+// session's back ends may take is bounded where they are waited for; the limit here
+// is for what nobody has thought of.
 void LinuxPlatform::beginShutdown() {
     if (std::exchange(stopping_, true)) {
         return;
