@@ -53,7 +53,7 @@ constexpr std::array kTypeNames = {
     "Summary"sv,
     "HeadphoneAudioExposure"sv,
     "AudioExposure"sv,
-    "Listeningenhancement"sv, // With this small letter in all reports out there.
+    "Listeningenhancement"sv, // Kept: the small letter is in all reports out there.
     "Gaugewell"sv,
     "Simple"sv,
     "Histogram"sv,
@@ -104,6 +104,7 @@ std::string_view HYReportingUtilityGenerateServiceNameFromServiceType(AudioServi
     if (type == kAudioServiceTypeUnknown) {
         return kUnknownServiceName;
     }
+    // Kept: an unlisted type is called as type 2 is, by all who read the name.
     return kServiceNames[type < kServiceNames.size() ? type : kAudioServiceTypeTelephony];
 }
 
@@ -120,6 +121,7 @@ CategoryName categoryName(AudioEventCategory category) noexcept {
     if (!isGrouped(category)) {
         return {{}, {}, name};
     }
+    // Kept: the "_" also stands where the group has no name.
     return {groupName(category), "_", name};
 }
 
@@ -215,6 +217,7 @@ std::optional<std::string> HYReportingUtilityBucketNumberToString(double value,
     std::optional<double> chosen;
     for (const double bucket : buckets) {
         const double distance = std::abs(value - bucket);
+        // Kept: an equal distance does not stop, so of two the larger bucket counts.
         if (previousDistance >= 0 && distance > previousDistance) {
             break;
         }

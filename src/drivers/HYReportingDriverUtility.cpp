@@ -42,7 +42,7 @@ HWReportSamplesRef sample(const HYReportingIOChannelSubscription& subscription,
     return std::move(result.value);
 }
 
-// A failed delta reads the same as failed samples.
+// Kept: a failed delta reads the same as failed samples.
 void logSamplesError(const std::optional<platform::HWReportError>& error) {
     if (error) {
         HY_LOG_ERROR(HYReportingDriverUtilityCategory, "HWReportCreateSamples error {}",
@@ -98,10 +98,11 @@ void HYReportingDriverUtility::subscribeTo(const std::shared_ptr<HYReportingDriv
     }
     const auto subscribed = library.createSubscription(*listed.value);
     HYReportingIOChannelSubscription subscription(driver);
+    // Kept: taken unchecked; without a subscription there are no samples.
     subscription.setSubscription(subscribed.subscription);
     subscription.setSubscribedChannels(subscribed.channels);
     ioChannelSubscriptions_.push_back(std::move(subscription));
-    // "group group" is what this line has always said; people search for it.
+    // Kept: readers of the log search for "group group".
     HY_LOG_INFO(HYReportingDriverUtilityCategory, "subscribed to group group {}-{}", orNull(group),
                 orNull(subGroup));
 }
@@ -241,7 +242,8 @@ void HYReportingDriverUtility::processStateData(const HWReportChannel& channel,
         }
     }
     HY_LOG_DEBUG(HYReportingDriverUtilityCategory, "the current reported data is : {}", text);
-    // Also without a resident state: that the channel was there is told as well.
+    // Kept: also without a resident state, unlike the other formats. That the channel
+    // was there is told as well.
     driverStats.set(getDriverStatsKey(channel, "State"), text);
 }
 

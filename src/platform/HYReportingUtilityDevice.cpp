@@ -51,6 +51,7 @@ bool HYReportingUtilityWait(platform::Condition& condition, double timeout, cons
     const std::lock_guard lock(condition);
     while (!*done) {
         HY_LOG_INFO(category, "{}", waitMessage);
+        // Kept: each wake-up grants the whole time again.
         if (!condition.waitFor(nanosecondsOf(timeout))) {
             HY_LOG_ERROR(category, "{}", timeoutMessage);
             return false;

@@ -99,6 +99,7 @@ void HYReportingClientServerInstance::setServiceType(AudioServiceType type, std:
                      reporterID);
         if (const auto session = self.findReportingSessionForID(delegate, reporterID, false)) {
             session->setServiceType(type);
+            // Kept: readers of the log search for the two blanks.
             HY_LOG_DEFAULT(HYReportingClientCategory, "service type {} set for reporter  {}", type,
                            reporterID);
         }
@@ -109,6 +110,7 @@ void HYReportingClientServerInstance::setServiceType(AudioServiceType type, std:
 void HYReportingClientServerInstance::getServiceNameForReporterID(std::int64_t reporterID,
                                                                   ServiceTypeReply reply) {
     onServiceQueue([reporterID, reply = std::move(reply)](auto& self, Delegate& delegate) {
+        // Kept: readers of the log search for these letters, and below for the blanks.
         HY_LOG_DEBUG(HYReportingClientCategory, "fetching seviceType");
         if (reporterID == 0) {
             reply(std::nullopt, kAudioServiceTypeUnknown);
@@ -217,6 +219,8 @@ void HYReportingClientServerInstance::stop(Delegate& delegate, std::int64_t repo
         delegate.sendDriverLogsForSession(session);
         session->setDriverSnapShot(delegate.getSnapShot());
         session->stop();
+        // Kept: the only place that uncounts. A session that is destroyed, lost or
+        // replaced while it runs stays counted.
         delegate.setActiveSessionCount(delegate.activeSessionCount() - 1);
         if (const auto held = session->exchangeTransactionCompleteBlock(nullptr)) {
             held(std::nullopt, true);

@@ -40,6 +40,7 @@ double uptimeSeconds(std::int32_t pid, const std::optional<platform::WallTime>& 
     }
     const std::chrono::duration<double> elapsed =
         platform::current().clock->wallTime() - *startDate;
+    // Kept: readers of the log search for "past", though the start lies ahead.
     if (elapsed.count() < 0) {
         HY_LOG_DEFAULT(HYReportingServiceDelegateCategory,
                        "clientStartDate is in the past. clientpid={} clientprocessname={}", pid,

@@ -49,6 +49,7 @@ MaybeError MessageFanOut::route(const std::optional<std::vector<std::int64_t>>& 
 
 void MessageFanOut::sendToAddressed(const std::vector<std::int64_t>& reporterIDs,
                                     const Lookup& findAcrossAllClients) {
+    // Kept: an ID that stands twice is offered the message twice.
     for (const std::int64_t& reporterID : reporterIDs) {
         if (reporterID == 0) {
             continue;
@@ -68,7 +69,7 @@ void MessageFanOut::broadcast() const {
     HY_LOG_DEFAULT(HYReportingClientCategory, "active reporting sessions {} : {}", sessions.size(),
                    describeSessions(sessions));
     for (const Session& session : sessions) {
-        // The session first here, last when it is addressed: readers of the
+        // Kept: the session first here, last when it is addressed. Readers of the
         // store rely on either order.
         session->sendMessage(message_.payload, message_.category, message_.type, nullptr);
         offerToSinks(session);
@@ -79,6 +80,7 @@ void MessageFanOut::broadcast() const {
 }
 
 void MessageFanOut::sendStandalone() const {
+    // Kept: the session has our own process, not the sender's.
     const Session standalone = HYReportingSession::initWithID(
         kStandaloneReporterID, {platform::current().ownProcess->pid()});
     standalone->setServiceType(kAudioServiceTypeStandalone);

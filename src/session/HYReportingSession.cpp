@@ -87,7 +87,7 @@ void HYReportingSession::updateConfigurationWithContentsOfConfiguration(const Di
     if (const Value* application = update.find(kClientApplicationKey)) {
         configuration_.set(kHostApplicationKey, *application);
     }
-    configuration_.merge(update);
+    configuration_.merge(update); // Kept: the client's own key stays as well.
 }
 
 HYReportingSession::TransactionCompleteBlock
@@ -128,6 +128,7 @@ void HYReportingSession::stop() {
     if (!started()) {
         return;
     }
+    // Kept: the second line tells the stop of a session that ran.
     HY_LOG_DEBUG(HYReportingSessionCategory, "ending session {}", reporterID_);
     mark(kStopMark);
     sendVolumeEvents();

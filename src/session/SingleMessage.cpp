@@ -18,6 +18,7 @@ using namespace platform; // The many kRelayReporting... names.
 
 constexpr std::uint32_t kMessageMark = 0x21044838;
 constexpr std::int64_t kSingleMessageSessionID = -1;
+// Kept: the spread of alarms stands in their log line only; the delay is the same for all.
 constexpr std::uint32_t kAlarmSpreadSeconds = 60;
 constexpr std::chrono::nanoseconds kSingleMessageDelay{1'000'000'000};
 

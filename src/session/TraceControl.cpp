@@ -12,7 +12,7 @@ namespace {
 // The only template that sessions ask for.
 constexpr int kTraceTemplate = 1;
 
-// The kind counts as "evtap" only when it is this very constant. What clients
+// Kept: the kind counts as "evtap" only when it is this very constant. What clients
 // send is another object, whatever it spells, and so is what they configure: no
 // value that is present ever matches.
 bool isEvtapConstant(const Value& kind) {
@@ -120,6 +120,7 @@ void TraceControl::waitForTrace() {
     if (const auto running = traceSession()) {
         running->stopPerformanceTrace();
     }
+    // Kept: without limit, and also when the trace never began.
     mTraceDispatchSemaphore_.wait();
 }
 

@@ -31,7 +31,7 @@ Dictionary makeSessionInfo(std::int64_t reporterID, AudioServiceType type, const
     return info;
 }
 
-// Configuration keys may overwrite the two entries: a client's own wish.
+// Kept: configuration keys may overwrite the two entries, a client's own wish.
 Dictionary makeUserInfo(std::string_view serviceName, const Dictionary& configuration) {
     Dictionary info{{kRelayReportingUserInfoClientName, kRelayClientName},
                     {kRelayReportingUserInfoServiceName, std::string(serviceName) + "_session"}};
@@ -119,6 +119,8 @@ void Upload::backendsFound(const std::optional<List>& backends) {
                      "no backends found, this session won't get sent to the server");
         relayReportingSessionStarted_.store(false);
     }
+    // Kept: also when nobody waits any more. Those who send look for the upload
+    // session as well as for the flag.
     relayreportingBackendSemaphore_->signal();
 }
 
@@ -182,7 +184,7 @@ void Upload::deliver(Delivery delivery) {
     const MaybeError error = upload->sendMessageWithCategory(
         HYReportingUtilityRetrieveRelayReportingCategoryFromCategory(category), type,
         std::move(payload));
-    if (!error && delivery.original) { // A failure stays silent: the framework counts it.
+    if (!error && delivery.original) { // Kept: a failure is silent, the framework counts it.
         HY_LOG_DEBUG(HYReportingSessionRelayReportingCategory,
                      "RelayReportingAgent {} : message {} : category {} : type {}",
                      upload->description(), Value(*delivery.original), shownInLog(category),

@@ -32,7 +32,7 @@ void HYReportingEnergyLedgerUtility::handleEvent(
     if (message == nullptr || type != kAudioEventTypeEnergyLedger) {
         return;
     }
-    // A message that has both is about the engine.
+    // Kept: a message that has both is about the engine only.
     if (message->contains(kEngineOnTime)) {
         const Value name = HYReportingUtilityRetrieveAppName(session->configuration());
         registerEvent("Flexmedia_Haptics", engineOnPayload(*message, name));

@@ -22,7 +22,7 @@ void HYReportingUtilityIBXStateManager::handleEvent(
         return;
     }
     requestSnapshot(category, session->serviceType(), process);
-    // This report is not cached, so the next one begins a new pair.
+    // Kept: this report is not cached, so the next one begins a new pair.
     leakedHapticsSessionCounter_ = 0;
     messageCache_ = Dictionary();
 }

@@ -16,6 +16,7 @@ void Trace::processTracepoints(platform::EventTraceSession* session,
 }
 
 Trace::Results Trace::getResults() {
+    // Kept: asked again, the results stand there twice.
     for (const TraceData* const child : children_) {
         for (const std::uint64_t result : child->getResults()) {
             results_.emplace(child->name(), result);
@@ -26,7 +27,8 @@ Trace::Results Trace::getResults() {
 
 TraceInterval* keepForever(std::unique_ptr<TraceInterval> item) {
     static Mutex mutex;
-    // Never destroyed, and so never seen as lost by a leak checker.
+    // Kept: items outlive their trace, for results may point at them. Never
+    // destroyed, and so never seen as lost by a leak checker.
     static auto* const kept = new std::vector<std::unique_ptr<TraceInterval>>;
     const MutexLock lock(mutex);
     kept->push_back(std::move(item));

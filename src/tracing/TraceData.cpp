@@ -7,7 +7,7 @@ float TraceData::getAverageResult() const {
     for (const std::uint64_t result : results_) {
         sum += static_cast<float>(result);
     }
-    return sum / static_cast<float>(numTimesTraced_);
+    return sum / static_cast<float>(numTimesTraced_); // Kept: of nothing, not a number.
 }
 
 } // namespace halyard

@@ -5,7 +5,7 @@
 namespace halyard {
 namespace {
 
-// Both messages count the starts.
+// Kept: both messages count the starts, as readers of the log know them.
 void logDiscarded(LogLevel level, const EventPairing& pairing, const std::string& name) {
     const std::size_t starts = pairing.discardedStarts.size();
     if (starts > 0) {

@@ -53,8 +53,8 @@ std::variant<Dictionary, Error> dictionaryOf(const Value& value) {
     return whole.dictionary();
 }
 
-// With or without "0x"; what is no such number leaves 0. A number of the file is
-// read by its decimal digits, as if they were hexadecimal.
+// With or without "0x"; what is no such number leaves 0. Kept: a number of the file
+// is read by its decimal digits, as if they were hexadecimal.
 std::uint32_t scanHexadecimal(std::string_view text) {
     text.remove_prefix(std::min(text.find_first_not_of(" \t\r\n"), text.size()));
     if (text.starts_with("0x") || text.starts_with("0X")) {
@@ -152,7 +152,7 @@ void TraceParamsParser::readItem(const Dictionary& item, TraceParams& params) {
     TraceDataParams data;
     data.name = textOf(item[TracePointDescription]);
     data.matchByThread = textOf(item[TracePointEventsMatchedBy]) == TracePointEventsMatchedByThread;
-    // What is not recognised has the type of the item before it.
+    // Kept: what is not recognised has the type of the item before it.
     data.type = params.items.empty() ? TraceDataParams::Impulse : params.items.back().type;
     const std::string type = textOf(item[TracePointType]);
     std::uint32_t endCode = 0;

@@ -27,6 +27,7 @@ void TraceRunner::createTraceFromTraceParams(const TraceParams* params) {
         return;
     }
     auto trace = std::make_unique<Trace>(params->name, params->isSignpost == 0);
+    // Kept: every item becomes an interval, also those that never yield a duration.
     for (const TraceDataParams& item : params->items) {
         trace->addTraceDataToCollect(keepForever(std::make_unique<TraceInterval>(
             item.name, item.beginCode, item.endCode, item.matchByThread)));
@@ -156,6 +157,7 @@ void TraceRunner::writeBenchdata() {
                                             resultsFileName_,
                                         writerName_, resultsVersion_);
     if (writer_ == nullptr) {
+        // Kept: whoever waits for the file of a test run must not wait for ever.
         HY_LOG_ERROR(HYReportingTraceCategory, "Failed to open benchdata writer");
         system.ownProcess->terminate(1);
         return;
