@@ -69,6 +69,7 @@ TEST_F(SampledFileTest, ReadsNoMoreThanItsBound) {
     EXPECT_EQ(text_.size(), kMaxSampledFile);
     SampledFile more(tree_.write("more", std::string(kMaxSampledFile + 1, 'x')), budget_);
     EXPECT_EQ(read(more), std::errc::file_too_large);
+    EXPECT_EQ(text_, "");
 }
 
 TEST_F(SampledFileTest, KeepsNoMoreFilesOpenThanTheBudgetHas) {
