@@ -124,6 +124,26 @@ TEST(DictionaryTest, MergingIntoNothingSharesTheContents) {
     EXPECT_EQ(target, source);
 }
 
+// A dictionary that shares its contents with nobody is changed where it is.
+bool isChangedInPlace(Dictionary& dictionary) {
+    const auto* const before = dictionary.begin();
+    dictionary.set("a", 2);
+    return dictionary.begin() == before;
+}
+
+TEST(DictionaryTest, AValueThatIsAssignedOverLetsGoOfWhatItHeld) {
+    Dictionary dictionary{{"a", 1}};
+    const Value other("text");
+    Value copied(dictionary);
+    copied = other;
+    EXPECT_TRUE(isChangedInPlace(dictionary)) << "copied over";
+    Value moved(dictionary);
+    moved = Value("text");
+    EXPECT_TRUE(isChangedInPlace(dictionary)) << "moved over";
+    const Value holds(dictionary);
+    EXPECT_FALSE(isChangedInPlace(dictionary)) << "still held";
+}
+
 TEST(DictionaryTest, SettingNoneErases) {
     Dictionary dictionary{{"a", 1}};
     dictionary.set("a", Value());

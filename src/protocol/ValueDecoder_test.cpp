@@ -145,7 +145,9 @@ TEST(ValueDecoderTest, StaysInsideBytesThatNoScannerSaw) {
     EXPECT_FALSE(decoder.decode(std::string(100000, '\x91')).has_value());
     const auto deep = decoder.decode(raw({0x94, 0, 1}) + packed("setConfiguration") +
                                      raw({0x92, 0x81}) + packed("k") + std::string(100000, '\x91'));
-    EXPECT_TRUE(deep && deep->error);
+    ASSERT_TRUE(deep && deep->error);
+    EXPECT_EQ(deep->error->message,
+              "argument 1 \"dictionary\" of setConfiguration holds bytes that are no MessagePack");
 }
 
 } // namespace

@@ -37,6 +37,23 @@ TEST_F(HYReportingSessionTest, TheNamesThatClientsKnowStay) {
     EXPECT_STREQ(HYReportingTestName, "HYReportingTestName");
 }
 
+#ifndef NDEBUG
+using HYReportingSessionDeathTest = SessionTest;
+
+TEST_F(HYReportingSessionDeathTest, ItIsUsedWhereItWasMadeOnly) {
+    const auto session = makeSession();
+    const auto elsewhere = [this](const platform::Task& use) {
+        const auto queue =
+            platform_.queues.makeSerialQueue("elsewhere", platform::QueuePriority::Utility);
+        queue->async([&use] { use(); });
+        run();
+    };
+    EXPECT_DEATH(elsewhere([&] { session->start(); }), "madeOn_");
+    EXPECT_DEATH(elsewhere([&] { session->stop(); }), "madeOn_");
+    EXPECT_DEATH(elsewhere([&] { send(*session, {{"n", 1}}); }), "madeOn_");
+}
+#endif
+
 TEST_F(HYReportingSessionTest, DescribesItself) {
     const auto session = HYReportingSession::initWithID(-9, {100, 200});
     session->setServiceType(kAudioServiceTypeAlarms);
