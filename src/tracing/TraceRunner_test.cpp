@@ -248,7 +248,7 @@ TEST_F(TraceRunnerTest, TheTimelineHasATrackForEachItemThatPairsAsTheItemDoes) {
          std::vector<std::tuple<std::uint32_t, std::uint64_t, std::uint64_t>>{
              {1, 1, 7}, {1, 2, 8}, {2, 3, 7}}) {
         trace_point point = tracePoint(code, time, thread);
-        point.pid = static_cast<std::uint32_t>(thread + 100);
+        point.pid = static_cast<std::int32_t>(thread + 100);
         session(0).deliver(point);
     }
     runner_->stopTracingandProcessResults();
