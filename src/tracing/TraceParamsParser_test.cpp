@@ -35,6 +35,12 @@ protected:
 class TraceParamsFormatTest : public TraceParamsParserTest,
                               public ::testing::WithParamInterface<const char*> {};
 
+TEST(TraceParamsNamesTest, TheNamesThatFilesAreWrittenWithStay) {
+    EXPECT_EQ(TraceDataTypeEvtap, "evtap");
+    EXPECT_EQ(TraceDataIsCritical, "IsCritical");
+    EXPECT_EQ(TracePointEventsMatchedByProcess, "Process");
+}
+
 // The same contents in three forms.
 TEST_P(TraceParamsFormatTest, EveryFormOfAPropertyListReadsAlike) {
     const TraceParams params =

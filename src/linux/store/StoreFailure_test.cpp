@@ -54,7 +54,7 @@ TEST_F(StoreFailureTest, FullDiskIsSaidOnceAndOvercomeWhenThereIsRoom) {
     std::filesystem::remove(ballast);
     flush();
     EXPECT_NE(log_.waitFor("again after").find(" rows lost"), std::string::npos);
-    EXPECT_EQ(log_.count("cannot write", LogLevel::Error), 1U);
+    EXPECT_EQ(log_.countOf("cannot write", LogLevel::Error), 1U);
     EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"),
               static_cast<std::int64_t>(store_->status().rows[1]));
 }
@@ -84,7 +84,7 @@ TEST_F(StoreFailureTest, ReadOnlyDiskMeansNoStore) {
         ::mount("tmpfs", directory_.path().c_str(), "tmpfs", MS_REMOUNT | MS_RDONLY, "size=1m"), 0);
     open();
     EXPECT_FALSE(store_->isOpen());
-    EXPECT_EQ(log_.count("running without a store", LogLevel::Error), 1U);
+    EXPECT_EQ(log_.countOf("running without a store", LogLevel::Error), 1U);
 }
 
 TEST_F(StoreFailureTest, WithoutAStoreEverythingIsCountedAndFlushAnswers) {
@@ -97,7 +97,7 @@ TEST_F(StoreFailureTest, WithoutAStoreEverythingIsCountedAndFlushAnswers) {
     store_->flush([&done] { done = true; });
     EXPECT_TRUE(done);
     EXPECT_EQ(lost(StoreLoss::NoStore), 2U);
-    EXPECT_EQ(log_.count("running without a store", LogLevel::Error), 1U);
+    EXPECT_EQ(log_.countOf("running without a store", LogLevel::Error), 1U);
 }
 
 TEST_F(StoreFailureTest, ALockHeldByAnotherProcessLosesOnlyWhatIsBeyondTheMark) {
@@ -189,7 +189,7 @@ TEST_F(StoreFailureTest, ARowThatIsRefusedForItselfIsLostAlone) {
     EXPECT_EQ(reader().rows("SELECT id, metric_id FROM metric"),
               (std::vector<std::string>{"1|1", "2|3"}));
     EXPECT_EQ(lost(StoreLoss::Rejected), 1U);
-    EXPECT_EQ(log_.count("the store rejected 1 rows: not this one", LogLevel::Error), 1U);
+    EXPECT_EQ(log_.countOf("the store rejected 1 rows: not this one", LogLevel::Error), 1U);
     EXPECT_FALSE(store_->status().failing);
 }
 
@@ -237,7 +237,7 @@ TEST_F(StoreFailureTest, ClosingCountsWhatItCouldNotWrite) {
     addSingles(3, {});
     EXPECT_TRUE(store_->close());
     EXPECT_EQ(lost(StoreLoss::Locked), 3U);
-    EXPECT_EQ(log_.count("3 rows lost: locked by another process", LogLevel::Error), 1U);
+    EXPECT_EQ(log_.countOf("3 rows lost: locked by another process", LogLevel::Error), 1U);
 }
 
 TEST_F(StoreFailureTest, ALazyPayloadIsBuiltOnceHoweverOftenItsGroupIsWritten) {
@@ -331,7 +331,7 @@ TEST_F(StoreFailureTest, NothingThatWasCommittedIsMissingAfterAKill) {
     int status = 0;
     ::waitpid(child, &status, 0);
     open();
-    EXPECT_EQ(log_.count("damaged", LogLevel::Error), 0U);
+    EXPECT_EQ(log_.countOf("damaged", LogLevel::Error), 0U);
     EXPECT_EQ(reader().one("PRAGMA integrity_check"), "ok");
     EXPECT_GE(reader().number("SELECT count(*) FROM upload_message"), acknowledged);
     EXPECT_EQ(reader().one("SELECT count(*) = max(id) FROM upload_message"), "1");

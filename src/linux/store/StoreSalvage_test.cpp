@@ -57,7 +57,7 @@ TEST_F(StoreSalvageTest, AFileThatIsNoDatabaseIsSetAside) {
     EXPECT_TRUE(store_->isOpen());
     EXPECT_EQ(setAside(), std::vector<std::string>{"telemetry.db.damaged-20231114T221320Z"});
     EXPECT_EQ(contents(directory_.path() / setAside().front()), std::string(5000, 'x'));
-    EXPECT_EQ(log_.count("is damaged, set aside", LogLevel::Error), 1U);
+    EXPECT_EQ(log_.countOf("is damaged, set aside", LogLevel::Error), 1U);
     addSingles(1, {});
     flush();
     EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 1);
@@ -100,7 +100,7 @@ TEST_F(StoreSalvageTest, RowsThatTheDaemonCannotHaveWrittenAreLeftOut) {
               (std::vector<std::string>{"1", "3", "5"}));
     EXPECT_EQ(reader().rows("SELECT id FROM metric"), std::vector<std::string>{"1"});
     EXPECT_EQ(reader().rows("SELECT id FROM incident"), std::vector<std::string>{"1"});
-    EXPECT_EQ(log_.count("carried over 6 rows", LogLevel::Default), 1U);
+    EXPECT_EQ(log_.countOf("carried over 6 rows", LogLevel::Default), 1U);
 }
 
 TEST_F(StoreSalvageTest, ATruncatedFileGivesWhatIsLeftOfIt) {
@@ -152,7 +152,7 @@ TEST_F(StoreSalvageTest, ANewerSchemaIsLeftUntouched) {
     open();
     EXPECT_FALSE(store_->isOpen());
     EXPECT_FALSE(store_->addSingleMessage({}, {}, 1, 1, {}));
-    EXPECT_EQ(log_.count("its schema is newer", LogLevel::Error), 1U);
+    EXPECT_EQ(log_.countOf("its schema is newer", LogLevel::Error), 1U);
     store_.reset();
     EXPECT_EQ(contents(options_.path), before);
     EXPECT_TRUE(setAside().empty());

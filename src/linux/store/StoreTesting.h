@@ -2,12 +2,10 @@
 // be waited for, and a reader that is nobody's business but SQLite's.
 #pragma once
 
-#include <condition_variable>
 #include <filesystem>
 #include <future>
 #include <gtest/gtest.h>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <vector>
 
@@ -15,44 +13,10 @@
 #include "platform/Log.h"
 #include "platform/Platform.h"
 #include "testing/ManualClock.h"
+#include "testing/RecordingLog.h"
 #include "testing/TempTree.h"
 
 namespace halyard::linux_ {
-
-class WaitingLog final : public platform::LogSink {
-public:
-    bool isEnabled(LogLevel) const override { return true; }
-    void write(const platform::LogLine& line) override {
-        const std::lock_guard lock(mutex_);
-        lines_.emplace_back(line.level, line.text);
-        changed_.notify_all();
-    }
-    // Returns the first line that holds `text`, once there is one.
-    std::string waitFor(std::string_view text) {
-        std::unique_lock lock(mutex_);
-        std::string found;
-        changed_.wait(lock, [&] {
-            for (const auto& [level, line] : lines_) {
-                found = line.find(text) != std::string::npos ? line : found;
-            }
-            return !found.empty();
-        });
-        return found;
-    }
-    std::size_t count(std::string_view text, LogLevel level) {
-        const std::lock_guard lock(mutex_);
-        std::size_t sum = 0;
-        for (const auto& line : lines_) {
-            sum += line.first == level && line.second.find(text) != std::string::npos ? 1 : 0;
-        }
-        return sum;
-    }
-
-private:
-    std::mutex mutex_;
-    std::condition_variable changed_;
-    std::vector<std::pair<LogLevel, std::string>> lines_;
-};
 
 // Another process's view of the file: results as rows of text joined by "|".
 class Reader {
@@ -137,7 +101,7 @@ protected:
 
     testing::TempTree directory_;
     testing::ManualClock clock_;
-    WaitingLog log_;
+    testing::RecordingLog log_;
     platform::Platform platform_;
     StoreOptions options_;
     std::unique_ptr<Store> store_;

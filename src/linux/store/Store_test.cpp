@@ -228,7 +228,7 @@ TEST_F(StoreTest, ReplacesAFileThatWasRemovedWhileOpen) {
     EXPECT_EQ(reader().one("SELECT s.session_id FROM upload_message m JOIN upload_session s "
                            "ON s.id = m.upload_session"),
               "9");
-    EXPECT_EQ(log_.count("was removed or replaced", LogLevel::Error), 1U);
+    EXPECT_EQ(log_.countOf("was removed or replaced", LogLevel::Error), 1U);
 }
 
 } // namespace
