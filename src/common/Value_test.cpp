@@ -55,6 +55,7 @@ TEST(ValueTest, LargeIntegersAreNotRoundedThroughReals) {
     EXPECT_FALSE(Value(odd) == Value(static_cast<double>(odd)));
     EXPECT_EQ(Value(odd - 1), Value(static_cast<double>(odd - 1)));
     EXPECT_FALSE(Value(kMaxInt64) == Value(9223372036854775808.0));
+    EXPECT_FALSE(Value(kMinInt64) == Value(9223372036854775808.0));
     EXPECT_EQ(Value(kMinInt64), Value(-9223372036854775808.0));
     EXPECT_EQ(Value(std::uint64_t{1} << 63), Value(9223372036854775808.0));
     EXPECT_FALSE(Value(kMaxUInt64) == Value(18446744073709551616.0));
