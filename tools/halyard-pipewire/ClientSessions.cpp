@@ -9,8 +9,8 @@ namespace {
 
 reporting::Dictionary toReporting(const Contents& contents) {
     reporting::Dictionary result;
-    for (const auto& [key, value] : contents) {
-        std::visit([&](const auto& fact) { result.set(key.c_str(), fact); }, value);
+    for (const auto& entry : contents) {
+        std::visit([&](const auto& fact) { result.set(entry.key.c_str(), fact); }, entry.value);
     }
     return result;
 }
