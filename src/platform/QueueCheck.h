@@ -18,6 +18,7 @@ namespace halyard::platform {
 
 class SameQueue {
 public:
+    SameQueue() noexcept {} // A const member without one needs a member to set.
     // Requires the queue that it was made on.
     void check() const { assert(SerialQueue::current() == madeOn_); }
 
