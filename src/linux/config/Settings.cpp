@@ -154,7 +154,11 @@ Result<ParsedSettings, SettingsFailure> SettingsReader::read(const toml::table& 
 void SettingsReader::fail(const toml::node& where, std::string message) {
     const toml::source_position at = where.source().begin;
     if (!failure_ || std::pair(at.line, at.column) < std::pair(failure_->line, failure_->column)) {
-        failure_ = SettingsFailure{{{}, std::move(message)}, path_, at.line, at.column};
+        failure_.emplace();
+        failure_->text = std::move(message);
+        failure_->file = path_;
+        failure_->line = at.line;
+        failure_->column = at.column;
     }
 }
 
