@@ -131,6 +131,17 @@ TEST(ValueDecoderTest, DecodesADictionaryOfManyKeys) {
     EXPECT_EQ(call.arguments.dictionary["a rather long key number 19999"], Value(19999));
 }
 
+TEST(ValueDecoderTest, BoundsItsOwnDepthWhereNoScannerDid) {
+    const auto isRefused = [](std::size_t lists) {
+        const auto call = CallDecoder().decode(raw({0x94, 0, 1}) + packed("setConfiguration") +
+                                               raw({0x92, 0x81}) + packed("k") +
+                                               std::string(lists, '\x91') + packed(5) + packed(1));
+        return !call || call->error.has_value();
+    };
+    EXPECT_FALSE(isRefused(kMaxDepth - 3)); // Frame, params and dictionary are levels, too.
+    EXPECT_TRUE(isRefused(kMaxDepth - 2));
+}
+
 TEST(ValueDecoderTest, StaysInsideBytesThatNoScannerSaw) {
     const std::string frame = packedRequest(
         "sendMessage", {packedMap({packed("k"), packedArray({packed(1000), packed("text")})}),
