@@ -117,8 +117,7 @@ public:
     }
     bool hasRelayReportingSession() const { return upload_.hasSession(); }
 
-    // Of the trace, to which its framework reports.
-    TraceControl& trace() const { return *trace_; }
+    // Of the trace.
     void setupTracing(const std::string* fileName) { trace_->setupTracing(fileName); }
     std::optional<std::string> tracingFileName() const { return trace_->tracingFileName(); }
     bool startedTracing() const { return trace_->startedTracing(); }

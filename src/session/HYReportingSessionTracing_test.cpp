@@ -50,7 +50,7 @@ protected:
             ++waits_;
             waitedSince_ = session_->stopWaitsSince();
             heldWhileWaiting_ = !performance()[0]->destroyed;
-            session_->trace().performanceTraceDidComplete(url, "", error);
+            performance()[0]->delegate.lock()->performanceTraceDidComplete(url, "", error);
             return true;
         };
         session_ = makeSession();
@@ -250,10 +250,10 @@ TEST_F(SessionTracingTest, AStopWaitsForTheCompletionAndTellsSinceWhen) {
 
 TEST_F(SessionTracingTest, ATraceThatCompletesWithAnErrorLeavesTheURLOfTheLast) {
     session_->start();
+    const auto delegate = performance()[0]->delegate.lock();
     session_->stop();
     ASSERT_EQ(session_->getPSTraceFileURL(), "/traces/one.dat");
-    session_->trace().performanceTraceDidComplete("/traces/broken.dat", "",
-                                                  Error{"posix", 5, "broken"});
+    delegate->performanceTraceDidComplete("/traces/broken.dat", "", Error{"posix", 5, "broken"});
     EXPECT_EQ(session_->getPSTraceFileURL(), "/traces/one.dat");
     EXPECT_TRUE(loggedByTrace(LogLevel::Error, "performanceTraceDidComplete broken"));
     EXPECT_FALSE(loggedByTrace(LogLevel::Info, "Performance Trace Completed: /traces/broken.dat"));
