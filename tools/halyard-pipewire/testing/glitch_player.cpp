@@ -1,0 +1,122 @@
+// glitch_player: plays or records silence, and gets into trouble when told to, so
+// that tests know which cycles were missed, and why.
+
+#include <cstdio>
+#include <cstdlib>
+#include <exception>
+#include <getopt.h>
+#include <string>
+
+#include "Player.h"
+
+namespace {
+
+using namespace halyard::glitching;
+
+constexpr const char* kUsage =
+    R"(Usage: glitch_player [OPTION]...
+Plays silence on PipeWire and obeys commands, one a line, on its standard input.
+
+  --name=TEXT        application.name, also node.name (glitch_player)
+  --target=NODE      target.object
+  --role=ROLE        media.role (Music)
+  --latency=N/RATE   node.latency (1024/48000)
+  --property=KEY=VALUE
+  --capture          record
+  --filter           be a filter, as JACK clients are; to be linked by others
+  --streams=N        that many streams of one connection
+  --paused           start without running
+
+Its first line says {"pid", "tid" of the data thread (0 while paused), "node" of the
+first stream}, then each command is answered with a line when it is done: {"done",
+and the clocks before and after in ns}. In its process callback it can
+  burn MS [CYCLES]   use the processor
+  sleep MS [CYCLES]  wait for time
+  fault MS [CYCLES]  wait for a page, a major fault
+  read PAGES         wait for pages of a disk file
+and beside it: pause, resume, quantum FRAMES (node.force-quantum), stop (as end of
+input), exit N, die (SIGKILL), abort.
+)";
+
+struct Arguments {
+    Player::Options player;
+    int exitStatus = -1; // set: nothing to run
+};
+
+void setProperty(Voice::Options& voice, const std::string& assignment) {
+    const auto middle = assignment.find('=');
+    voice.properties[assignment.substr(0, middle)] =
+        middle == std::string::npos ? "" : assignment.substr(middle + 1);
+}
+
+constexpr option kOptions[] = {{"name", required_argument, nullptr, 'n'},
+                               {"target", required_argument, nullptr, 't'},
+                               {"role", required_argument, nullptr, 'r'},
+                               {"latency", required_argument, nullptr, 'l'},
+                               {"property", required_argument, nullptr, 'P'},
+                               {"capture", no_argument, nullptr, 'c'},
+                               {"filter", no_argument, nullptr, 'f'},
+                               {"streams", required_argument, nullptr, 's'},
+                               {"paused", no_argument, nullptr, 'p'},
+                               {"help", no_argument, nullptr, 'h'},
+                               {}};
+
+Arguments parse(int argc, char** argv) {
+    Arguments arguments;
+    Voice::Options& voice = arguments.player.voice;
+    voice.properties = {{"media.role", "Music"}, {"node.latency", "1024/48000"}};
+    for (int found = 0; (found = getopt_long(argc, argv, "", kOptions, nullptr)) != -1;) {
+        switch (found) {
+        case 'n':
+            arguments.player.name = optarg;
+            break;
+        case 't':
+            voice.properties["target.object"] = optarg;
+            break;
+        case 'r':
+            voice.properties["media.role"] = optarg;
+            break;
+        case 'l':
+            voice.properties["node.latency"] = optarg;
+            break;
+        case 'P':
+            setProperty(voice, optarg);
+            break;
+        case 'c':
+            voice.capture = true;
+            break;
+        case 'f':
+            voice.filter = true;
+            break;
+        case 's':
+            arguments.player.streams = std::atoi(optarg);
+            break;
+        case 'p':
+            voice.paused = true;
+            break;
+        case 'h':
+            std::fputs(kUsage, stdout);
+            arguments.exitStatus = EXIT_SUCCESS;
+            return arguments;
+        default:
+            arguments.exitStatus = 2;
+            return arguments;
+        }
+    }
+    return arguments;
+}
+
+} // namespace
+
+int main(int argc, char** argv) {
+    const Arguments arguments = parse(argc, argv);
+    if (arguments.exitStatus != -1) {
+        return arguments.exitStatus;
+    }
+    try {
+        return Player(arguments.player).run();
+    } catch (const std::exception& error) {
+        std::fprintf(stderr, "glitch_player: %s\n", error.what());
+        return EXIT_FAILURE;
+    }
+}
