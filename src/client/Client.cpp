@@ -21,8 +21,8 @@ std::size_t capacityFor(std::size_t memoryLimit) {
 
 bool fitsFrame(const Submission& submission) {
     const std::size_t ids = submission.record.idCount;
-    return submission.body.size() + ids * (1 + sizeof(std::int64_t)) + kMaxStampBytes +
-               kFrameOverhead <=
+    return submission.body.size() + submission.tail.size() + ids * (1 + sizeof(std::int64_t)) +
+               kMaxStampBytes + kFrameOverhead <=
            protocol::kMaxFrameBytes;
 }
 
@@ -84,15 +84,15 @@ void Client::write(const MessageRing::Claim& claim, const Submission& submission
         std::memcpy(ids, submission.ids, idBytes);
     }
     char* const body = ids + idBytes;
-    if (!submission.body.empty()) {
-        std::memcpy(body, submission.body.data(), submission.body.size());
-    }
+    char* end = std::copy(submission.body.begin(), submission.body.end(), body);
+    end = std::copy(submission.tail.begin(), submission.tail.end(), end);
     Stamps stamps;
     if (submission.stamped) {
-        stamps = writeMissingStamps(body + submission.body.size(), submission.present, clock_);
+        stamps = writeMissingStamps(end, submission.present, clock_);
     }
     Record record = submission.record;
-    record.bodyBytes = static_cast<std::uint32_t>(submission.body.size() + stamps.bytes);
+    record.bodyBytes =
+        static_cast<std::uint32_t>(end - body) + static_cast<std::uint32_t>(stamps.bytes);
     record.entryCount += stamps.entries;
     new (claim.bytes) Record(record);
 }
@@ -103,7 +103,8 @@ halyard_result Client::submit(const Submission& submission) noexcept {
         return HALYARD_FORKED;
     }
     const std::size_t size = sizeof(Record) + record.idCount * sizeof(std::int64_t) +
-                             submission.body.size() + (submission.stamped ? kMaxStampBytes : 0);
+                             submission.body.size() + submission.tail.size() +
+                             (submission.stamped ? kMaxStampBytes : 0);
     if (!fitsFrame(submission) || size > ring_.maxRecord()) {
         return refuse(record, HALYARD_TOO_LARGE);
     }

@@ -38,6 +38,7 @@ struct Submission {
     Record record;
     const std::int64_t* ids = nullptr; // record.idCount of them
     std::string_view body = {};        // of a dictionary with record.entryCount entries
+    std::string_view tail = {};        // goes behind the body; its entries count there, too
     bool stamped = false;              // Gets the time stamps that are not `present`.
     StampSet present = kNoStamps;
 };

@@ -542,9 +542,10 @@ TEST_F(ClientTest, TheExampleProgramReports) {
     EXPECT_EQ(std::system(command.c_str()), 0);
     ASSERT_TRUE(daemon_->waitForEnds(1));
     const Calls calls = daemon_->calls();
-    ASSERT_EQ(calls.size(), 7U);
+    ASSERT_EQ(calls.size(), 8U);
     EXPECT_EQ(calls[4].arguments.dictionary["route"].text(), "speaker");
     EXPECT_EQ(calls[4].arguments.dictionary["sample_rate"].integerValue(), 48000);
+    EXPECT_EQ(calls[5].arguments.dictionary["node"].text(), "Example Player");
 }
 
 TEST(DefaultSocketPathsTest, LooksWhereTheServiceManagerSaysFirst) {

@@ -12,18 +12,23 @@ Record recordOf(protocol::Method method, std::int64_t reporterID, Callback callb
     return record;
 }
 
+halyard_result refuse(Client& client, const Record& record, halyard_result reason) {
+    return client.isForked() ? HALYARD_FORKED : client.refuse(record, reason);
+}
+
 halyard_result submitDictionary(Client& client, Submission submission,
                                 const DictionaryWriter& writer) {
     halyard_result error = writer.error();
-    const std::size_t elements = writer.elementCount() + submission.record.idCount + kFrameElements;
+    const std::size_t elements = writer.elementCount() + 2 * submission.record.entryCount +
+                                 submission.record.idCount + kFrameElements;
     if (error == HALYARD_OK && elements > protocol::kMaxElements) {
         error = HALYARD_TOO_LARGE;
     }
     if (error != HALYARD_OK) {
-        return client.isForked() ? HALYARD_FORKED : client.refuse(submission.record, error);
+        return refuse(client, submission.record, error);
     }
     submission.body = writer.body();
-    submission.record.entryCount = writer.entryCount();
+    submission.record.entryCount += writer.entryCount();
     submission.present = writer.stamps();
     return client.submit(submission);
 }

@@ -35,7 +35,11 @@ template <class Struct> void copySized(Struct& to, const Struct& from, std::size
 
 Record recordOf(protocol::Method method, std::int64_t reporterID, Callback callback = {});
 
-// Completes `submission` with the dictionary and hands it over.
+// Counts a message that cannot be handed over; answers why.
+halyard_result refuse(Client& client, const Record& record, halyard_result reason);
+
+// Completes `submission`, which may have a tail of plain entries, with the
+// dictionary and hands it over.
 halyard_result submitDictionary(Client& client, Submission submission,
                                 const DictionaryWriter& writer);
 

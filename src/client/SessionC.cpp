@@ -6,11 +6,16 @@
 #include <cstdlib>
 
 #include "client/Handles.h"
+#include "client/IssueEntries.h"
 
 using halyard::client::Callback;
+using halyard::client::copySized;
 using halyard::client::doneCallback;
+using halyard::client::IssueEntries;
 using halyard::client::Record;
 using halyard::client::recordOf;
+using halyard::client::refuse;
+using halyard::client::Submission;
 using halyard::client::submitDictionary;
 using halyard::client::submitMessage;
 using halyard::protocol::Method;
@@ -146,6 +151,30 @@ halyard_result halyard_session_send(halyard_session* session, const halyard_dict
     Record record = recordOf(Method::SendMessage, session->reporterID);
     record.idCount = 1;
     return submitMessage(*session->client, message, record, category, type, &session->reporterID);
+}
+
+halyard_result halyard_session_report_issue(halyard_session* session, const halyard_issue* given) {
+    if (session == nullptr || given == nullptr || given->size < sizeof(given->size)) {
+        return HALYARD_INVALID;
+    }
+    halyard_issue issue{};
+    copySized(issue, *given, given->size);
+    Record record = recordOf(Method::SendMessage, session->reporterID);
+    record.idCount = 1;
+    record.category = issue.category;
+    record.type = HALYARD_TYPE_ISSUE_DETECTOR;
+    IssueEntries entries;
+    const halyard_result result = entries.fill(issue);
+    if (result != HALYARD_OK) {
+        return refuse(*session->client, record, result);
+    }
+    // Behind the dictionary, because the last entry of a key counts.
+    record.entryCount = entries.count();
+    const Submission submission{
+        .record = record, .ids = &session->reporterID, .tail = entries.bytes(), .stamped = true};
+    return issue.more != nullptr
+               ? submitDictionary(*session->client, submission, issue.more->writer)
+               : session->client->submit(submission);
 }
 
 } // extern "C"

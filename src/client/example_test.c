@@ -16,7 +16,17 @@ int main(int argc, char** argv) {
     halyard_dictionary_set_uint(facts, "sample_rate", 48000);
     halyard_dictionary_set_string(facts, "route", "speaker");
     halyard_session_send(session, facts, HALYARD_CATEGORY_PLAYBACK, HALYARD_TYPE_START);
-    /* ... play ... */
+    /* ... play, until data comes too late once: ... */
+    halyard_dictionary_clear(facts);
+    halyard_dictionary_set_uint(facts, "buffered_frames", 0);
+    halyard_issue underrun = {.size = sizeof(underrun), .category = HALYARD_CATEGORY_PLAYBACK};
+    underrun.issue_type = "client_slow";
+    underrun.rtaid_client = "org.example.player";
+    underrun.node = "Example Player";
+    underrun.any_channel_silence_seconds = 1.5;
+    underrun.more = facts;
+    halyard_session_report_issue(session, &underrun);
+    /* ... and play on ... */
     halyard_session_stop(session, NULL, NULL);
 
     halyard_dictionary_destroy(facts);

@@ -300,6 +300,34 @@ HALYARD_EXPORT halyard_result halyard_session_send(halyard_session* session,
                                                    const halyard_dictionary* message,
                                                    uint32_t category, uint16_t type);
 
+/* ---- Sound that was missing */
+
+/* An issue that the program itself saw: what it played ran out, what it recorded
+ * was lost. Zero the struct, set `size`, then what you know. */
+typedef struct halyard_issue {
+    size_t size;              /* sizeof(halyard_issue) */
+    uint32_t category;        /* HALYARD_CATEGORY_PLAYBACK or HALYARD_CATEGORY_RECORD */
+    const char* issue_type;   /* What happened, say "client_slow"; neither NULL nor empty. */
+    const char* rtaid_client; /* The application. May be NULL. */
+    const char* node;         /* The stream. May be NULL. */
+    double any_channel_silence_seconds; /* How long sound was missing: 0 to 2,147,483,647. */
+    const halyard_dictionary* more;     /* Further entries of the message. May be NULL. */
+} halyard_issue;
+
+/* Sends `issue` to this session, as one message of type HALYARD_TYPE_ISSUE_DETECTOR
+ * whose keys are the names of the four fields behind the category, and those of
+ * `more`. Where `more` has one of the four itself, the field counts; a text that is
+ * NULL is no field, so then `more` does, and else the key is missing. All is copied,
+ * as halyard_session_send() does it, and the same stamps are added. Texts that are
+ * no UTF-8 go as they are. Real-time safe.
+ *
+ * HALYARD_INVALID when there is another category, no issue_type, seconds that are
+ * negative, too many or not a number, or a `more` that is not well formed.
+ * HALYARD_TOO_LARGE when a text is longer than 1,024 bytes (no more than one byte
+ * beyond is read), or the message than a frame. Both are counted. */
+HALYARD_EXPORT halyard_result halyard_session_report_issue(halyard_session* session,
+                                                           const halyard_issue* issue);
+
 /* ---- Without a session */
 
 /* Sends a message to the sessions with these IDs, of whatever client; to every

@@ -171,6 +171,15 @@ private:
     std::unique_ptr<halyard_dictionary, Destroy> handle_;
 };
 
+// halyard_issue: sound that was missing. The texts are borrowed during the call.
+struct Issue {
+    std::uint32_t category = 0; // HALYARD_CATEGORY_PLAYBACK or HALYARD_CATEGORY_RECORD
+    const char* issueType = nullptr;
+    const char* rtaidClient = nullptr;
+    const char* node = nullptr;
+    double anyChannelSilenceSeconds = 0;
+};
+
 // One reporting session; destroyed at the daemon with the object. May outlive
 // its client.
 class Session {
@@ -199,10 +208,25 @@ public:
     Result send(const Dictionary& message, std::uint32_t category, std::uint16_t type) {
         return halyard_session_send(get(), message.get(), category, type);
     }
+    Result reportIssue(const Issue& issue) { return report(issue, nullptr); }
+    Result reportIssue(const Issue& issue, const Dictionary& more) {
+        return report(issue, more.get());
+    }
 
     halyard_session* get() const { return handle_.get(); }
 
 private:
+    Result report(const Issue& issue, const halyard_dictionary* more) {
+        halyard_issue raw{};
+        raw.size = sizeof(raw);
+        raw.category = issue.category;
+        raw.issue_type = issue.issueType;
+        raw.rtaid_client = issue.rtaidClient;
+        raw.node = issue.node;
+        raw.any_channel_silence_seconds = issue.anyChannelSilenceSeconds;
+        raw.more = more;
+        return halyard_session_report_issue(get(), &raw);
+    }
     struct Destroy {
         void operator()(halyard_session* handle) const { halyard_session_destroy(handle); }
     };
