@@ -68,6 +68,14 @@ std::string firstOf(std::initializer_list<Source> sources) {
     return {};
 }
 
+// A program in a sandbox knows itself by a number that means another process
+// outside.
+bool isSandboxed(const Properties& client) {
+    const std::string access = property(client, "pipewire.access");
+    return access == "flatpak" || access == "portal" ||
+           client.contains("pipewire.access.portal.app_id");
+}
+
 std::optional<std::int64_t> positiveNumber(std::string_view text) {
     std::int64_t number = 0;
     const char* const end = text.data() + text.size();
@@ -132,12 +140,24 @@ std::string processName(const Properties& node, const Properties& client) {
         {{&node, "application.process.binary"}, {&client, "application.process.binary"}});
 }
 
+bool viaServer(const Properties& node, const Properties& client) {
+    return firstOf({{&node, "client.api"}, {&client, "client.api"}}) == "pipewire-pulse";
+}
+
 std::optional<std::int64_t> processId(const Properties& node, const Properties& client) {
-    // Streams that come through the PulseAudio server tell on the node, native
-    // ones on the client. The credentials of the socket are no help: for the
-    // former they are the server's.
-    return positiveNumber(
-        firstOf({{&node, "application.process.id"}, {&client, "application.process.id"}}));
+    const std::string said =
+        firstOf({{&node, "application.process.id"}, {&client, "application.process.id"}});
+    const bool numbersAreOurs = !isSandboxed(client);
+    if (viaServer(node, client)) {
+        const bool near =
+            firstOf({{&node, "pulse.server.type"}, {&client, "pulse.server.type"}}) != "tcp";
+        return near && numbersAreOurs ? positiveNumber(said) : std::nullopt;
+    }
+    if (property(client, "pipewire.access") == "portal") {
+        return std::nullopt; // the socket is the portal's, and so is its process
+    }
+    const auto known = positiveNumber(property(client, "pipewire.sec.pid"));
+    return known || !numbersAreOurs ? known : positiveNumber(said);
 }
 
 double perceivedVolume(float linearVolume) {

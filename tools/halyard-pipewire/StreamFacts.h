@@ -30,7 +30,13 @@ enum class Direction : std::uint8_t { Playback, Capture };
 // The program's file name; empty when unknown.
 [[nodiscard]] std::string processName(const Properties& node, const Properties& client);
 
-// The application's process, not that of a server that speaks for it.
+// Whether another process speaks for the program: a sound server of another kind
+// has the node, and the thread that serves it is that server's.
+[[nodiscard]] bool viaServer(const Properties& node, const Properties& client);
+
+// The application's process, not that of a server that speaks for it. What the
+// kernel says of the other end of the socket comes first, where that is the
+// program; what a program says of itself counts only where its numbers are ours.
 [[nodiscard]] std::optional<std::int64_t> processId(const Properties& node,
                                                     const Properties& client);
 

@@ -90,11 +90,50 @@ TEST(StreamFactsTest, TheApplicationNameFallsBackStepByStep) {
     EXPECT_EQ(applicationName({{"application.name", ""}}, {}), "Unknown");
 }
 
-TEST(StreamFactsTest, TheProcessIsTheApplicationsOwn) {
-    const Properties server = {{"application.process.id", "7"}, {"pipewire.sec.pid", "7"}};
+TEST(StreamFactsTest, TheKernelKnowsANativeProgramsProcess) {
+    EXPECT_EQ(processId({}, {{"application.process.id", "3"}, {"pipewire.sec.pid", "42"}}), 42);
+    EXPECT_EQ(processId({}, {{"client.api", "alsa"}, {"pipewire.sec.pid", "42"}}), 42);
+    EXPECT_EQ(processId({{"client.api", "jack"}}, {{"pipewire.sec.pid", "42"}}), 42);
+}
+
+TEST(StreamFactsTest, AProcessThatTheKernelDoesNotSeeIsTheOneThatIsNamed) {
+    EXPECT_EQ(processId({}, {{"application.process.id", "7"}}), 7);
+    EXPECT_EQ(processId({}, {{"application.process.id", "7"}, {"pipewire.sec.pid", "0"}}), 7);
+}
+
+TEST(StreamFactsTest, AServersProcessIsNotTheProgramsOwn) {
+    const Properties server = {{"client.api", "pipewire-pulse"}, {"pipewire.sec.pid", "7"}};
+    EXPECT_TRUE(viaServer({}, server));
     EXPECT_EQ(processId({{"application.process.id", "42"}}, server), 42);
-    EXPECT_EQ(processId({}, server), 7);
-    EXPECT_EQ(processId({}, {{"pipewire.sec.pid", "7"}}), std::nullopt);
+    EXPECT_EQ(processId({}, server), std::nullopt);
+}
+
+TEST(StreamFactsTest, NativeAndJackProgramsSpeakForThemselves) {
+    EXPECT_FALSE(viaServer({}, {}));
+    EXPECT_FALSE(viaServer({{"client.api", "jack"}}, {{"client.api", "jack"}}));
+}
+
+TEST(StreamFactsTest, AProcessOfAnotherMachineIsNone) {
+    const Properties node = {{"client.api", "pipewire-pulse"},
+                             {"pulse.server.type", "tcp"},
+                             {"application.process.id", "42"}};
+    EXPECT_EQ(processId(node, {}), std::nullopt);
+}
+
+TEST(StreamFactsTest, ANumberFromWithinASandboxIsNone) {
+    const Properties native = {{"pipewire.access", "flatpak"}, {"application.process.id", "3"}};
+    EXPECT_EQ(processId({}, native), std::nullopt);
+    Properties seen = native;
+    seen["pipewire.sec.pid"] = "42";
+    EXPECT_EQ(processId({}, seen), 42);
+    Properties served = seen;
+    served["client.api"] = "pipewire-pulse";
+    EXPECT_EQ(processId({}, served), std::nullopt);
+}
+
+TEST(StreamFactsTest, ThePortalsProcessIsNotTheProgramsOwn) {
+    const Properties client = {{"pipewire.access", "portal"}, {"pipewire.sec.pid", "42"}};
+    EXPECT_EQ(processId({}, client), std::nullopt);
 }
 
 TEST(StreamFactsTest, AProcessIdThatIsNoNumberIsNone) {
