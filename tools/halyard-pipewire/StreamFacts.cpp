@@ -107,6 +107,11 @@ std::optional<Direction> reportedDirection(const Properties& node) {
     return std::nullopt;
 }
 
+bool passesSound(const Properties& node) {
+    return !node.contains("media.class") && property(node, "media.type") == "Audio" &&
+           property(node, "media.category") == "Duplex" && !node.contains("node.link-group");
+}
+
 bool isDevice(const Properties& node) {
     return property(node, "media.class").starts_with("Audio/");
 }

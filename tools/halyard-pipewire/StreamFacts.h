@@ -17,6 +17,10 @@ enum class Direction : std::uint8_t { Playback, Capture };
 // that report already. Nullopt for those and for everything that is no stream.
 [[nodiscard]] std::optional<Direction> reportedDirection(const Properties& node);
 
+// A node that takes and gives sound as one, as those of JACK programs do: what it
+// is linked to tells whether it plays or captures, and sound goes through it.
+[[nodiscard]] bool passesSound(const Properties& node);
+
 // A device, or what stands for one: something that streams are linked to.
 [[nodiscard]] bool isDevice(const Properties& node);
 

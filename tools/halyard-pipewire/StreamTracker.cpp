@@ -103,7 +103,7 @@ void StreamTracker::on(const NodeChanged& event) {
     }
     Node& node = nodes_[event.id];
     node.properties = event.properties;
-    node.device = isDevice(node.properties);
+    routes_.setNode(event.id, node.properties);
     // A session goes on as what it began.
     if (!node.session) {
         node.direction = reportedDirection(node.properties);
@@ -120,6 +120,7 @@ void StreamTracker::on(const NodeStateChanged& event) {
 void StreamTracker::on(const NodeVolumeChanged& event) {
     if (Node* const node = find(event.id)) {
         node->volume = event.muted ? 0 : event.linearVolume;
+        routes_.setVolume(event.id, node->volume);
     }
 }
 
@@ -130,8 +131,8 @@ void StreamTracker::on(const NodeFormatChanged& event) {
 }
 
 void StreamTracker::on(const LinkAdded& event) {
-    if (hasRoom(links_, event.id)) {
-        links_[event.id] = event;
+    if (!routes_.addLink(event)) {
+        ++ignoredObjects_;
     }
 }
 
@@ -140,47 +141,23 @@ void StreamTracker::on(const ObjectRemoved& event) {
         close(*node);
         nodes_.erase(event.id);
     }
-    links_.erase(event.id);
+    routes_.remove(event.id);
     clients_.erase(event.id);
 }
 
 void StreamTracker::on(const Disconnected&) {
     closeAll();
     nodes_.clear();
-    links_.clear();
+    routes_.clear();
     clients_.clear();
-}
-
-void StreamTracker::addToRoute(std::map<ObjectId, Route>& routes, ObjectId stream,
-                               ObjectId device) const {
-    const auto from = nodes_.find(stream);
-    const auto to = nodes_.find(device);
-    if (from == nodes_.end() || to == nodes_.end() || !from->second.direction ||
-        !to->second.device) {
-        return;
-    }
-    Route& route = routes[stream];
-    route.devices.insert(property(to->second.properties, "node.name"));
-    route.volume = std::max(route.volume, to->second.volume);
-}
-
-std::map<ObjectId, StreamTracker::Route> StreamTracker::routes() const {
-    std::map<ObjectId, Route> result;
-    for (const auto& [id, link] : links_) {
-        addToRoute(result, link.outputNode, link.inputNode);
-        addToRoute(result, link.inputNode, link.outputNode);
-    }
-    return result;
 }
 
 // ---- What comes of looking at it
 
 void StreamTracker::on(const Settled&) {
-    const std::map<ObjectId, Route> all = routes();
     for (auto& [id, node] : nodes_) {
         if (node.direction) {
-            const auto found = all.find(id);
-            look(node, found == all.end() ? Route{} : found->second);
+            look(node, routes_.routeOf(id));
         }
     }
 }

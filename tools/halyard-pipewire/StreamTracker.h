@@ -20,6 +20,7 @@
 #include "GraphEvents.h"
 #include "SessionSink.h"
 #include "StreamFacts.h"
+#include "StreamRoutes.h"
 
 namespace halyard::pipewire {
 
@@ -58,19 +59,12 @@ private:
     struct Node {
         Properties properties;
         std::optional<Direction> direction; // set for streams that report
-        bool device = false;
         bool running = false;
         bool ranSinceLook = false;
         float volume = 1;
         std::string format;
         std::optional<Session> session;
     };
-    // What a stream's links say.
-    struct Route {
-        std::set<std::string> devices;
-        float volume = 0;
-    };
-
     void on(const ClientChanged& event);
     void on(const NodeChanged& event);
     void on(const NodeStateChanged& event);
@@ -83,8 +77,6 @@ private:
 
     Node* find(ObjectId id);
     template <class Map> bool hasRoom(const Map& map, ObjectId id);
-    std::map<ObjectId, Route> routes() const;
-    void addToRoute(std::map<ObjectId, Route>& routes, ObjectId stream, ObjectId device) const;
 
     void look(Node& stream, const Route& route);
     void open(Node& stream);
@@ -100,7 +92,7 @@ private:
     std::int64_t nextReporterID_;
     std::map<ObjectId, Properties> clients_;
     std::map<ObjectId, Node> nodes_;
-    std::map<ObjectId, LinkAdded> links_;
+    StreamRoutes routes_;
     std::uint64_t ignoredObjects_ = 0;
 };
 

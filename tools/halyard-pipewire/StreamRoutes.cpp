@@ -1,0 +1,92 @@
+#include "StreamRoutes.h"
+
+#include <algorithm>
+#include <vector>
+
+#include "StreamFacts.h"
+
+namespace halyard::pipewire {
+
+void StreamRoutes::setNode(ObjectId id, const Properties& properties) {
+    Place& place = places_[id];
+    place.name = property(properties, "node.name");
+    place.device = isDevice(properties);
+    place.passes = passesSound(properties);
+}
+
+void StreamRoutes::setVolume(ObjectId id, float linearVolume) {
+    places_.at(id).volume = linearVolume;
+}
+
+bool StreamRoutes::addLink(const LinkAdded& link) {
+    removeLink(link.id);
+    if (links_.size() >= kMaxLinks) {
+        return false;
+    }
+    links_.emplace(link.id, link);
+    downstream_.emplace(link.outputNode, link.id);
+    upstream_.emplace(link.inputNode, link.id);
+    return true;
+}
+
+void StreamRoutes::remove(ObjectId id) {
+    places_.erase(id);
+    removeLink(id);
+}
+
+void StreamRoutes::removeLink(ObjectId id) {
+    const auto found = links_.find(id);
+    if (found != links_.end()) {
+        downstream_.erase({found->second.outputNode, id});
+        upstream_.erase({found->second.inputNode, id});
+        links_.erase(found);
+    }
+}
+
+void StreamRoutes::clear() {
+    places_.clear();
+    links_.clear();
+    downstream_.clear();
+    upstream_.clear();
+}
+
+// Visits the devices at the `end` of the links that lead away from a node, and
+// goes on behind the nodes that pass sound.
+template <class Visit>
+void StreamRoutes::walk(ObjectId from, const Ways& ways, ObjectId LinkAdded::*end,
+                        Visit visit) const {
+    std::set<ObjectId> seen{from};
+    std::vector<ObjectId> passed{from};
+    for (std::size_t i = 0; i < passed.size(); ++i) {
+        for (auto way = ways.lower_bound({passed[i], 0});
+             way != ways.end() && way->first == passed[i]; ++way) {
+            const ObjectId other = links_.at(way->second).*end;
+            const auto place = places_.find(other);
+            if (place == places_.end() || !seen.insert(other).second) {
+                continue;
+            }
+            if (place->second.device) {
+                visit(place->second);
+            } else if (place->second.passes && passed.size() <= kMaxPassed) {
+                passed.push_back(other);
+            }
+        }
+    }
+}
+
+Route StreamRoutes::routeOf(ObjectId stream) const {
+    Route route;
+    walk(stream, downstream_, &LinkAdded::inputNode, [&](const Place& device) {
+        route.plays = true;
+        route.devices.insert(device.name);
+        route.volume = std::max(route.volume, device.volume);
+    });
+    walk(stream, upstream_, &LinkAdded::outputNode, [&](const Place& device) {
+        route.captures = true;
+        route.devices.insert(device.name);
+        route.volume = route.plays ? route.volume : std::max(route.volume, device.volume);
+    });
+    return route;
+}
+
+} // namespace halyard::pipewire
