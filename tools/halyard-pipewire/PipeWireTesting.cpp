@@ -17,7 +17,7 @@ namespace fs = std::filesystem;
 
 namespace {
 
-constexpr std::string_view kSinks = R"(
+constexpr std::string_view kDevices = R"(
 context.objects = [
   { factory = adapter args = { factory.name = support.null-audio-sink
       node.name = "out.speaker" media.class = Audio/Sink object.linger = true
@@ -25,6 +25,9 @@ context.objects = [
   { factory = adapter args = { factory.name = support.null-audio-sink
       node.name = "out.headphones" media.class = Audio/Sink object.linger = true
       audio.position = [ FL FR ] monitor.channel-volumes = true priority.session = 900 } }
+  { factory = adapter args = { factory.name = support.null-audio-sink
+      node.name = "in.microphone" media.class = Audio/Source/Virtual object.linger = true
+      audio.position = [ FL FR ] priority.session = 800 } }
 ]
 )";
 
@@ -69,7 +72,7 @@ bool inPath(const std::string& program) {
 
 } // namespace
 
-Child::Child(const std::vector<std::string>& arguments, const fs::path& logFile) {
+Child::Child(const std::vector<std::string>& arguments, const fs::path& logFile, const Ends& ends) {
     std::vector<char*> argv;
     for (const std::string& argument : arguments) {
         argv.push_back(const_cast<char*>(argument.c_str()));
@@ -80,6 +83,12 @@ Child::Child(const std::vector<std::string>& arguments, const fs::path& logFile)
     posix_spawn_file_actions_addopen(&files, 1, logFile.c_str(), O_WRONLY | O_CREAT | O_APPEND,
                                      0600);
     posix_spawn_file_actions_adddup2(&files, 1, 2);
+    if (ends.input >= 0) {
+        posix_spawn_file_actions_adddup2(&files, ends.input, 0);
+    }
+    if (ends.output >= 0) {
+        posix_spawn_file_actions_adddup2(&files, ends.output, 1);
+    }
     const int error = posix_spawnp(&pid_, argv[0], &files, nullptr, argv.data(), environ);
     posix_spawn_file_actions_destroy(&files);
     if (error != 0) {
@@ -95,9 +104,20 @@ Child& Child::operator=(Child&& other) noexcept {
     return *this;
 }
 
+void Child::signal(int number) const {
+    if (::kill(pid_, number) != 0) {
+        throw std::runtime_error("no such process");
+    }
+    if (number == SIGSTOP) {
+        siginfo_t ignored{};
+        waitid(P_PID, static_cast<id_t>(pid_), &ignored, WSTOPPED | WNOWAIT);
+    }
+}
+
 void Child::kill() {
     if (pid_ > 0) {
         ::kill(pid_, SIGTERM);
+        ::kill(pid_, SIGCONT); // one that is stopped would not hear
         wait();
     }
 }
@@ -112,8 +132,12 @@ bool PrivatePipeWire::installed() {
     return inPath("pipewire") && inPath("wireplumber") && inPath("pw-play") && inPath("wpctl");
 }
 
+bool PrivatePipeWire::pulseInstalled() {
+    return installed() && inPath("pipewire-pulse") && inPath("paplay");
+}
+
 PrivatePipeWire::PrivatePipeWire() {
-    folder_.write("config/pipewire/pipewire.conf.d/sinks.conf", kSinks);
+    folder_.write("config/pipewire/pipewire.conf.d/sinks.conf", kDevices);
     folder_.write("config/wireplumber/main.lua.d/60-nodbus.lua", kNoDBus);
     folder_.write("config/wireplumber/bluetooth.lua.d/60-off.lua",
                   "bluez_monitor.enabled = false\n");
@@ -133,13 +157,25 @@ PrivatePipeWire::~PrivatePipeWire() {
 
 void PrivatePipeWire::start() {
     daemon_ = Child({"pipewire"}, log("pipewire"));
-    // The session manager gives up when it cannot connect at once.
-    const std::string ready = "until [ -S pipewire-0 ]; do sleep 0.02; done";
-    run({"sh", "-c", "cd " + folder_.path().string() + " && " + ready});
+    awaitSocket("pipewire-0"); // or the session manager gives up
     sessionManager_ = Child({"wireplumber"}, log("wireplumber"));
 }
 
+void PrivatePipeWire::startPulse() {
+    pulse_ = Child({"pipewire-pulse"}, log("pipewire-pulse"));
+    awaitSocket("pulse/native");
+}
+
+void PrivatePipeWire::awaitSocket(const std::string& name) {
+    run({"sh", "-c", "until [ -S '" + (folder_ / name).string() + "' ]; do sleep 0.02; done"});
+}
+
+void PrivatePipeWire::forceQuantum(std::uint32_t frames) {
+    run({"pw-metadata", "-n", "settings", "0", "clock.force-quantum", std::to_string(frames)});
+}
+
 void PrivatePipeWire::stop() {
+    pulse_.kill();
     sessionManager_.kill();
     daemon_.kill();
     fs::remove(folder_ / "pipewire-0");

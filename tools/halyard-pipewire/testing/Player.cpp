@@ -195,7 +195,7 @@ void Player::order(const std::string& command, Kind kind, std::int64_t amount,
     }
     ordered_ = command;
     try {
-        trouble_.order(kind, amount, std::max<std::int64_t>(cycles, 1));
+        trouble_.order(kind, std::chrono::milliseconds(amount), std::max<std::int64_t>(cycles, 1));
     } catch (const std::exception& error) {
         refuse(command + ": " + error.what());
     }

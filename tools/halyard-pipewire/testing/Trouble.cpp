@@ -38,20 +38,15 @@ std::optional<Kind> kindOf(std::string_view command) {
     if (command == "sleep") {
         return Kind::Sleep;
     }
-    if (command == "read") {
-        return Kind::Read;
-    }
     return command == "fault" ? std::optional(Kind::Fault) : std::nullopt;
 }
 
-void Trouble::order(Kind kind, std::int64_t amount, std::int64_t cycles) {
-    if (kind == Kind::Read) {
-        diskPages_ = std::make_unique<DiskPages>(static_cast<std::size_t>(amount));
-    } else if (kind == Kind::Fault && latePage_ == nullptr) {
-        latePage_ = std::make_unique<LatePage>();
+void Trouble::order(Kind kind, std::chrono::milliseconds time, std::int64_t cycles) {
+    if (kind == Kind::Fault) {
+        pages_ = std::make_unique<LatePages>(static_cast<std::size_t>(cycles), time);
     }
     kind_ = kind;
-    time_ = std::chrono::milliseconds(amount);
+    time_ = time;
     cyclesLeft_ = cycles;
     begun_ = false;
     state_ = State::Ordered;
@@ -61,7 +56,7 @@ std::optional<Span> Trouble::collect() {
     if (state_ != State::Done) {
         return std::nullopt;
     }
-    diskPages_.reset();
+    pages_.reset();
     const Span span = span_;
     state_ = State::Idle;
     return span;
@@ -89,10 +84,8 @@ void Trouble::make() {
         return burn(time_);
     case Kind::Sleep:
         return sleep(time_);
-    case Kind::Read:
-        return diskPages_->touch();
     case Kind::Fault:
-        return latePage_->touch(time_);
+        return pages_->touchNext();
     }
 }
 

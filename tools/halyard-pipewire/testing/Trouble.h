@@ -10,7 +10,7 @@
 #include <optional>
 #include <string_view>
 
-#include "SlowPages.h"
+#include "LatePages.h"
 
 namespace halyard::glitching {
 
@@ -27,7 +27,7 @@ struct Span {
     Moment after;
 };
 
-enum class Kind { Burn, Sleep, Read, Fault };
+enum class Kind { Burn, Sleep, Fault };
 std::optional<Kind> kindOf(std::string_view command);
 
 // Hands one order at a time to the data thread and its result back. Without locks:
@@ -39,9 +39,9 @@ public:
 
     // ---- The main thread
     bool busy() const { return state_ != State::Idle; }
-    // In each of the next `cycles` cycles: milliseconds, or pages for Read.
-    // Requires !busy(). Throws when the pages cannot be had.
-    void order(Kind kind, std::int64_t amount, std::int64_t cycles);
+    // In each of the next `cycles` cycles. Requires !busy(). Throws when Fault is
+    // not possible here.
+    void order(Kind kind, std::chrono::milliseconds time, std::int64_t cycles);
     std::optional<Span> collect();
 
     // ---- The data thread, once a cycle
@@ -59,8 +59,7 @@ private:
     std::int64_t cyclesLeft_ = 0;
     bool begun_ = false;
     Span span_;
-    std::unique_ptr<DiskPages> diskPages_;
-    std::unique_ptr<LatePage> latePage_;
+    std::unique_ptr<LatePages> pages_;
 };
 
 } // namespace halyard::glitching

@@ -32,8 +32,7 @@ first stream}, then each command is answered with a line when it is done: {"done
 and the clocks before and after in ns}. In its process callback it can
   burn MS [CYCLES]   use the processor
   sleep MS [CYCLES]  wait for time
-  fault MS [CYCLES]  wait for a page, a major fault
-  read PAGES         wait for pages of a disk file
+  fault MS [CYCLES]  wait for a page of a slow disk (a major fault); for who may mount
 and beside it: pause, resume, quantum FRAMES (node.force-quantum), stop (as end of
 input), exit N, die (SIGKILL), abort.
 )";
