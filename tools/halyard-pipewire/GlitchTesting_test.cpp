@@ -8,6 +8,7 @@
 #include <fstream>
 #include <gtest/gtest.h>
 #include <iterator>
+#include <sched.h>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -61,6 +62,16 @@ TEST_F(GlitchPlayerTest, SaysWhichThreadAndNodeItPlaysWith) {
     EXPECT_NE(player.dataThread(), player.pid());
     EXPECT_FALSE(text(player, "comm").empty());
     server_.run({"wpctl", "inspect", std::to_string(player.node())});
+}
+
+TEST_F(GlitchPlayerTest, ItsDataThreadIsOfARealTimeClassUnlessItIsToBeOrdinary) {
+    if (!ProcessorHog::allowed()) {
+        GTEST_SKIP() << "no real-time class for this user";
+    }
+    const GlitchPlayer player(speaker_);
+    const GlitchPlayer ordinary({"--target=out.speaker", "--ordinary"});
+    EXPECT_NE(sched_getscheduler(player.dataThread()), SCHED_OTHER);
+    EXPECT_EQ(sched_getscheduler(ordinary.dataThread()), SCHED_OTHER);
 }
 
 TEST_F(GlitchPlayerTest, BurnsProcessorTimeInAsManyCyclesAsItIsTold) {

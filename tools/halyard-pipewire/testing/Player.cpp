@@ -23,6 +23,13 @@ struct Player::Hooks {
 
 namespace {
 
+// As players of music are configured, their data threads are in a real-time class
+// where that is allowed. Old releases ask for the file, new ones for the property.
+pw_properties* contextProperties(bool ordinary) {
+    return pw_properties_new(PW_KEY_CONFIG_NAME, ordinary ? "client.conf" : "client-rt.conf",
+                             "module.rt", ordinary ? "false" : "true", nullptr);
+}
+
 pw_properties* clientProperties(const std::string& name) {
     return pw_properties_new(PW_KEY_APP_NAME, name.c_str(), nullptr);
 }
@@ -47,7 +54,7 @@ Player::Player(const Options& options)
     pw_loop* const loop = pw_main_loop_get_loop(loop_);
     event_ = pw_loop_add_event(loop, onEvent, this);
     pw_loop_add_io(loop, STDIN_FILENO, SPA_IO_IN | SPA_IO_HUP, false, onInput, this);
-    context_ = pw_context_new(loop, nullptr, 0);
+    context_ = pw_context_new(loop, contextProperties(options.ordinary), 0);
     core_ = context_ == nullptr ? nullptr
                                 : pw_context_connect(context_, clientProperties(options.name), 0);
     if (core_ == nullptr) {

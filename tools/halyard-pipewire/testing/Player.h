@@ -27,6 +27,7 @@ public:
         std::string name = "glitch_player";
         Voice::Options voice;
         int streams = 1;
+        bool ordinary = false; // without a real-time class
     };
 
     // Throws when PipeWire is not there.

@@ -24,6 +24,7 @@ Plays silence on PipeWire and obeys commands, one a line, on its standard input.
   --property=KEY=VALUE
   --capture          record
   --filter           be a filter, as JACK clients are; to be linked by others
+  --ordinary         have no thread of a real-time class
   --streams=N        that many streams of one connection
   --paused           start without running
 
@@ -48,17 +49,13 @@ void setProperty(Voice::Options& voice, const std::string& assignment) {
         middle == std::string::npos ? "" : assignment.substr(middle + 1);
 }
 
-constexpr option kOptions[] = {{"name", required_argument, nullptr, 'n'},
-                               {"target", required_argument, nullptr, 't'},
-                               {"role", required_argument, nullptr, 'r'},
-                               {"latency", required_argument, nullptr, 'l'},
-                               {"property", required_argument, nullptr, 'P'},
-                               {"capture", no_argument, nullptr, 'c'},
-                               {"filter", no_argument, nullptr, 'f'},
-                               {"streams", required_argument, nullptr, 's'},
-                               {"paused", no_argument, nullptr, 'p'},
-                               {"help", no_argument, nullptr, 'h'},
-                               {}};
+constexpr option kOptions[] = {
+    {"name", required_argument, nullptr, 'n'},     {"target", required_argument, nullptr, 't'},
+    {"role", required_argument, nullptr, 'r'},     {"latency", required_argument, nullptr, 'l'},
+    {"property", required_argument, nullptr, 'P'}, {"capture", no_argument, nullptr, 'c'},
+    {"filter", no_argument, nullptr, 'f'},         {"streams", required_argument, nullptr, 's'},
+    {"paused", no_argument, nullptr, 'p'},         {"ordinary", no_argument, nullptr, 'o'},
+    {"help", no_argument, nullptr, 'h'},           {}};
 
 Arguments parse(int argc, char** argv) {
     Arguments arguments;
@@ -86,6 +83,9 @@ Arguments parse(int argc, char** argv) {
             break;
         case 'f':
             voice.filter = true;
+            break;
+        case 'o':
+            arguments.player.ordinary = true;
             break;
         case 's':
             arguments.player.streams = std::atoi(optarg);
