@@ -12,7 +12,7 @@ RUN_PACKAGES := pipewire pipewire-bin pipewire-pulse libspa-0.2-modules wireplum
 	sox espeak-ng sqlite3 procps
 TEST_PACKAGES := libmsgpack-cxx-dev libgtest-dev libgmock-dev libbenchmark-dev libsndfile1-dev \
 	clang-format python3-msgpack \
-	neovim
+	neovim pipewire-jack jackd2
 CHECK_PACKAGES := clang clang-tidy libclang-rt-14-dev
 BENCH_PACKAGES := libmsgpack-cxx-dev libbenchmark-dev sqlite3
 

@@ -13,7 +13,9 @@
 #include <vector>
 
 #include "GraphObjects.h"
+#include "NodeParams.h"
 #include "PipeWireHeaders.h"
+#include "StreamFacts.h"
 
 namespace halyard::pipewire {
 
@@ -35,16 +37,6 @@ std::optional<ObjectId> objectId(const spa_dict* properties, const char* key) {
 timespec toTimespec(std::chrono::nanoseconds time) {
     const auto seconds = std::chrono::duration_cast<std::chrono::seconds>(time);
     return {.tv_sec = seconds.count(), .tv_nsec = (time - seconds).count()};
-}
-
-bool isWatched(const spa_dict* properties) {
-    const char* const mediaClass =
-        properties == nullptr ? nullptr : spa_dict_lookup(properties, PW_KEY_MEDIA_CLASS);
-    if (mediaClass == nullptr) {
-        return false;
-    }
-    const std::string_view text = mediaClass;
-    return text.starts_with("Stream/") || text.starts_with("Audio/");
 }
 
 } // namespace
@@ -281,7 +273,7 @@ void PipeWireAdapter::Impl::onGlobal(void* data, ObjectId id, std::uint32_t, con
     auto& self = *static_cast<Impl*>(data);
     self.established();
     const std::string_view kind = type;
-    if (kind == PW_TYPE_INTERFACE_Node && isWatched(properties)) {
+    if (kind == PW_TYPE_INTERFACE_Node && isWatched(readProperties(properties))) {
         self.bind<BoundNode>(id, type, PW_VERSION_NODE);
     } else if (kind == PW_TYPE_INTERFACE_Client) {
         self.bind<BoundClient>(id, type, PW_VERSION_CLIENT);

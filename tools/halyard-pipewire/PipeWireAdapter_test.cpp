@@ -1,98 +1,15 @@
 // Against a real daemon; skipped where PipeWire is not installed.
 
-#include "PipeWireAdapter.h"
+#include "PipeWireAdapterTesting.h"
 
-#include <algorithm>
 #include <csignal>
 #include <gtest/gtest.h>
-#include <map>
 #include <string>
-#include <vector>
-
-#include "PipeWireTesting.h"
-#include "StreamTracker.h"
-#include "halyard/halyard.h"
 
 namespace halyard::pipewire {
 namespace {
 
 using namespace std::chrono_literals;
-
-class KeepingSink final : public SessionSink {
-public:
-    void open(std::int64_t, std::uint16_t service, const Contents& configuration) override {
-        opened.push_back(configuration.get<std::string>("HostApplicationDisplayID") + "/" +
-                         std::to_string(service));
-        configurations.push_back(configuration);
-    }
-    void send(std::int64_t, const Message& message) override { messages.push_back(message); }
-    void close(std::int64_t) override { ++closed; }
-
-    bool has(std::uint32_t category, std::uint16_t type) const {
-        return std::any_of(messages.begin(), messages.end(), [&](const Message& message) {
-            return message.category == category && message.type == type;
-        });
-    }
-    bool hasVolume(double volume, std::int64_t playing) const {
-        return std::any_of(messages.begin(), messages.end(), [&](const Message& message) {
-            return message.contents.get<double>("VQSessionVolume") == volume &&
-                   message.contents.get<std::int64_t>("VQSessionVolumePlayingState") == playing;
-        });
-    }
-
-    std::vector<std::string> opened;
-    std::vector<Contents> configurations;
-    std::vector<Message> messages;
-    int closed = 0;
-};
-
-class PipeWireAdapterTest : public ::testing::Test {
-protected:
-    void SetUp() override {
-        if (!testing::PrivatePipeWire::installed()) {
-            GTEST_SKIP() << "pipewire, wireplumber, pw-play and wpctl are not installed";
-        }
-        server_.start();
-        adapter_ = std::make_unique<PipeWireAdapter>(PipeWireAdapter::Options{},
-                                                     [this](const GraphEvent& event) {
-                                                         remember(event);
-                                                         tracker_.handle(event);
-                                                     });
-        ASSERT_TRUE(until([this] { return nodes_.contains("out.headphones"); }));
-    }
-
-    void remember(const GraphEvent& event) {
-        if (const auto* node = std::get_if<NodeChanged>(&event)) {
-            nodes_[property(node->properties, "node.name")] = *node;
-        }
-        lost_ = lost_ || std::holds_alternative<Disconnected>(event);
-    }
-
-    // Runs the loop until `done`; false when that takes too long.
-    template <class Done> bool until(Done done) {
-        const auto deadline = std::chrono::steady_clock::now() + 20s;
-        while (!done()) {
-            if (std::chrono::steady_clock::now() > deadline) {
-                return false;
-            }
-            adapter_->iterate(100ms);
-        }
-        return true;
-    }
-
-    std::string idOf(const std::string& node) { return std::to_string(nodes_[node].id); }
-    std::string serialOf(const std::string& node) {
-        return property(nodes_[node].properties, "object.serial");
-    }
-    bool plays() const { return sink_.has(HALYARD_CATEGORY_PLAYBACK, HALYARD_TYPE_START); }
-
-    testing::PrivatePipeWire server_;
-    KeepingSink sink_;
-    StreamTracker tracker_{sink_, 1};
-    std::map<std::string, NodeChanged> nodes_;
-    bool lost_ = false;
-    std::unique_ptr<PipeWireAdapter> adapter_;
-};
 
 TEST_F(PipeWireAdapterTest, APlayersStreamIsASession) {
     auto player = server_.play("Music");

@@ -112,6 +112,11 @@ bool passesSound(const Properties& node) {
            property(node, "media.category") == "Duplex" && !node.contains("node.link-group");
 }
 
+bool isWatched(const Properties& node) {
+    return property(node, "media.class").starts_with("Stream/") || isDevice(node) ||
+           passesSound(node);
+}
+
 bool isDevice(const Properties& node) {
     return property(node, "media.class").starts_with("Audio/");
 }

@@ -21,6 +21,10 @@ enum class Direction : std::uint8_t { Playback, Capture };
 // is linked to tells whether it plays or captures, and sound goes through it.
 [[nodiscard]] bool passesSound(const Properties& node);
 
+// What sessions need to know of, by the few properties that are told before a node
+// is listened to.
+[[nodiscard]] bool isWatched(const Properties& node);
+
 // A device, or what stands for one: something that streams are linked to.
 [[nodiscard]] bool isDevice(const Properties& node);
 

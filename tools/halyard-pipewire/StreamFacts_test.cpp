@@ -36,6 +36,37 @@ TEST(StreamFactsTest, EndsOfLoopbacksDoNotReport) {
         std::nullopt);
 }
 
+const Properties kJackNode = {{"media.type", "Audio"},
+                              {"media.category", "Duplex"},
+                              {"media.role", "DSP"},
+                              {"node.name", "synth"}};
+
+TEST(StreamFactsTest, JackProgramsPassSound) {
+    EXPECT_TRUE(passesSound(kJackNode));
+    EXPECT_EQ(reportedDirection(kJackNode), std::nullopt);
+    EXPECT_FALSE(isDevice(kJackNode));
+}
+
+TEST(StreamFactsTest, FiltersVideoAndStreamsPassNoSound) {
+    const auto with = [](const char* key, const char* value) {
+        Properties node = kJackNode;
+        node[key] = value;
+        return node;
+    };
+    EXPECT_FALSE(passesSound(with("media.category", "Filter")));
+    EXPECT_FALSE(passesSound(with("media.type", "Video")));
+    EXPECT_FALSE(passesSound(with("media.class", "Stream/Output/Audio")));
+    EXPECT_FALSE(passesSound(with("node.link-group", "filter-1")));
+}
+
+TEST(StreamFactsTest, StreamsDevicesAndJackProgramsAreWatched) {
+    EXPECT_TRUE(isWatched(kJackNode));
+    EXPECT_TRUE(isWatched({{"media.class", "Stream/Input/Audio"}}));
+    EXPECT_TRUE(isWatched({{"media.class", "Audio/Sink"}}));
+    EXPECT_FALSE(isWatched({{"media.class", "Video/Source"}}));
+    EXPECT_FALSE(isWatched({{"node.name", "Dummy-Driver"}}));
+}
+
 TEST(StreamFactsTest, SinksSourcesAndTheirVirtualKindsAreDevices) {
     EXPECT_TRUE(isDevice({{"media.class", "Audio/Sink"}}));
     EXPECT_TRUE(isDevice({{"media.class", "Audio/Source/Virtual"}}));

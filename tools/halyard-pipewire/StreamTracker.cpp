@@ -107,6 +107,8 @@ void StreamTracker::on(const NodeChanged& event) {
     // A session goes on as what it began.
     if (!node.session) {
         node.direction = reportedDirection(node.properties);
+        node.passes = passesSound(node.properties);
+        node.linked = !node.passes;
     }
 }
 
@@ -156,14 +158,36 @@ void StreamTracker::on(const Disconnected&) {
 
 void StreamTracker::on(const Settled&) {
     for (auto& [id, node] : nodes_) {
+        if (!node.direction && !node.passes) {
+            continue;
+        }
+        const Route route = routes_.routeOf(id);
+        if (node.passes) {
+            direct(node, route);
+        }
         if (node.direction) {
-            look(node, routes_.routeOf(id));
+            look(node, route);
         }
     }
 }
 
+// Such a node runs whether it is linked or not, and says nothing until it is. One
+// that captured and plays now, or the other way, begins another session.
+void StreamTracker::direct(Node& stream, const Route& route) {
+    stream.linked = route.plays || route.captures;
+    if (!stream.linked) {
+        return;
+    }
+    const Direction direction = route.plays ? Direction::Playback : Direction::Capture;
+    if (stream.session && direction != stream.direction) {
+        end(stream);
+    }
+    stream.direction = direction;
+}
+
 void StreamTracker::look(Node& stream, const Route& route) {
-    const bool ran = std::exchange(stream.ranSinceLook, false) || stream.running;
+    const bool runs = stream.running && stream.linked;
+    const bool ran = (std::exchange(stream.ranSinceLook, false) && stream.linked) || runs;
     if (!stream.session && ran) {
         open(stream);
     }
@@ -182,7 +206,7 @@ void StreamTracker::look(Node& stream, const Route& route) {
     if (ran) {
         tellVolume(session, volume, true);
     }
-    if (!stream.running) {
+    if (!runs) {
         tellVolume(session, volume, false);
         if (session.playing) {
             tellStop(session, *stream.direction);
@@ -217,10 +241,20 @@ void StreamTracker::close(Node& stream) {
     }
     stream.running = false;
     look(stream, Route{});
-    if (stream.session) {
-        sink_.close(stream.session->reporterID);
-        stream.session.reset();
+    end(stream);
+}
+
+void StreamTracker::end(Node& stream) {
+    if (!stream.session) {
+        return;
     }
+    Session& session = *stream.session;
+    if (session.playing) {
+        tellVolume(session, session.toldVolume.value_or(0), false);
+        tellStop(session, *stream.direction);
+    }
+    sink_.close(session.reporterID);
+    stream.session.reset();
 }
 
 // A stretch of playback belongs to one device and one format, so a change of

@@ -59,6 +59,8 @@ private:
     struct Node {
         Properties properties;
         std::optional<Direction> direction; // set for streams that report
+        bool passes = false;                // plays or captures by what it is linked to
+        bool linked = true;                 // of those that pass: to a device
         bool running = false;
         bool ranSinceLook = false;
         float volume = 1;
@@ -78,9 +80,11 @@ private:
     Node* find(ObjectId id);
     template <class Map> bool hasRoom(const Map& map, ObjectId id);
 
+    void direct(Node& stream, const Route& route);
     void look(Node& stream, const Route& route);
     void open(Node& stream);
     void close(Node& stream);
+    void end(Node& stream);
     void follow(Session& session, const Node& stream, const Route& route);
     void tellStart(Session& session, Direction direction);
     void tellStop(Session& session, Direction direction);
