@@ -54,7 +54,10 @@ TEST_F(PipeWireAdapterTest, ARecorderRecords) {
     const auto recorder = server_.record();
     ASSERT_TRUE(until([this] { return sink_.has(HALYARD_CATEGORY_RECORD, HALYARD_TYPE_START); }));
     EXPECT_EQ(sink_.opened, std::vector<std::string>{"test-recorder/0"});
-    EXPECT_EQ(sink_.messages[0].contents.get<Names>("active_devices"), Names{"out.speaker"});
+    const Contents& start = sink_.messages[0].contents;
+    EXPECT_EQ(start.get<Names>("active_devices"), Names{"out.speaker"});
+    EXPECT_EQ(start.get<std::int64_t>("capture_monitor"), 1);
+    EXPECT_EQ(start.get<std::int64_t>("capture_source"), 0);
 }
 
 TEST_F(PipeWireAdapterTest, ADaemonThatComesBackIsFoundAgain) {

@@ -121,6 +121,14 @@ bool isDevice(const Properties& node) {
     return property(node, "media.class").starts_with("Audio/");
 }
 
+bool givesMonitor(const Properties& device, const Properties& listener) {
+    const std::string mediaClass = property(device, "media.class");
+    if (mediaClass.starts_with("Audio/Sink") || mediaClass.starts_with("Audio/Source")) {
+        return mediaClass.starts_with("Audio/Sink");
+    }
+    return isTrue(listener, "stream.capture.sink"); // it has both kinds of ports
+}
+
 std::uint16_t serviceTypeOf(const Properties& node, Direction direction) {
     const std::string role = property(node, "media.role");
     const auto known = std::find_if(kRoles.begin(), kRoles.end(), [&](const RoleService& entry) {

@@ -28,6 +28,10 @@ enum class Direction : std::uint8_t { Playback, Capture };
 // A device, or what stands for one: something that streams are linked to.
 [[nodiscard]] bool isDevice(const Properties& node);
 
+// Whether what a stream takes from this device is what others play there, as from
+// the monitor of a sink, and not what the device itself hears.
+[[nodiscard]] bool givesMonitor(const Properties& device, const Properties& listener);
+
 // The service type (as the daemon numbers them) of a stream by its media role.
 [[nodiscard]] std::uint16_t serviceTypeOf(const Properties& node, Direction direction);
 

@@ -9,13 +9,15 @@ namespace halyard::pipewire {
 
 void StreamRoutes::setNode(ObjectId id, const Properties& properties) {
     Place& place = places_[id];
-    place.name = property(properties, "node.name");
+    place.properties = properties;
     place.device = isDevice(properties);
     place.passes = passesSound(properties);
 }
 
-void StreamRoutes::setVolume(ObjectId id, float linearVolume) {
-    places_.at(id).volume = linearVolume;
+void StreamRoutes::setVolume(ObjectId id, float linearVolume, bool muted) {
+    Place& place = places_.at(id);
+    place.volume = muted ? 0 : linearVolume;
+    place.muted = muted;
 }
 
 bool StreamRoutes::addLink(const LinkAdded& link) {
@@ -74,17 +76,27 @@ void StreamRoutes::walk(ObjectId from, const Ways& ways, ObjectId LinkAdded::*en
     }
 }
 
+void StreamRoutes::addVolume(Route& route, const Place& device, bool first) {
+    route.volume = first ? device.volume : std::max(route.volume, device.volume);
+    route.muted = device.muted && (first || route.muted);
+}
+
 Route StreamRoutes::routeOf(ObjectId stream) const {
     Route route;
     walk(stream, downstream_, &LinkAdded::inputNode, [&](const Place& device) {
+        addVolume(route, device, !route.plays);
         route.plays = true;
-        route.devices.insert(device.name);
-        route.volume = std::max(route.volume, device.volume);
+        route.devices.insert(property(device.properties, "node.name"));
     });
+    const auto listener = places_.find(stream);
     walk(stream, upstream_, &LinkAdded::outputNode, [&](const Place& device) {
-        route.captures = true;
-        route.devices.insert(device.name);
-        route.volume = route.plays ? route.volume : std::max(route.volume, device.volume);
+        if (!route.plays) {
+            addVolume(route, device, !route.captures());
+        }
+        const bool monitor = listener != places_.end() &&
+                             givesMonitor(device.properties, listener->second.properties);
+        (monitor ? route.monitors : route.hears) = true;
+        route.devices.insert(property(device.properties, "node.name"));
     });
     return route;
 }

@@ -20,8 +20,12 @@ namespace halyard::pipewire {
 struct Route {
     std::set<std::string> devices; // node names of all of them
     bool plays = false;            // sound goes to a device
-    bool captures = false;         // sound comes from one
+    bool hears = false;            // sound comes from what a device hears: a microphone
+    bool monitors = false;         // sound comes from what others play on a device
     float volume = 0;              // of the loudest that plays, else that is captured
+    bool muted = false;            // each of those is
+
+    bool captures() const { return hears || monitors; }
 };
 
 class StreamRoutes final {
@@ -32,8 +36,8 @@ public:
 
     // A node appeared, or its properties changed.
     void setNode(ObjectId id, const Properties& properties);
-    // Zero when it is muted. Requires a known node.
-    void setVolume(ObjectId id, float linearVolume);
+    // Requires a known node.
+    void setVolume(ObjectId id, float linearVolume, bool muted);
     // False when there is no room.
     [[nodiscard]] bool addLink(const LinkAdded& link);
     // Of a node or link, known or not.
@@ -44,14 +48,17 @@ public:
 
 private:
     struct Place {
-        std::string name;
+        Properties properties;
         bool device = false;
         bool passes = false; // sound goes through it
-        float volume = 1;
+        float volume = 1;    // 0 when muted
+        bool muted = false;
     };
     // A node, and a link that leads away from it.
     using Ways = std::set<std::pair<ObjectId, ObjectId>>;
 
+    // Of a device that is the first that counts, or one more.
+    static void addVolume(Route& route, const Place& device, bool first);
     void removeLink(ObjectId id);
     template <class Visit>
     void walk(ObjectId from, const Ways& ways, ObjectId LinkAdded::*end, Visit visit) const;

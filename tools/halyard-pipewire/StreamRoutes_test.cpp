@@ -100,16 +100,58 @@ TEST_F(StreamRoutesTest, OtherStreamsPassNoSoundOn) {
 
 TEST_F(StreamRoutesTest, AProgramThatPlaysAndCapturesHasTheDevicesOfBoth) {
     program(kFirstProgram);
-    routes_.setVolume(kSpeaker, 0.25F);
+    routes_.setVolume(kSpeaker, 0.25F, false);
     link(kMicrophone, kFirstProgram);
-    EXPECT_TRUE(routes_.routeOf(kFirstProgram).captures);
+    EXPECT_TRUE(routes_.routeOf(kFirstProgram).captures());
     EXPECT_FALSE(routes_.routeOf(kFirstProgram).plays);
     EXPECT_EQ(routes_.routeOf(kFirstProgram).volume, 1);
     link(kFirstProgram, kSpeaker);
     const Route route = routes_.routeOf(kFirstProgram);
-    EXPECT_TRUE(route.captures && route.plays);
+    EXPECT_TRUE(route.captures() && route.plays);
     EXPECT_EQ(route.devices, (Devices{"microphone", "speaker"}));
     EXPECT_EQ(route.volume, 0.25F);
+}
+
+TEST_F(StreamRoutesTest, ASourceIsHeardAndASinkMonitored) {
+    link(kMicrophone, kStream);
+    EXPECT_TRUE(routes_.routeOf(kStream).hears);
+    EXPECT_FALSE(routes_.routeOf(kStream).monitors);
+    node(11, "Stream/Input/Audio", "recorder");
+    link(kSpeaker, 11);
+    EXPECT_TRUE(routes_.routeOf(11).monitors);
+    EXPECT_FALSE(routes_.routeOf(11).hears);
+    link(kMicrophone, 11);
+    EXPECT_TRUE(routes_.routeOf(11).monitors && routes_.routeOf(11).hears);
+}
+
+TEST_F(StreamRoutesTest, TheListenerSaysWhatItTakesFromADeviceOfBothDirections) {
+    node(kMicrophone, "Audio/Duplex", "headset");
+    node(11, "Stream/Input/Audio", "recorder");
+    link(kMicrophone, 11);
+    EXPECT_TRUE(routes_.routeOf(11).hears);
+    routes_.setNode(11, {{"media.class", "Stream/Input/Audio"}, {"stream.capture.sink", "true"}});
+    EXPECT_TRUE(routes_.routeOf(11).monitors);
+    EXPECT_FALSE(routes_.routeOf(11).hears);
+}
+
+TEST_F(StreamRoutesTest, OnlyDevicesThatAreAllMutedAreMuted) {
+    link(kStream, kSpeaker);
+    routes_.setVolume(kSpeaker, 0.5F, true);
+    EXPECT_TRUE(routes_.routeOf(kStream).muted);
+    EXPECT_EQ(routes_.routeOf(kStream).volume, 0);
+    link(kStream, kHeadphones);
+    EXPECT_FALSE(routes_.routeOf(kStream).muted);
+    routes_.setVolume(kHeadphones, 0.5F, true);
+    EXPECT_TRUE(routes_.routeOf(kStream).muted);
+}
+
+TEST_F(StreamRoutesTest, AMutedMicrophoneDoesNotMuteWhatPlays) {
+    program(kFirstProgram);
+    routes_.setVolume(kMicrophone, 1, true);
+    link(kMicrophone, kFirstProgram);
+    EXPECT_TRUE(routes_.routeOf(kFirstProgram).muted);
+    link(kFirstProgram, kSpeaker);
+    EXPECT_FALSE(routes_.routeOf(kFirstProgram).muted);
 }
 
 TEST_F(StreamRoutesTest, ProgramsThatFeedEachOtherEndAWalk) {

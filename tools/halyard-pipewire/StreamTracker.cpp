@@ -13,9 +13,14 @@ namespace {
 constexpr const char* kFormat = "session_selected_format";
 constexpr const char* kActiveDevices = "active_devices";
 constexpr const char* kPreviousDevices = "previous_devices";
+// From what is captured: what a device hears, or what others play on one.
+constexpr const char* kCaptureSource = "capture_source";
+constexpr const char* kCaptureMonitor = "capture_monitor";
 constexpr const char* kVolume = "VQSessionVolume";
 constexpr const char* kPlayingState = "VQSessionVolumePlayingState";
 constexpr const char* kVolumeProcess = "VQSessionVolumeOperationProcess";
+constexpr const char* kStreamMuted = "stream_muted";
+constexpr const char* kDeviceMuted = "device_muted";
 // Counts a session's runs, so that the second start is no repeat of the first.
 constexpr const char* kRun = "stream_run";
 
@@ -122,7 +127,8 @@ void StreamTracker::on(const NodeStateChanged& event) {
 void StreamTracker::on(const NodeVolumeChanged& event) {
     if (Node* const node = find(event.id)) {
         node->volume = event.muted ? 0 : event.linearVolume;
-        routes_.setVolume(event.id, node->volume);
+        node->muted = event.muted;
+        routes_.setVolume(event.id, event.linearVolume, event.muted);
     }
 }
 
@@ -174,7 +180,7 @@ void StreamTracker::on(const Settled&) {
 // Such a node runs whether it is linked or not, and says nothing until it is. One
 // that captured and plays now, or the other way, begins another session.
 void StreamTracker::direct(Node& stream, const Route& route) {
-    stream.linked = route.plays || route.captures;
+    stream.linked = route.plays || route.captures();
     if (!stream.linked) {
         return;
     }
@@ -196,6 +202,7 @@ void StreamTracker::look(Node& stream, const Route& route) {
     }
     Session& session = *stream.session;
     follow(session, stream, route);
+    session.mutes.stream = stream.muted;
     const double volume = perceivedVolume(stream.volume * session.deviceVolume);
     if (ran && !session.playing) {
         session.playing = true;
@@ -261,7 +268,9 @@ void StreamTracker::end(Node& stream) {
 // either ends it before the change is told. Links and format vanish before a
 // stream does; what they were last stays.
 void StreamTracker::follow(Session& session, const Node& stream, const Route& route) {
-    const bool rerouted = !route.devices.empty() && route.devices != session.devices;
+    const bool rerouted = !route.devices.empty() &&
+                          (route.devices != session.devices || route.hears != session.hears ||
+                           route.monitors != session.monitors);
     const bool reformatted = !stream.format.empty() && stream.format != session.format;
     const bool endsStretch =
         (rerouted && !session.devices.empty()) || (reformatted && !session.format.empty());
@@ -273,12 +282,22 @@ void StreamTracker::follow(Session& session, const Node& stream, const Route& ro
     }
     if (!route.devices.empty()) {
         session.deviceVolume = route.volume;
+        session.mutes.device = route.muted;
+        session.hears = route.hears;
+        session.monitors = route.monitors;
     }
     if (rerouted) {
         const std::set<std::string> previous = std::exchange(session.devices, route.devices);
         if (!previous.empty()) {
             tellRoute(session, previous);
         }
+    }
+}
+
+void StreamTracker::addCapture(const Session& session, Contents& contents) const {
+    if (session.hears || session.monitors) {
+        contents.add(kCaptureSource, std::int64_t{session.hears});
+        contents.add(kCaptureMonitor, std::int64_t{session.monitors});
     }
 }
 
@@ -292,6 +311,7 @@ void StreamTracker::addContext(const Session& session, Contents& contents) const
 void StreamTracker::tellStart(Session& session, Direction direction) {
     Contents contents{{kRun, session.run}};
     addContext(session, contents);
+    addCapture(session, contents);
     sink_.send(session.reporterID, {categoryOf(direction), HALYARD_TYPE_START, contents});
 }
 
@@ -304,20 +324,27 @@ void StreamTracker::tellStop(Session& session, Direction direction) {
 void StreamTracker::tellRoute(Session& session, const std::set<std::string>& previous) {
     Contents contents{{kPreviousDevices, listOf(previous)}};
     addContext(session, contents);
+    addCapture(session, contents);
     sink_.send(session.reporterID,
                {HALYARD_CATEGORY_ROUTE_CHANGE, HALYARD_TYPE_ACTIVATE, contents});
 }
 
 void StreamTracker::tellVolume(Session& session, double volume, bool playing) {
-    if (session.toldVolume == volume && session.toldPlaying == playing) {
+    if (session.toldVolume == volume && session.toldPlaying == playing &&
+        session.toldMutes == session.mutes) {
         return;
     }
+    session.toldMutes = session.mutes;
     session.toldVolume = volume;
     session.toldPlaying = playing;
     Contents contents{{kVolume, volume},
                       {kPlayingState, std::int64_t{playing}},
                       {kVolumeProcess, session.operationProcess}};
     addContext(session, contents);
+    contents.add(kStreamMuted, std::int64_t{session.mutes.stream});
+    if (!session.devices.empty()) {
+        contents.add(kDeviceMuted, std::int64_t{session.mutes.device});
+    }
     sink_.send(session.reporterID, {HALYARD_CATEGORY_VOLUME, HALYARD_TYPE_ACTIVATE, contents});
 }
 

@@ -44,6 +44,11 @@ public:
     std::uint64_t ignoredObjects() const { return ignoredObjects_; }
 
 private:
+    struct Mutes {
+        bool stream = false;
+        bool device = false; // each device is
+        bool operator==(const Mutes&) const = default;
+    };
     // What was told of a stream, and to whom.
     struct Session {
         std::int64_t reporterID = 0;
@@ -52,7 +57,11 @@ private:
         bool playing = false;
         std::string format;
         std::set<std::string> devices;
+        bool hears = false;
+        bool monitors = false;
         float deviceVolume = 1; // of the loudest device, as a factor of samples
+        Mutes mutes;
+        Mutes toldMutes;
         std::optional<double> toldVolume;
         bool toldPlaying = false;
     };
@@ -63,7 +72,8 @@ private:
         bool linked = true;                 // of those that pass: to a device
         bool running = false;
         bool ranSinceLook = false;
-        float volume = 1;
+        float volume = 1; // 0 when muted
+        bool muted = false;
         std::string format;
         std::optional<Session> session;
     };
@@ -90,6 +100,7 @@ private:
     void tellStop(Session& session, Direction direction);
     void tellRoute(Session& session, const std::set<std::string>& previous);
     void tellVolume(Session& session, double volume, bool playing);
+    void addCapture(const Session& session, Contents& contents) const;
     void addContext(const Session& session, Contents& contents) const;
 
     SessionSink& sink_;

@@ -58,7 +58,9 @@ TEST_F(StreamTrackerTest, AVolumeMessageCarriesWhatPlaysAndWhere) {
                             {"VQSessionVolumePlayingState", 1},
                             {"VQSessionVolumeOperationProcess", "Player"},
                             {"session_selected_format", "F32LE 2ch 48000Hz"},
-                            {"active_devices", Names{"out.speaker"}}};
+                            {"active_devices", Names{"out.speaker"}},
+                            {"stream_muted", 0},
+                            {"device_muted", 0}};
     EXPECT_EQ(sink_.last().contents, expected);
 }
 
