@@ -127,6 +127,14 @@ std::optional<std::string> processEnvironment(std::string_view name) {
     return value == nullptr ? std::nullopt : std::optional<std::string>(value);
 }
 
+Result<std::filesystem::path> resolveDirectory(std::filesystem::path Directories::*which,
+                                               const Environment& environment, std::uint32_t uid) {
+    const Place* const place =
+        std::find_if(std::begin(kPlaces), std::end(kPlaces),
+                     [which](const Place& candidate) { return candidate.member == which; });
+    return resolve(*place, environment, uid);
+}
+
 Result<Directories> resolveDirectories(const Environment& environment, std::uint32_t uid) {
     Directories directories;
     for (const Place& place : kPlaces) {

@@ -33,6 +33,10 @@ struct Directories {
     [[nodiscard]] std::filesystem::path mapped(const std::filesystem::path& path) const;
 };
 
+// One of them alone, for who needs no more: as resolveDirectories has it.
+Result<std::filesystem::path> resolveDirectory(std::filesystem::path Directories::*which,
+                                               const Environment& environment, std::uint32_t uid);
+
 // Each directory as the service manager set it; else, for root (`uid` 0), the
 // system's; else the user's own. An unset and an empty variable are the same.
 Result<Directories> resolveDirectories(const Environment& environment, std::uint32_t uid);

@@ -90,6 +90,16 @@ TEST(DirectoriesTest, EachDirectoryIsResolvedByItself) {
               (Directories{"/etc/halyard", "/s", "/run/halyard", "/var/log/halyard"}));
 }
 
+TEST(DirectoriesTest, OneDirectoryNeedsNoneOfTheOthers) {
+    const auto none = [](std::string_view name) -> std::optional<std::string> {
+        return name == "XDG_STATE_HOME" ? std::optional<std::string>("/x") : std::nullopt;
+    };
+    const auto state = resolveDirectory(&Directories::state, none, kUser);
+    ASSERT_TRUE(state.ok());
+    EXPECT_EQ(state.value(), "/x/halyard");
+    EXPECT_FALSE(resolveDirectory(&Directories::runtime, none, kUser).ok());
+}
+
 TEST(DirectoriesTest, AUserWithoutRuntimeDirectoryIsTold) {
     EXPECT_EQ(problem({{"HOME", "/h"}}, kUser),
               "no runtime directory: neither RUNTIME_DIRECTORY nor XDG_RUNTIME_DIR is set to an "
