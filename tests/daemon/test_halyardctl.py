@@ -1,0 +1,256 @@
+"""halyardctl against a real daemon and its store, a copy of it, and what is no store at
+all. HALYARDCTL names the program."""
+
+import json
+import os
+import shutil
+import sqlite3
+import subprocess
+import unittest
+
+from harness import PATIENCE, Daemon, DaemonTest
+
+HALYARDCTL = os.environ.get("HALYARDCTL", "build/release/halyardctl")
+
+
+def ctl(*arguments, daemon=None, state=None, **options):
+    """Runs it where `daemon` is, or for the store in `state`."""
+    places = []
+    if daemon is not None:
+        places = ["--state", os.path.dirname(daemon.store_path), "--socket", daemon.socket_path]
+    elif state is not None:
+        places = ["--state", state, "--socket", os.path.join(state, "no-socket")]
+    return subprocess.run([HALYARDCTL, *places, *arguments], text=True, capture_output=True,
+                          timeout=PATIENCE, check=False, **options)
+
+
+class CtlTest(DaemonTest):
+    def ctl(self, *arguments, **options):
+        return ctl(*arguments, daemon=self.daemon, **options)
+
+    def listed(self, *arguments, **options):
+        done = self.ctl(*arguments, "--json", **options)
+        self.assertEqual(done.returncode, 0, done.stderr)
+        return json.loads(done.stdout)
+
+    def play(self, client, reporter_id=1, application="player"):
+        """A session that has played for two seconds."""
+        start = client.session(reporter_id, 7, application)
+        def send(seconds, state):
+            client.result("sendMessage", {
+                "VQSessionVolumePlayingState": state, "VQSessionVolume": 0.5,
+                "hyreporting_timestamp": 1000.0 + seconds, "active_devices": ["speaker"],
+            }, 14, 3, [reporter_id])
+        client.result("sendMessage", {"active_devices": ["speaker"]}, 4, 1, [reporter_id])
+        send(0, 1)
+        send(2, 0)
+        client.result("stopReportingSessionForID", reporter_id)
+        client.answer(start)
+
+
+class Reading(CtlTest):
+    def test_sessions_are_told_with_what_their_messages_come_to(self):
+        self.play(self.connect())
+        self.flush()
+        [session] = self.listed("sessions")
+        opened, closed = session.pop("opened"), session.pop("closed")
+        self.assertLessEqual(opened, closed)
+        ended = session.pop("ended")
+        self.assertIn(ended, (None, "stopped"))
+        self.assertEqual(session, {
+            "id": 1, "session_id": 1, "application": "player", "service": "longformaudio",
+            "direction": "playback", "messages": session["messages"], "glitches": 0,
+            "played_seconds": 2.0, "devices": ["speaker"]})
+        self.assertEqual(session["messages"],
+                         self.rows("SELECT count(*) FROM upload_message")[0][0])
+
+    def test_messages_are_told_as_they_are_stored(self):
+        client = self.connect()
+        client.session(7, 4, "clock")
+        client.result("sendMessage", {"n": 2**63, "text": "\u202e\x1b[2J"}, 0x10000007, 7, [7])
+        self.flush()
+        [message] = self.listed("messages")
+        time = message.pop("time")
+        self.assertEqual([(time,)], self.rows("SELECT time FROM upload_message"))
+        self.assertEqual(message, {
+            "id": 1, "session": 1, "application": "clock", "service": "alarms", "category": "IO",
+            "type": "IssueDetector",
+            "payload": {"n": 2**63, "text": "\u202e\x1b[2J", "audiotag": message["payload"]["audiotag"]}})
+
+    def test_a_single_message_has_no_session(self):
+        client = self.connect()
+        client.result("createReportingSession", 3)
+        client.result("setConfiguration", {"HostApplicationDisplayID": "x"}, 3)
+        client.result("sendMessage", {"a": 1}, 4, 1, [3])
+        self.flush()
+        [message] = self.listed("messages")
+        self.assertIsNone(message["session"])
+
+    def test_nothing_from_the_store_reaches_the_output_raw(self):
+        client = self.connect()
+        client.session(1, 4, "\x1b]0;title\x07\u202ename\u009b")
+        client.result("sendMessage", {"\x1b[2J": "\x9b\u2066\x7f"}, 4, 1, [1])
+        self.flush()
+        for command in ("sessions", "messages"):
+            for arguments in ((command,), (command, "--json")):
+                shown = self.ctl(*arguments)
+                self.assertEqual(shown.returncode, 0)
+                for letter in "\x1b\x07\u202e\u009b\u2066\x7f":
+                    self.assertNotIn(letter, shown.stdout)
+
+    def test_ranges_and_applications_narrow_what_is_told(self):
+        client = self.connect()
+        self.play(client, 1, "firefox")
+        self.play(client, 2, "fire alarm")
+        self.play(client, 3, "clock")
+        self.flush()
+        names = [s["application"] for s in self.listed("sessions", "--app", "fire*")]
+        self.assertEqual(names, ["firefox", "fire alarm"])
+        self.assertEqual(len(self.listed("sessions", "--since", "1h")), 3)
+        self.assertEqual(self.listed("sessions", "--until", "1h"), [])
+        self.assertEqual(self.listed("messages", "--until", "yesterday"), [])
+        self.assertEqual({m["application"] for m in self.listed("messages", "--app", "c?ock")},
+                         {"clock"})
+
+    def test_what_is_no_time_is_wrong_use(self):
+        for arguments in (("sessions", "--since", "soon"), ("messages", "--until", "5w"),
+                          ("sessions", "--bogus"), ("bogus",)):
+            done = self.ctl(*arguments)
+            self.assertEqual(done.returncode, 2, done)
+            self.assertEqual(done.stdout, "")
+
+    def test_a_reader_that_waits_does_not_hold_up_the_daemon(self):
+        client = self.connect()
+        client.session(1)
+        for number in range(2000):
+            client.notify("sendMessage", {"n": number, "text": "x" * 500}, 4, 1, [1])
+        client.result("getAllReporters")
+        self.flush()
+        with subprocess.Popen([HALYARDCTL, "--state", os.path.dirname(self.daemon.store_path),
+                               "messages", "--json"], stdout=subprocess.PIPE) as reader:
+            first = reader.stdout.read(10)  # The rest fills the pipe, and waits.
+            connection = sqlite3.connect(self.daemon.store_path)
+            busy, logged, moved = connection.execute("PRAGMA wal_checkpoint(TRUNCATE)").fetchone()
+            self.assertEqual((busy, logged, moved), (0, 0, 0))
+            connection.close()
+            self.assertEqual(len(json.loads(first + reader.stdout.read())), 2000)
+
+    def test_a_reader_that_goes_away_ends_the_listing_quietly(self):
+        client = self.connect()
+        client.session(1)
+        for number in range(3000):
+            client.notify("sendMessage", {"n": number, "text": "x" * 200}, 4, 1, [1])
+        self.flush()
+        with subprocess.Popen([HALYARDCTL, "--state", os.path.dirname(self.daemon.store_path),
+                               "messages"], stdout=subprocess.PIPE,
+                              stderr=subprocess.PIPE) as reader:
+            reader.stdout.read(1)
+            reader.stdout.close()
+            self.assertEqual(reader.stderr.read(), b"")
+            self.assertEqual(reader.wait(PATIENCE), 0)
+
+
+class Asking(CtlTest):
+    def test_status_is_what_the_daemon_answers(self):
+        client = self.connect()
+        told = self.listed("status")
+        self.assertEqual(told.keys(), client.result("admin.status").keys())
+        self.assertEqual(told["pid"], self.daemon.process.pid)
+        shown = self.ctl("status")
+        self.assertIn(f"pid  {self.daemon.process.pid}\n",
+                      "\n".join(" ".join(line.split()).replace(" ", "  ", 1)
+                                for line in shown.stdout.splitlines()) + "\n")
+
+
+class NotThere(unittest.TestCase):
+    def setUp(self):
+        self.daemon = Daemon()
+        self.addCleanup(self.daemon.remove)
+        self.state = os.path.dirname(self.daemon.store_path)
+
+    def filled(self):
+        """A store that its daemon has left."""
+        self.daemon.run()
+        client = self.daemon.client()
+        client.session(1, 4, "clock")
+        client.result("sendMessage", {"a": 1}, 4, 1, [1])
+        client.close()
+        self.assertEqual(self.daemon.terminate(), 0)
+
+    def test_without_a_daemon_status_says_how_to_start_it(self):
+        done = ctl("status", daemon=self.daemon)
+        self.assertEqual(done.returncode, 3)
+        self.assertIn("systemctl start halyardd.socket", done.stderr)
+
+    def test_without_a_store_there_is_none_to_read(self):
+        for command in ("sessions", "messages"):
+            done = ctl(command, "--json", state=self.state)
+            self.assertEqual((done.returncode, done.stdout), (3, ""))
+
+    def test_a_store_is_read_without_its_daemon_and_left_alone(self):
+        self.filled()
+        before = sorted(os.listdir(self.state))
+        done = ctl("sessions", "--json", state=self.state)
+        self.assertEqual(len(json.loads(done.stdout)), 1)
+        self.assertEqual(sorted(os.listdir(self.state)), before)
+
+    def test_a_copy_is_read_like_the_original(self):
+        self.daemon.run()
+        client = self.daemon.client()
+        self.addCleanup(client.close)
+        client.session(1, 4, "clock")
+        client.result("admin.flush")
+        copy = self.daemon.path("copy")
+        shutil.copytree(self.state, copy)
+        original = ctl("sessions", "--json", state=self.state)
+        self.assertEqual(ctl("sessions", "--json", state=copy).stdout, original.stdout)
+
+    def test_a_directory_that_may_not_be_written_to_is_no_hindrance(self):
+        self.filled()
+        os.chmod(self.daemon.store_path, 0o444)
+        os.chmod(self.state, 0o555)
+        os.chmod(self.daemon.root, 0o755)
+        self.addCleanup(os.chmod, self.state, 0o755)
+        done = ctl("sessions", "--json", state=self.state, **as_nobody())
+        self.assertEqual((done.returncode, len(json.loads(done.stdout))), (0, 1))
+
+    def test_a_store_that_may_not_be_read_is_not_allowed(self):
+        if os.geteuid() != 0:
+            self.skipTest("only root becomes somebody else")
+        self.filled()
+        os.chmod(self.daemon.root, 0o755)
+        os.chmod(self.state, 0o700)
+        done = ctl("sessions", state=self.state, **as_nobody())
+        self.assertEqual((done.returncode, done.stdout), (4, ""))
+
+    def test_a_daemon_that_does_not_let_one_in_is_not_allowed(self):
+        if os.geteuid() != 0:
+            self.skipTest("only root becomes somebody else")
+        self.daemon.run()
+        os.chmod(self.daemon.root, 0o755)
+        done = ctl("status", daemon=self.daemon, **as_nobody())
+        self.assertEqual(done.returncode, 4, done.stderr)
+
+    def test_a_damaged_store_says_what_to_do(self):
+        with open(self.daemon.store_path, "wb") as file:
+            file.write(b"this is no database" * 1000)
+        done = ctl("sessions", "--json", state=self.state)
+        self.assertEqual((done.returncode, done.stdout), (1, ""))
+        self.assertIn("check --repair", done.stderr)
+
+    def test_output_that_cannot_be_written_is_told(self):
+        self.filled()
+        with open("/dev/full", "wb") as full:
+            done = subprocess.run([HALYARDCTL, "--state", self.state, "sessions"], stdout=full,
+                                  stderr=subprocess.PIPE, timeout=PATIENCE, check=False)
+        self.assertEqual(done.returncode, 1)
+        self.assertIn(b"cannot write", done.stderr)
+
+
+def as_nobody():
+    """Options that run a program as somebody without rights; none when we are."""
+    return {"user": 65534, "group": 65534, "extra_groups": []} if os.geteuid() == 0 else {}
+
+
+if __name__ == "__main__":
+    unittest.main()
