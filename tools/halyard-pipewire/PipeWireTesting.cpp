@@ -159,6 +159,8 @@ void PrivatePipeWire::start() {
     daemon_ = Child({"pipewire"}, log("pipewire"));
     awaitSocket("pipewire-0"); // or the session manager gives up
     sessionManager_ = Child({"wireplumber"}, log("wireplumber"));
+    // A stream that comes before it knows the devices is told that there is none.
+    run({"sh", "-c", "until wpctl inspect @DEFAULT_AUDIO_SINK@; do sleep 0.02; done"});
 }
 
 void PrivatePipeWire::startPulse() {

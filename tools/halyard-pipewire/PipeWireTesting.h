@@ -55,6 +55,7 @@ public:
     PrivatePipeWire();
     ~PrivatePipeWire();
 
+    // Returns when the session manager knows the devices.
     void start();
     void stop();
     // Serves PulseAudio programs; requires start(). Returns when it listens.
