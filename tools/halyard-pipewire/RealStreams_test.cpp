@@ -6,6 +6,7 @@
 #include <string>
 #include <unistd.h>
 
+#include "LookOnce.h"
 #include "PipeWireAdapterTesting.h"
 
 namespace halyard::pipewire {
@@ -39,6 +40,23 @@ TEST_F(RealStreamsTest, AJackProgramPlaysWhileItIsLinked) {
     EXPECT_EQ(sink_.closed, 0);
     program.kill();
     EXPECT_TRUE(until([this] { return sink_.closed == 1; }));
+}
+
+TEST_F(RealStreamsTest, ALookShowsWhoPlaysWhere) {
+    const auto player = server_.play("Music");
+    ASSERT_TRUE(until([this] { return plays(); }));
+    const Look look = lookOnce("", std::chrono::seconds(1));
+    EXPECT_TRUE(look.answered);
+    EXPECT_NE(look.text.find("out.headphones  Sink"), std::string::npos);
+    EXPECT_NE(look.text.find("test-player"), std::string::npos);
+    EXPECT_NE(look.text.find("S16LE 2ch 48000Hz  out.speaker\n"), std::string::npos);
+    EXPECT_EQ(look.text.find("silence"), std::string::npos) << "a file's name";
+}
+
+TEST_F(RealStreamsTest, ALookAtADaemonThatIsNotThereSaysSo) {
+    const Look look = lookOnce("no-such-daemon", std::chrono::milliseconds(1));
+    EXPECT_FALSE(look.answered);
+    EXPECT_NE(look.text.find("no PipeWire answers"), std::string::npos);
 }
 
 } // namespace

@@ -11,6 +11,7 @@
 #include <string>
 
 #include "ClientSessions.h"
+#include "LookOnce.h"
 #include "PipeWireAdapter.h"
 #include "StreamTracker.h"
 
@@ -25,6 +26,7 @@ Reports the playback and capture streams of a PipeWire daemon to halyardd.
 
   -r, --remote=NAME   the PipeWire daemon to watch (its usual one)
   -s, --socket=PATH   the socket of halyardd (its usual place)
+  -1, --once          look for a second, print what is there, and end
   -v, --verbose       say on standard error what is reported
   -h, --help          show this help
   -V, --version       show the version
@@ -36,23 +38,30 @@ close the sessions and end it.
 struct Arguments {
     std::string remote;
     std::string socket;
+    bool once = false;
     bool verbose = false;
     int exitStatus = -1; // set: nothing to run
 };
 
 Arguments parse(int argc, char** argv) {
-    static const option kOptions[] = {
-        {"remote", required_argument, nullptr, 'r'}, {"socket", required_argument, nullptr, 's'},
-        {"verbose", no_argument, nullptr, 'v'},      {"help", no_argument, nullptr, 'h'},
-        {"version", no_argument, nullptr, 'V'},      {}};
+    static const option kOptions[] = {{"remote", required_argument, nullptr, 'r'},
+                                      {"socket", required_argument, nullptr, 's'},
+                                      {"once", no_argument, nullptr, '1'},
+                                      {"verbose", no_argument, nullptr, 'v'},
+                                      {"help", no_argument, nullptr, 'h'},
+                                      {"version", no_argument, nullptr, 'V'},
+                                      {}};
     Arguments arguments;
-    for (int found = 0; (found = getopt_long(argc, argv, "r:s:vhV", kOptions, nullptr)) != -1;) {
+    for (int found = 0; (found = getopt_long(argc, argv, "r:s:1vhV", kOptions, nullptr)) != -1;) {
         switch (found) {
         case 'r':
             arguments.remote = optarg;
             break;
         case 's':
             arguments.socket = optarg;
+            break;
+        case '1':
+            arguments.once = true;
             break;
         case 'v':
             arguments.verbose = true;
@@ -173,6 +182,16 @@ private:
     bool wasLost_ = false;
 };
 
+int printOnce(const std::string& remote) {
+    const Look look = lookOnce(remote, std::chrono::seconds(1));
+    if (!look.answered) {
+        note(look.text);
+        return EXIT_FAILURE;
+    }
+    fmt::print("{}", look.text);
+    return EXIT_SUCCESS;
+}
+
 // Before any thread starts: one that does not block them would take the signals
 // away from the loop, and end the process.
 void blockSignals() {
@@ -190,8 +209,11 @@ int main(int argc, char** argv) {
     if (arguments.exitStatus != -1) {
         return arguments.exitStatus;
     }
-    blockSignals();
     try {
+        if (arguments.once) {
+            return printOnce(arguments.remote);
+        }
+        blockSignals();
         Watcher(arguments).run();
         return EXIT_SUCCESS;
     } catch (const std::exception& error) {
