@@ -150,6 +150,102 @@ class Reading(CtlTest):
             self.assertEqual(reader.wait(PATIENCE), 0)
 
 
+class Tables(CtlTest):
+    def glitch(self, client, start, seconds, **more):
+        client.result("sendMessage", {
+            "issue_type": "process_stopped", "rtaid_client": "firefox", "node": "player",
+            "any_channel_silence_seconds": seconds, "glitch_start": start, "glitch_cycles": 15,
+            "glitch_device": "out.speaker", "glitch_quantum_seconds": 0.02,
+            "glitch_evidence": {"process_state": "T"}, **more}, 4, 7, [1])
+
+    def test_a_glitch_is_told_once_and_with_its_final_length(self):
+        client = self.connect()
+        client.session(1, 7, "player")
+        self.glitch(client, 1000.5, 10.0)
+        self.glitch(client, 2000.0, 0.32, glitch_inferred=1)
+        self.glitch(client, 1000.5, 12.5)
+        self.flush()
+        second, first = self.listed("glitches")
+        self.assertEqual(first, {
+            "session": 1, "application": "firefox", "direction": "playback", "node": "player",
+            "device": "out.speaker", "start": 1000.5, "seconds": 12.5, "cycles": 15,
+            "cause": "process_stopped", "evidence": {"process_state": "T"}, "inferred": False})
+        self.assertEqual((second["start"], second["seconds"], second["inferred"]),
+                         (2000.0, 0.32, True))
+        self.assertEqual(self.listed("sessions")[0]["glitches"], 2)
+        shown = self.ctl("glitches", env={**os.environ, "TZ": "UTC0"}).stdout.splitlines()
+        self.assertEqual(shown[0], "1970-01-01 00:33:20.0  firefox, 320 ms silent on out.speaker: "
+                                   "the process was stopped (inferred)")
+
+    def test_glitches_are_summed_up(self):
+        client = self.connect()
+        client.session(1, 7, "player")
+        self.glitch(client, 1000.0, 1.0)
+        self.glitch(client, 1001.0, 2.0)
+        self.glitch(client, 8000.0, 4.0, rtaid_client="vlc", issue_type="memory",
+                    glitch_device="hdmi")
+        self.flush()
+        for by, key, first, last in (("app", "application", "firefox", "vlc"),
+                                     ("device", "device", "out.speaker", "hdmi"),
+                                     ("cause", "cause", "process_stopped", "memory"),
+                                     ("hour", "hour", 0, 7200)):
+            self.assertEqual(self.listed("glitches", "--by", by), [
+                {key: first, "glitches": 2, "seconds": 3.0, "longest": 2.0},
+                {key: last, "glitches": 1, "seconds": 4.0, "longest": 4.0}])
+        self.assertEqual(self.listed("glitches", "--by", "app", "--app", "v*")[0]["glitches"], 1)
+        self.assertEqual(self.ctl("glitches", "--by", "moon").returncode, 2)
+
+    def test_the_other_tables_are_told_as_they_are_stored(self):
+        client = self.connect()
+        client.session(1, 7, "player")
+        self.glitch(client, 1000.0, 3.0)
+        client.result("sendMessage", {"Some_Time_Seconds": 3}, 1, 8, [1])
+        self.flush()
+        for command, table in (("events", "analytics_event"), ("energy", "energy_event"),
+                               ("incidents", "incident")):
+            names = [row[1] for row in self.daemon.rows(f"PRAGMA table_info({table})")]
+            expected = [dict(zip(names, row)) for row in self.daemon.rows(f"SELECT * FROM {table}")]
+            for row in expected:
+                for name in ("payload", "signature"):
+                    if name in row:
+                        row[name] = json.loads(row[name])
+            self.assertEqual(self.listed(command), expected)
+        self.assertGreater(len(self.listed("events")), 0)
+        [metric] = self.listed("metrics")
+        self.assertEqual(metric.pop("time"), self.daemon.rows("SELECT time FROM metric")[0][0])
+        self.assertEqual(metric, {"id": 1, "metric_id": 0x5B0003, "message": {
+            "duration": 3, "issuetype": "process_stopped", "node": "player",
+            "rtaidclient": "firefox"}})
+        for command in ("events", "energy", "incidents", "metrics"):
+            self.assertEqual(self.ctl(command).returncode, 0)
+
+    def test_incidents_and_broken_rows_are_told_as_far_as_they_are_known(self):
+        self.flush()
+        store = sqlite3.connect(self.daemon.store_path)
+        store.execute("""INSERT INTO incident VALUES(1, '{"domain": "a"}', '/var/report', 5)""")
+        store.execute("INSERT INTO incident VALUES(2, '{', NULL, 'x')")
+        store.execute("INSERT INTO metric VALUES(1, 5963779, x'ff', 5), (2, 7, x'0800', 6)")
+        store.commit()
+        store.close()
+        self.assertEqual(self.listed("incidents"), [
+            {"id": 1, "signature": {"domain": "a"}, "report": "/var/report", "time": 5.0},
+            {"id": 2, "signature": None, "report": None, "time": None}])
+        self.assertEqual([m["message"] for m in self.listed("metrics")], [None, None])
+
+    def test_a_results_file_of_a_trace_is_summed_up(self):
+        path = self.daemon.path("tracing_results.pbj")
+        values = [{"name": "decode", "real_time": value, "cpu_time": value, "time_unit": "ns",
+                   "iterations": 1} for value in (4.0, 1.0, 3.0)]
+        with open(path, "w", encoding="utf-8") as file:
+            json.dump({"context": {"name": "HYReporting"}, "benchmarks": values}, file)
+        self.assertEqual(self.listed("trace", path), [
+            {"name": "decode", "count": 3, "min": 1.0, "median": 3.0, "p90": 4.0, "p99": 4.0,
+             "max": 4.0, "total": 8.0}])
+        self.assertIn("decode", self.ctl("trace", path).stdout)
+        self.assertEqual(self.ctl("trace", self.daemon.log_path).returncode, 1)
+        self.assertEqual(self.ctl("trace").returncode, 2)
+
+
 class Asking(CtlTest):
     def test_status_is_what_the_daemon_answers(self):
         client = self.connect()
@@ -183,7 +279,8 @@ class NotThere(unittest.TestCase):
         self.assertIn("systemctl start halyardd.socket", done.stderr)
 
     def test_without_a_store_there_is_none_to_read(self):
-        for command in ("sessions", "messages"):
+        for command in ("sessions", "messages", "glitches", "events", "energy", "incidents",
+                        "metrics"):
             done = ctl(command, "--json", state=self.state)
             self.assertEqual((done.returncode, done.stdout), (3, ""))
 

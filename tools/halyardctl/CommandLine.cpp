@@ -10,6 +10,16 @@
 namespace halyard::ctl {
 namespace {
 
+// None for any other word.
+std::optional<reading::GlitchKey> glitchKey(const std::string& name) {
+    using reading::GlitchKey;
+    return name == "app"      ? std::optional(GlitchKey::Application)
+           : name == "device" ? std::optional(GlitchKey::Device)
+           : name == "cause"  ? std::optional(GlitchKey::Cause)
+           : name == "hour"   ? std::optional(GlitchKey::Hour)
+                              : std::nullopt;
+}
+
 class CommandLine {
 public:
     explicit CommandLine(Context& context);
@@ -21,10 +31,15 @@ private:
     void addPlaces();
     // Commands that list rows of the store.
     void addLists();
+    // Commands about files.
+    void addFiles();
     void takeRange(CLI::App* command);
     void takeApplication(CLI::App* command);
 
     Context& context_;
+    std::string ignored_; // by CLI11's check, which keeps what it stands for
+    std::string by_;
+    std::string file_;
     CLI::App app_{"How the sound of this device is doing, and what halyardd knows of it."};
     std::function<Exit()> chosen_;
 };
@@ -36,6 +51,7 @@ CommandLine::CommandLine(Context& context) : context_(context) {
     addPlaces();
     add("status", "What the daemon says of itself", [this] { return runStatus(context_); });
     addLists();
+    addFiles();
 }
 
 CLI::App* CommandLine::add(const char* name, const char* what, std::function<Exit()> run) {
@@ -63,11 +79,10 @@ void CommandLine::takeRange(CLI::App* command) {
                               "yesterday, or how long ago, like 90m";
         };
     };
-    static std::string ignored;
-    command->add_option("--since", ignored, "Nothing older: a time, today, yesterday, or 90m")
+    command->add_option("--since", ignored_, "Nothing older: a time, today, yesterday, or 90m")
         ->type_name("TIME")
         ->check(CLI::Validator(take(context_.range.since), ""));
-    command->add_option("--until", ignored, "Nothing from then on")
+    command->add_option("--until", ignored_, "Nothing from then on")
         ->type_name("TIME")
         ->check(CLI::Validator(take(context_.range.until), ""));
 }
@@ -80,13 +95,37 @@ void CommandLine::takeApplication(CLI::App* command) {
 }
 
 void CommandLine::addLists() {
-    for (CLI::App* const command :
-         {add("sessions", "What played and recorded", [this] { return runSessions(context_); }),
-          add("messages", "Every message that was kept",
-              [this] { return runMessages(context_); })}) {
+    const auto list = [this](const char* name, const char* what, std::function<Exit()> run) {
+        CLI::App* const command = add(name, what, std::move(run));
         takeRange(command);
-        takeApplication(command);
-    }
+        return command;
+    };
+    const auto table = [&](const char* name, const char* what, linux_::StoreTable of) {
+        list(name, what, [this, of] { return runTable(context_, of); });
+    };
+    takeApplication(list("sessions", "What played and recorded, how long, and on what",
+                         [this] { return runSessions(context_); }));
+    takeApplication(
+        list("messages", "Every message that was kept", [this] { return runMessages(context_); }));
+    CLI::App* const glitches =
+        list("glitches", "When sound was missing, for how long, on what, and why",
+             [this] { return runGlitches(context_, glitchKey(by_)); });
+    takeApplication(glitches);
+    glitches->add_option("--by", by_, "Summed up by application, device, cause or hour")
+        ->type_name("app|device|cause|hour")
+        ->check([](const std::string& name) {
+            return glitchKey(name) ? "" : "app, device, cause or hour";
+        });
+    table("events", "The analytics events", linux_::StoreTable::AnalyticsEvent);
+    table("energy", "What was told to the energy ledger", linux_::StoreTable::EnergyEvent);
+    table("incidents", "What was captured for analysis", linux_::StoreTable::Incident);
+    table("metrics", "What was posted as a metric", linux_::StoreTable::Metric);
+}
+
+void CommandLine::addFiles() {
+    CLI::App* const trace = add("trace", "What a trace measured: the durations in a results file",
+                                [this] { return runTrace(context_, file_); });
+    trace->add_option("FILE", file_, "tracing_results.pbj of a trace")->required();
 }
 
 Exit CommandLine::run(int count, const char* const* words) {

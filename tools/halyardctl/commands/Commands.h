@@ -7,11 +7,18 @@
 #include <vector>
 
 #include "Context.h"
+#include "linux/store/Schema.h"
+#include "reading/GlitchTally.h"
 
 namespace halyard::ctl {
 
 Exit runStatus(Context& context);
 Exit runSessions(Context& context);
 Exit runMessages(Context& context);
+// Each, or summed up.
+Exit runGlitches(Context& context, std::optional<reading::GlitchKey> by);
+// The rows of a table that is none of the above.
+Exit runTable(Context& context, linux_::StoreTable table);
+Exit runTrace(Context& context, const std::string& file);
 
 } // namespace halyard::ctl
