@@ -286,6 +286,57 @@ TEST_F(StreamTrackerTest, ASessionGoesOnWhenItsNodeTurnsIntoSomethingElse) {
     EXPECT_EQ(sink_.takeLines(), (Lines{"volume 1 silent", "playback stop", "close 1000"}));
 }
 
+TEST_F(StreamTrackerTest, AnUnpluggedDeviceStaysTheStreamsUntilItHasAnother) {
+    play();
+    remove(kSpeaker);
+    settle();
+    remove(30);
+    remove(31);
+    settle();
+    EXPECT_TRUE(sink_.lines.empty());
+    link(32, kStream, kHeadphones);
+    settle();
+    EXPECT_EQ(sink_.takeLines(),
+              (Lines{"volume 1 silent", "route out.headphones", "volume 1 playing"}));
+}
+
+TEST_F(StreamTrackerTest, AStreamWhoseDeviceIsUnpluggedStopsWhereItPlayed) {
+    play();
+    remove(kSpeaker);
+    state(NodeState::Stopped);
+    settle();
+    EXPECT_EQ(sink_.takeLines(), (Lines{"volume 1 silent", "playback stop"}));
+    const Message& end = sink_.messages[sink_.messages.size() - 2];
+    EXPECT_EQ(end.contents.get<Names>("active_devices"), (Names{"out.speaker"}));
+}
+
+TEST_F(StreamTrackerTest, ANewNameInMidSessionIsNotTold) {
+    play();
+    tracker_.handle(NodeChanged{
+        kStream, {{"media.class", "Stream/Output/Audio"}, {"application.name", "Renamed"}}});
+    tracker_.handle(ClientChanged{kClient, {{"application.name", "Renamed"}}});
+    settle();
+    EXPECT_TRUE(sink_.lines.empty());
+    volume(0.125F);
+    settle();
+    EXPECT_EQ(sink_.last().contents.get<std::string>("VQSessionVolumeOperationProcess"), "Player");
+}
+
+TEST_F(StreamTrackerTest, ADeviceKeepsItsVolumeWhenItsPropertiesChange) {
+    volume(0.125F, false, kSpeaker);
+    device(kSpeaker, "out.speaker");
+    play();
+    EXPECT_EQ(sink_.last().contents.get<double>("VQSessionVolume"), 0.5);
+}
+
+TEST_F(StreamTrackerTest, ARenamedDeviceIsAnotherRoute) {
+    play();
+    device(kSpeaker, "out.living-room");
+    settle();
+    EXPECT_EQ(sink_.takeLines(),
+              (Lines{"volume 1 silent", "route out.living-room", "volume 1 playing"}));
+}
+
 TEST_F(StreamTrackerTest, ObjectsBeyondTheBoundAreIgnoredAndCounted) {
     for (ObjectId id = 0; id < StreamTracker::kMaxObjects; ++id) {
         link(id, 1, 2);
