@@ -13,13 +13,18 @@ namespace {
 
 constexpr std::size_t kFirstRead = 4096;
 
+Result<int> openPath(const std::filesystem::path& path) {
+    const int descriptor = ::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
+    return descriptor >= 0 ? Result<int>(descriptor) : Failure::ofErrno();
+}
+
 } // namespace
 
-SampledFile::SampledFile(std::filesystem::path path, DescriptorBudget& budget)
-    : path_(std::move(path)), budget_(&budget) {}
+SampledFile::SampledFile(std::filesystem::path path, DescriptorBudget& budget, Opener opener)
+    : path_(std::move(path)), budget_(&budget), opener_(std::move(opener)) {}
 
 SampledFile::SampledFile(SampledFile&& other) noexcept
-    : path_(std::move(other.path_)), budget_(other.budget_),
+    : path_(std::move(other.path_)), budget_(other.budget_), opener_(std::move(other.opener_)),
       descriptor_(std::exchange(other.descriptor_, -1)), ofKernel_(other.ofKernel_),
       oneRead_(other.oneRead_) {}
 
@@ -36,10 +41,11 @@ void SampledFile::close() {
 }
 
 Result<void> SampledFile::open() {
-    const int descriptor = ::open(path_.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY);
-    if (descriptor < 0) {
-        return Failure::ofErrno();
+    const Result<int> opened = opener_ ? opener_() : openPath(path_);
+    if (!opened.ok()) {
+        return opened.failure();
     }
+    const int descriptor = opened.value();
     struct stat facts {};
     if (::fstat(descriptor, &facts) != 0 || !S_ISREG(facts.st_mode)) {
         ::close(descriptor);
@@ -111,7 +117,7 @@ Result<void> SampledFile::read(std::string& text) {
     Result<void> result = open();
     if (result.ok()) {
         result = readOpen(text);
-        if (!result.ok() || budget_->load() < 0) {
+        if (!result.ok() || opener_ || budget_->load() < 0) {
             close();
         }
     }

@@ -12,6 +12,7 @@
 #include <atomic>
 #include <cstddef>
 #include <filesystem>
+#include <functional>
 #include <string>
 
 #include "common/Result.h"
@@ -25,8 +26,13 @@ using DescriptorBudget = std::atomic<int>;
 
 class SampledFile {
 public:
-    // Borrows the budget. Opens nothing yet.
-    SampledFile(std::filesystem::path path, DescriptorBudget& budget);
+    // Opens the file in another way than by its path; the caller owns the descriptor.
+    using Opener = std::function<Result<int>()>;
+
+    // Borrows the budget. Opens nothing yet. With an opener, which is there because
+    // the file is not to be trusted, it does so for each read, and the path is only
+    // what the file is called.
+    SampledFile(std::filesystem::path path, DescriptorBudget& budget, Opener opener = {});
     SampledFile(SampledFile&& other) noexcept;
     SampledFile& operator=(SampledFile&&) = delete;
     ~SampledFile();
@@ -43,6 +49,7 @@ private:
 
     std::filesystem::path path_;
     DescriptorBudget* budget_;
+    Opener opener_;
     int descriptor_ = -1;
     bool ofKernel_ = false; // Its path leads to it for as long as it is there,
     bool oneRead_ = false;  // and one read yields all of it.
