@@ -12,6 +12,7 @@ namespace halyard::linux_ {
 namespace {
 
 constexpr std::size_t kLookupBuffer = 16384;
+constexpr int kMaxGroups = 1024; // of a user
 
 std::optional<std::uint32_t> asNumber(const std::string& name) {
     std::uint32_t number = 0;
@@ -87,6 +88,24 @@ Peer peerOfSocket(int socket) {
     if (result == 0) {
         groups.resize(length / sizeof(gid_t));
         peer.groups.assign(groups.begin(), groups.end());
+    }
+    return peer;
+}
+
+Peer peerOfUser(std::uint32_t uid) {
+    Peer peer;
+    peer.uid = uid;
+    peer.gid = static_cast<std::uint32_t>(-1); // Nobody's, unless the user is known.
+    char buffer[kLookupBuffer];
+    passwd entry{};
+    passwd* found = nullptr;
+    ::getpwuid_r(uid, &entry, buffer, sizeof buffer, &found);
+    if (found != nullptr) {
+        peer.gid = found->pw_gid;
+        int count = kMaxGroups;
+        peer.groups.resize(kMaxGroups);
+        ::getgrouplist(found->pw_name, found->pw_gid, peer.groups.data(), &count);
+        peer.groups.resize(static_cast<std::size_t>(std::clamp(count, 0, kMaxGroups)));
     }
     return peer;
 }

@@ -36,6 +36,9 @@ enum class PeerRights {
 // The kernel's record of who connected `socket`.
 Peer peerOfSocket(int socket);
 
+// The user with their groups, as the user database has them; may ask other machines.
+Peer peerOfUser(std::uint32_t uid);
+
 // The daemon's own uid and root may do everything.
 PeerRights rightsOf(const Peer& peer, const Access& lists, std::uint32_t ownUid);
 
