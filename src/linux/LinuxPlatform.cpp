@@ -18,6 +18,7 @@ namespace {
 constexpr const char* kSocketName = "reporting";
 constexpr const char* kSocketFile = "reporting.sock";
 constexpr const char* kStoreFile = "telemetry.db";
+constexpr const char* kCyclesFolder = "cycles";
 // Sessions may wait nine seconds for their back ends, the store ten for a disk.
 constexpr std::chrono::seconds kShutdownLimit{25};
 // The same without the store's ten, which it keeps to by itself.
@@ -53,6 +54,13 @@ LinuxPlatform::LinuxPlatform(Directories directories, platform::TraceMarks& trac
       reloadSignals_(context_, SIGHUP), watchdog_(context_), shutdownLimit_(context_),
       log_(LogWriter::defaultOutput()), system_(directories_),
       configuration_(directories_.configuration), ownProcess_([this] { saveWhatWasAccepted(); }),
+      ownerRights_(
+          system_.clock,
+          [this] {
+              const auto settings = configuration_.configuration.settings();
+              return std::shared_ptr<const Access>(settings, &settings->access);
+          },
+          ::getuid()),
       startTime_(system_.clock.steadyTime()) {
     std::signal(SIGPIPE, SIG_IGN);
     platform_.log = &log_;
@@ -84,14 +92,28 @@ void LinuxPlatform::makeServices(const Settings& settings) {
                 (void)store_->store.addIncident(signature, report);
             }});
     platform_.incidentReporter = incidents_.get();
-    hwReport_ = std::make_unique<LinuxHWReport>(system_.clock, settings.driverChannels,
-                                                LinuxHWReport::Options());
+    hwReport_ =
+        std::make_unique<LinuxHWReport>(system_.clock, settings.driverChannels, driverOptions());
     platform_.hwReport = hwReport_.get();
     traces_ = std::make_unique<TraceServices>(directories_, system_.clock, [this] {
         return listener_ ? listener_->connectedProcesses() : std::vector<std::int32_t>();
     });
     traces_->offerTo(platform_);
     applySettings(settings);
+}
+
+// Programs of users' sessions leave statistics in a folder beside the socket, and
+// are trusted as those who may connect.
+LinuxHWReport::Options LinuxPlatform::driverOptions() {
+    LinuxHWReport::Options options;
+    options.cycles = directories_.runtime / kCyclesFolder;
+    options.trusts = [this](std::uint32_t uid) { return ownerRights_.mayConnect(uid); };
+    if (const Result<void> made = SharedFolder::make(options.cycles); !made.ok()) {
+        HY_LOG_ERROR(HYReportingPlatformCategory, "no folder for statistics of cycles: {}",
+                     made.failure().message());
+        options.cycles.clear();
+    }
+    return options;
 }
 
 LinuxPlatform::~LinuxPlatform() {

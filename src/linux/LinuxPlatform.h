@@ -16,6 +16,7 @@
 #include "common/Result.h"
 #include "linux/config/ConfigurationServices.h"
 #include "linux/drivers/LinuxHWReport.h"
+#include "linux/net/OwnerRights.h"
 #include "linux/net/SocketListener.h"
 #include "linux/queues/Pressure.h"
 #include "linux/queues/Queues.h"
@@ -50,6 +51,7 @@ private:
     Dictionary status() const override;
 
     void makeServices(const Settings& settings);
+    LinuxHWReport::Options driverOptions();
     void applySettings(const Settings& settings);
     void watchStopSignals();
     void watchReloadSignal();
@@ -74,6 +76,7 @@ private:
     ProcOwnProcess ownProcess_;
     std::unique_ptr<StoreServices> store_;
     std::unique_ptr<IncidentFolder> incidents_;
+    OwnerRights ownerRights_; // the service queue's
     std::unique_ptr<LinuxHWReport> hwReport_;
     std::unique_ptr<TraceServices> traces_;
     std::unique_ptr<Queues> queues_;

@@ -24,6 +24,10 @@ def channel(name, source, group="Speaker", driver="", unit=""):
     return CHANNEL.format(name=name, source=source, group=group, driver=driver, unit=unit)
 
 
+AS_ROOT = unittest.skipUnless(os.geteuid() == 0, "only root can leave files of others")
+STRANGER = 12345
+
+
 class DriversTest(DaemonTest):
     def setUp(self):
         self.files = tempfile.TemporaryDirectory(prefix="halyard-drivers-")
@@ -174,6 +178,121 @@ class BrokenChannels(DriversTest):
                       '"pie" is no kind of source', log)
         self.assertIn("error 22 getting channels for driver Speaker-(null)", log)
         self.assertIn("subscribed to group group Speaker-(null)", log)
+
+
+class CyclesTest(DriversTest):
+    """What a program of the user's session counts of the cycles of audio devices."""
+
+    BOUNDS = (0, 10, 100, 1000, 10000)
+
+    def configure(self):
+        return ""
+
+    def folder(self, name=""):
+        return self.daemon.path("run", "cycles", name)
+
+    def put(self, name, text):
+        temporary = self.folder(f".{name}.tmp-1")
+        with open(temporary, "w", encoding="utf-8") as file:
+            file.write(text)
+        os.rename(temporary, self.folder(name))
+
+    def put_device(self, stem, missed, wait, busy, cycle):
+        """Each of the last three: the hits of the buckets."""
+        self.put(stem + ".counts", f"direction sink\ncycles {sum(wait)}\nmissed {missed}\n")
+        for part, hits in (("wait", wait), ("busy", busy), ("cycle", cycle)):
+            lines = zip(self.BOUNDS, self.BOUNDS[1:], hits)
+            self.put(f"{stem}.{part}", "".join("%d %d %d\n" % line for line in lines))
+
+    def expected(self, before, after):
+        hits = [(lower, upper, new - old) for lower, upper, old, new
+                in zip(self.BOUNDS, self.BOUNDS[1:], before, after) if new != old]
+        return (f"count={len(before)},lower=0,upper={self.BOUNDS[-1]},min={hits[0][0]},"
+                f"max={hits[-1][1]},unit=us::" + ";".join("%d-%d:%d" % hit for hit in hits))
+
+    def report(self, *devices):
+        """All that was reported of these devices."""
+        rows = self.rows("SELECT payload FROM upload_message WHERE category = 12 ORDER BY id")
+        return {key: value for (payload,) in rows for key, value in json.loads(payload).items()
+                if key.startswith(tuple(device + "_" for device in devices))}
+
+    def stranger_counts(self):
+        """The cycles that are reported when somebody else leaves the files."""
+        client = self.connect()
+        self.start(client, 7)
+        self.put_device("out-a", 1, (5, 0, 0, 0), (5, 0, 0, 0), (5, 0, 0, 0))
+        for name in os.listdir(self.folder()):
+            os.chown(self.folder(name), STRANGER, STRANGER)
+        client.result("stopReportingSessionForID", 7)
+        return self.report("a").get("a_Speaker_Simple_Cycles")
+
+
+class Cycles(CyclesTest):
+    def test_a_stop_reports_the_cycles_since_the_start(self):
+        client = self.connect()
+        self.put_device("out-big%20speaker", 3, (50, 50, 0, 0), (0, 90, 10, 0), (0, 0, 100, 0))
+        self.start(client, 7)
+        self.put_device("out-big%20speaker", 5, (50, 80, 20, 0), (0, 90, 50, 10), (0, 0, 150, 0))
+        self.put_device("in-microphone", 0, (8, 0, 0, 0), (0, 8, 0, 0), (0, 0, 8, 0))
+        client.result("stopReportingSessionForID", 7)
+        none = (0, 0, 0, 0)
+        self.assertEqual(self.report("bigspeaker", "microphone"), {
+            "bigspeaker_Speaker_Simple_Cycles": 50,
+            "bigspeaker_Speaker_Simple_Missedcycles": 2,
+            "bigspeaker_Speaker_Histogram_Wait": self.expected((50, 50, 0, 0), (50, 80, 20, 0)),
+            "bigspeaker_Speaker_Histogram_Busy": self.expected((0, 90, 10, 0), (0, 90, 50, 10)),
+            "bigspeaker_Speaker_Histogram_Cycletime": self.expected((0, 0, 100, 0), (0, 0, 150, 0)),
+            "microphone_Rx_Simple_Cycles": 8,  # It came meanwhile, and no cycle was missed.
+            "microphone_Rx_Histogram_Wait": self.expected(none, (8, 0, 0, 0)),
+            "microphone_Rx_Histogram_Busy": self.expected(none, (0, 8, 0, 0)),
+            "microphone_Rx_Histogram_Cycletime": self.expected(none, (0, 0, 8, 0))})
+
+    def test_everybody_may_leave_files_there(self):
+        self.assertEqual(os.stat(self.folder()).st_mode & 0o7777, 0o1777)
+
+    def test_a_program_that_begins_anew_is_counted_from_there(self):
+        client = self.connect()
+        self.put_device("out-a", 3, (50, 50, 0, 0), (0, 90, 10, 0), (0, 0, 100, 0))
+        self.start(client, 7)
+        self.put_device("out-a", 1, (4, 0, 0, 0), (0, 4, 0, 0), (0, 0, 4, 0))
+        client.result("stopReportingSessionForID", 7)
+        report = self.report("a")
+        self.assertEqual(report["a_Speaker_Simple_Cycles"], 4)
+        self.assertEqual(report["a_Speaker_Simple_Missedcycles"], 1)
+
+    def test_what_else_lies_there_costs_nothing(self):
+        client = self.connect()
+        self.put_device("out-a", 0, (1, 0, 0, 0), (1, 0, 0, 0), (1, 0, 0, 0))
+        self.start(client, 7)
+        os.mkfifo(self.folder("out-pipe.counts"))
+        os.mkdir(self.folder("out-folder.counts"))
+        self.put("secret", "cycles 77\nmissed 77\n")
+        os.symlink(self.folder("secret"), self.folder("out-link.counts"))
+        self.put("out-huge.counts", "cycles " + "9" * 30 + "\nmissed -5\n")
+        self.put("out-long.counts", "cycles 1\n" * 100000)
+        self.put("out-nonsense.counts", "\0\n%s\n")
+        for number in range(500):
+            os.symlink("nowhere", self.folder(f"out-flood{number}.counts"))
+        self.put_device("out-a", 2, (3, 0, 0, 0), (3, 0, 0, 0), (3, 0, 0, 0))
+        client.result("stopReportingSessionForID", 7)
+        self.assertEqual(self.report("a", "pipe", "folder", "link", "huge", "long", "nonsense"), {
+            "a_Speaker_Simple_Cycles": 2, "a_Speaker_Simple_Missedcycles": 2,
+            "a_Speaker_Histogram_Wait": self.expected((1, 0, 0, 0), (3, 0, 0, 0)),
+            "a_Speaker_Histogram_Busy": self.expected((1, 0, 0, 0), (3, 0, 0, 0)),
+            "a_Speaker_Histogram_Cycletime": self.expected((1, 0, 0, 0), (3, 0, 0, 0))})
+
+    @AS_ROOT
+    def test_who_may_not_connect_counts_nothing(self):
+        self.assertIsNone(self.stranger_counts())
+
+
+@AS_ROOT
+class CyclesOfOthers(CyclesTest):
+    def configure(self):
+        return f'[access]\nusers = ["{STRANGER}"]\n'
+
+    def test_who_may_connect_counts(self):
+        self.assertEqual(self.stranger_counts(), 5)
 
 
 @unittest.skipUnless(glob.glob("/sys/devices/system/cpu/cpu0/cpuidle/state0"),

@@ -1,5 +1,6 @@
 // Puts the statistics of cycles into files, where halyardd can read them as it
-// reads those of drivers: into a folder that it has made, four files for each device.
+// reads those of drivers: into a folder that it has made, four files for each device
+// (docs/drivers.md has the form).
 //
 // Each file is replaced as a whole, so that a reader sees the old one or the new
 // one. A file that is missing tells readers that nothing has been counted, so what

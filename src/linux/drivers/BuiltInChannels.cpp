@@ -68,13 +68,6 @@ std::vector<std::string> numbered(const fs::path& directory, std::string_view pr
     return names;
 }
 
-// What is left of a name where statistics are reported: "Pad 2" and "Pad2" are one
-// there.
-std::string asInKeys(std::string name) {
-    std::erase_if(name, [](char character) { return character == ' ' || character == '_'; });
-    return name;
-}
-
 class Finder {
 public:
     explicit Finder(const SourceRoot& root) : root_(root) {}

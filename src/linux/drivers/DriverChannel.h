@@ -32,4 +32,11 @@ struct DriverChannel {
 
 inline constexpr std::size_t kMaxDriverChannels = 1024;
 
+// What is left of a name where statistics are reported: "Pad 2" and "Pad2" are one
+// there.
+inline std::string asInKeys(std::string name) {
+    std::erase_if(name, [](char character) { return character == ' ' || character == '_'; });
+    return name;
+}
+
 } // namespace halyard::linux_

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <fmt/format.h>
 #include <tuple>
+#include <utility>
 
 #include "linux/drivers/BuiltInChannels.h"
 #include "linux/drivers/SourceKinds.h"
@@ -42,18 +43,53 @@ std::shared_ptr<ChannelSource> withRoot(std::unique_ptr<ChannelSource> source,
     return {both, both->source.get()};
 }
 
+// Tells the log when a channel begins to fail, and when it no longer does.
+void noteChange(const ChannelFacts& facts, bool& failing, bool fails, const Reading& reading) {
+    if (std::exchange(failing, fails) == fails) {
+        return;
+    }
+    if (fails) {
+        HY_LOG_DEFAULT(HYReportingPlatformCategory, "driver channel {} cannot be read: {}",
+                       describe(facts.names), reading.fault);
+    } else {
+        HY_LOG_DEFAULT(HYReportingPlatformCategory, "driver channel {} can be read again",
+                       describe(facts.names));
+    }
+}
+
 } // namespace
 
 LinuxHWReport::LinuxHWReport(const platform::Clock& clock,
                              const std::vector<DriverChannel>& configured, Options options)
     : clock_(clock), guarded_(options.patience) {
-    root_->path = std::move(options.root);
+    root_->path = options.root;
     for (const DriverChannel& channel : builtInChannels(*root_)) {
         add(channel, false);
     }
     for (const DriverChannel& channel : configured) {
         add(channel, true);
     }
+    addCycles(options);
+}
+
+void LinuxHWReport::addCycles(const Options& options) {
+    if (options.cycles.empty()) {
+        return;
+    }
+    const auto folder = std::make_shared<const SharedFolder>(options.cycles, options.trusts);
+    if (!folder->isThere()) {
+        return;
+    }
+    for (const CycleChannels::Direction& direction : CycleChannels::kDirections) {
+        cycles_.emplace_back(folder, root_, direction,
+                             [this](const DriverChannel& names) { return hasChannel(names); });
+    }
+}
+
+bool LinuxHWReport::hasChannel(const DriverChannel& names) const {
+    return std::any_of(channels_.begin(), channels_.end(), [&](const Channel& each) {
+        return identity(each.facts->names) == identity(names);
+    });
 }
 
 void LinuxHWReport::add(const DriverChannel& names, bool configured) {
@@ -98,6 +134,11 @@ LinuxHWReport::copyChannelsInGroup(const std::optional<std::string>& group,
             list->places.push_back(place);
         }
     }
+    for (std::size_t place = 0; place < cycles_.size(); ++place) {
+        if (!subGroup && (!group || cycles_[place].group() == *group)) {
+            list->cycles.push_back(place);
+        }
+    }
     const bool complete =
         std::none_of(leftOut_.begin(), leftOut_.end(),
                      [&](const DriverChannel& names) { return isIn(names, group, subGroup); });
@@ -106,7 +147,8 @@ LinuxHWReport::copyChannelsInGroup(const std::optional<std::string>& group,
 
 std::int64_t LinuxHWReport::getChannelCount(const platform::HWReportChannels& channels) const {
     const auto* const list = dynamic_cast<const ChannelList*>(&channels);
-    return list != nullptr ? static_cast<std::int64_t>(list->channels.size()) : 0;
+    return list != nullptr ? static_cast<std::int64_t>(list->channels.size() + list->cycles.size())
+                           : 0;
 }
 
 platform::HWReportSubscribed
@@ -132,21 +174,6 @@ std::vector<Reading> LinuxHWReport::readConfigured(const ChannelList& list,
     return sources.empty() ? std::vector<Reading>() : guarded_.read(sources, now);
 }
 
-void LinuxHWReport::noteFailure(Channel& channel, const Reading& reading) {
-    const bool failing = reading.status != ReadStatus::Read;
-    if (failing == channel.failing) {
-        return;
-    }
-    channel.failing = failing;
-    if (failing) {
-        HY_LOG_DEFAULT(HYReportingPlatformCategory, "driver channel {} cannot be read: {}",
-                       describe(channel.facts->names), reading.fault);
-    } else {
-        HY_LOG_DEFAULT(HYReportingPlatformCategory, "driver channel {} can be read again",
-                       describe(channel.facts->names));
-    }
-}
-
 platform::HWReportResult<platform::HWReportSamplesRef>
 LinuxHWReport::createSamples(platform::HWReportSubscription* subscription,
                              const platform::HWReportChannels* channels) {
@@ -162,10 +189,26 @@ LinuxHWReport::createSamples(platform::HWReportSubscription* subscription,
         Channel& channel = channels_[place];
         const Reading reading =
             channel.configured ? std::move(configured[next++]) : channel.source->read(now);
-        noteFailure(channel, reading);
+        noteChange(*channel.facts, channel.failing, reading.status != ReadStatus::Read, reading);
         samples->add(reading);
     }
+    sampleCycles(*own->list, now, *samples);
     return {samples, std::nullopt};
+}
+
+void LinuxHWReport::sampleCycles(const ChannelList& list, platform::SteadyTime now,
+                                 SampleSet& samples) {
+    for (const std::size_t place : list.cycles) {
+        const bool all = cycles_[place].read(
+            now, [&](const ChannelFactsRef& facts, bool& failing, const Reading& reading) {
+                // A device may come and go, and need not have all of its files.
+                noteChange(*facts, failing, reading.status == ReadStatus::Failed, reading);
+                samples.addFound(facts, reading);
+            });
+        if (!all) {
+            samples.setCurtailed();
+        }
+    }
 }
 
 platform::HWReportResult<platform::HWReportSamplesRef>

@@ -5,6 +5,9 @@
 // Which channels there are is settled at construction. An operator's sources are
 // read behind a guard (see GuardedReader), because nobody knows what they are;
 // the built-in ones never wait.
+//
+// Settled, too, is which groups grow by the devices whose cycles a program counts:
+// these come and go, and are looked for at each sample (see CycleChannels).
 #pragma once
 
 #include <chrono>
@@ -16,9 +19,11 @@
 #include <vector>
 
 #include "linux/drivers/ChannelSource.h"
+#include "linux/drivers/CycleChannels.h"
 #include "linux/drivers/DriverChannel.h"
 #include "linux/drivers/GuardedReader.h"
 #include "linux/drivers/SampleSet.h"
+#include "linux/drivers/SharedFolder.h"
 #include "platform/Clock.h"
 #include "platform/HWReport.h"
 
@@ -29,6 +34,9 @@ public:
     struct Options {
         std::filesystem::path root = "/"; // of every source
         std::chrono::milliseconds patience{500};
+        // Where statistics of cycles are; empty, and when nothing is there: nowhere.
+        std::filesystem::path cycles = {};
+        SharedFolder::Trust trusts = {}; // Whose. Required beside `cycles`.
     };
 
     // Borrows the clock. A channel that makes no sense is left out with an error
@@ -68,14 +76,17 @@ private:
     };
 
     void add(const DriverChannel& names, bool configured);
+    void addCycles(const Options& options);
+    bool hasChannel(const DriverChannel& names) const;
+    void sampleCycles(const ChannelList& list, platform::SteadyTime now, SampleSet& samples);
     std::vector<Reading> readConfigured(const ChannelList& list, platform::SteadyTime now);
-    static void noteFailure(Channel& channel, const Reading& reading);
 
     const platform::Clock& clock_;
     // Shared with the sources, some of which may never come back from a read.
     const std::shared_ptr<SourceRoot> root_ = std::make_shared<SourceRoot>();
     std::vector<Channel> channels_;
     std::vector<DriverChannel> leftOut_;
+    std::deque<CycleChannels> cycles_; // that lists borrow
     std::deque<Subscription> subscriptions_;
     GuardedReader guarded_;
 };

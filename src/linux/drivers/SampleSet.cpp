@@ -1,6 +1,7 @@
 #include "linux/drivers/SampleSet.h"
 
 #include <algorithm>
+#include <cassert>
 #include <limits>
 
 namespace halyard::linux_ {
@@ -40,6 +41,22 @@ void setEnds(HWReportChannel& channel) {
 } // namespace
 
 void SampleSet::add(const Reading& reading) {
+    assert(entries_.size() < list_->channels.size());
+    append(reading);
+}
+
+void SampleSet::addFound(ChannelFactsRef facts, const Reading& reading) {
+    assert(entries_.size() == list_->channels.size() + found_.size());
+    found_.push_back(std::move(facts));
+    append(reading);
+}
+
+const ChannelFacts& SampleSet::factsAt(std::size_t index) const {
+    const std::size_t listed = list_->channels.size();
+    return index < listed ? *list_->channels[index] : *found_[index - listed];
+}
+
+void SampleSet::append(const Reading& reading) {
     Entry entry;
     entry.status = reading.status;
     if (reading.status == ReadStatus::Read) {
@@ -64,7 +81,7 @@ void SampleSet::iterate(const std::function<int(const HWReportChannel&)>& callba
 }
 
 void SampleSet::fill(HWReportChannel& channel, std::size_t index) const {
-    const ChannelFacts& facts = *list_->channels[index];
+    const ChannelFacts& facts = factsAt(index);
     channel.format = reported(facts.names.format);
     channel.driver = unlessEmpty(facts.names.driver);
     channel.group = facts.names.group;
@@ -170,9 +187,26 @@ std::shared_ptr<const SampleSet> SampleSet::since(const SampleSet& before) const
     return delta;
 }
 
+// A set that was curtailed does not know whether a channel that it lacks was there.
+SampleSet::Entry SampleSet::entryOf(const SampleSet& later, std::size_t index) const {
+    const std::size_t listed = list_->channels.size();
+    if (index < listed) {
+        return entries_[index];
+    }
+    const std::string& source = later.factsAt(index).names.source;
+    const auto at = std::find_if(found_.begin(), found_.end(),
+                                 [&](const auto& facts) { return facts->names.source == source; });
+    if (at != found_.end()) {
+        return entries_[listed + static_cast<std::size_t>(at - found_.begin())];
+    }
+    Entry none;
+    none.status = curtailed_ ? ReadStatus::Failed : ReadStatus::Absent;
+    return none;
+}
+
 void SampleSet::subtract(std::size_t index, const SampleSet& before) {
     Entry& now = entries_[index];
-    const Entry& then = before.entries_[index];
+    const Entry then = before.entryOf(*this, index);
     if (now.status != ReadStatus::Read || then.status == ReadStatus::Failed) {
         now = Entry(); // Nobody knows what it changed from, or to.
         return;
@@ -193,8 +227,8 @@ void SampleSet::subtract(std::size_t index, const SampleSet& before) {
 }
 
 std::size_t SampleSet::footprint() const {
-    return sizeof *this + entries_.capacity() * sizeof(Entry) +
-           numbers_.capacity() * sizeof(std::uint64_t);
+    return sizeof *this + found_.capacity() * sizeof(ChannelFactsRef) +
+           entries_.capacity() * sizeof(Entry) + numbers_.capacity() * sizeof(std::uint64_t);
 }
 
 } // namespace halyard::linux_

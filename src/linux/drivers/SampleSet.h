@@ -30,6 +30,7 @@ using ChannelFactsRef = std::shared_ptr<const ChannelFacts>;
 struct ChannelList final : platform::HWReportChannels {
     std::vector<ChannelFactsRef> channels;
     std::vector<std::size_t> places; // of the same channels in the library
+    std::vector<std::size_t> cycles; // places of those that find more at each sample
 };
 using ChannelListRef = std::shared_ptr<const ChannelList>;
 
@@ -40,8 +41,13 @@ public:
         entries_.reserve(list_->channels.size());
     }
 
-    // The next channel's. Requires fewer calls than channels.
+    // The next channel's. Requires fewer calls than channels in the list.
     void add(const Reading& reading);
+    // Of a channel that came later than the list, told from others by its source.
+    // Requires that all of the list have been added.
+    void addFound(ChannelFactsRef facts, const Reading& reading);
+    // There were more of these than have been added.
+    void setCurtailed() { curtailed_ = true; }
     // The change from `before` to this set. Requires sets of one subscription.
     std::shared_ptr<const SampleSet> since(const SampleSet& before) const;
     // Of a channel that could be read; the caller stops it by other than 0.
@@ -59,6 +65,10 @@ private:
         ReadStatus status = ReadStatus::Failed;
     };
 
+    void append(const Reading& reading);
+    const ChannelFacts& factsAt(std::size_t index) const;
+    // What this set has of the channel that `later` has at `index`.
+    Entry entryOf(const SampleSet& later, std::size_t index) const;
     void subtract(std::size_t index, const SampleSet& before);
     void fill(platform::HWReportChannel& channel, std::size_t index) const;
     void fillBuckets(platform::HWReportChannel& channel, const Entry& entry) const;
@@ -76,6 +86,8 @@ private:
     ChannelListRef list_;
     platform::SteadyTime time_;
     std::optional<std::chrono::nanoseconds> elapsed_; // of a change
+    std::vector<ChannelFactsRef> found_;              // of the entries behind those of the list
+    bool curtailed_ = false;
     std::vector<Entry> entries_;
     std::vector<std::uint64_t> numbers_;
 };

@@ -201,5 +201,82 @@ TEST_F(SampleSetTest, AChannelKeepsNothingOfTheOneBefore) {
     EXPECT_EQ(seen[1].max, 0);
 }
 
+// Channels that come and go with their devices: sets of an empty list.
+class FoundChannelsTest : public ::testing::Test {
+protected:
+    using Found = std::vector<std::pair<std::string, std::uint64_t>>; // source and number
+
+    SampleSet setOf(const Found& found) const {
+        SampleSet set(list_, platform::SteadyTime(100s));
+        for (const auto& [source, number] : found) {
+            auto facts = std::make_shared<ChannelFacts>();
+            facts->names.name = source;
+            facts->names.source = source;
+            Reading reading;
+            reading.status = ReadStatus::Read;
+            reading.numbers = {number};
+            set.addFound(facts, reading);
+        }
+        return set;
+    }
+    static std::vector<std::string> delta(const SampleSet& before, const SampleSet& after) {
+        std::vector<std::string> result;
+        after.since(before)->iterate([&](const platform::HWReportChannel& channel) {
+            result.push_back(std::string(*channel.name) + "=" + std::to_string(channel.value));
+            return 0;
+        });
+        return result;
+    }
+
+    ChannelListRef list_ = std::make_shared<ChannelList>();
+};
+
+TEST_F(FoundChannelsTest, AreTheSameWhenTheirSourcesAre) {
+    EXPECT_THAT(delta(setOf({{"a", 1}, {"b", 2}, {"gone", 3}}), setOf({{"b", 20}, {"a", 10}})),
+                ElementsAre("b=18", "a=9"));
+}
+
+TEST_F(FoundChannelsTest, HaveBegunAtZeroWhenTheyWereNotThere) {
+    EXPECT_THAT(delta(setOf({{"a", 1}}), setOf({{"a", 3}, {"new", 7}})),
+                ElementsAre("a=2", "new=7"));
+}
+
+TEST_F(FoundChannelsTest, AreUnknownWhenNotAllWereLookedAt) {
+    SampleSet before = setOf({{"a", 1}});
+    before.setCurtailed();
+    EXPECT_THAT(delta(before, setOf({{"a", 3}, {"new", 7}})), ElementsAre("a=2"));
+}
+
+TEST_F(FoundChannelsTest, AreUnknownWhenTheyCouldNotBeRead) {
+    SampleSet before = setOf({});
+    auto facts = std::make_shared<ChannelFacts>();
+    facts->names.source = "a";
+    before.addFound(facts, Reading());
+    EXPECT_THAT(delta(before, setOf({{"a", 3}})), IsEmpty());
+}
+
+TEST_F(FoundChannelsTest, StandBehindThoseOfTheList) {
+    auto list = std::make_shared<ChannelList>();
+    list->channels.push_back(std::make_shared<ChannelFacts>());
+    list_ = list;
+    const auto setWith = [&](std::uint64_t listed, const Found& found) {
+        SampleSet set(list_, platform::SteadyTime(100s));
+        Reading reading;
+        reading.status = ReadStatus::Read;
+        reading.numbers = {listed};
+        set.add(reading);
+        for (const auto& [source, number] : found) {
+            auto facts = std::make_shared<ChannelFacts>();
+            facts->names.name = source;
+            facts->names.source = source;
+            reading.numbers = {number};
+            set.addFound(facts, reading);
+        }
+        return set;
+    };
+    EXPECT_THAT(delta(setWith(1, {{"a", 10}, {"b", 20}}), setWith(5, {{"b", 21}, {"c", 2}})),
+                ElementsAre("=4", "b=1", "c=2"));
+}
+
 } // namespace
 } // namespace halyard::linux_
