@@ -61,7 +61,7 @@ GlitchPlayer::GlitchPlayer(const std::vector<std::string>& options) {
     const auto answers = pipeEnds();
     commands_ = commands[1];
     answers_ = answers[0];
-    process_ = Child(arguments, "/dev/stderr", {commands[0], answers[1]});
+    process_ = Child(arguments, "", {commands[0], answers[1]});
     close(commands[0]);
     close(answers[1]);
     const std::string introduction = line();

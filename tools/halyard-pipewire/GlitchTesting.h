@@ -28,7 +28,7 @@ struct Episode {
 // commands. Ends with this object.
 class GlitchPlayer final {
 public:
-    // Returns when it plays (or is linked, with --paused); throws when it does not.
+    // Returns when it plays, or could with --paused; throws when it does not.
     explicit GlitchPlayer(const std::vector<std::string>& options);
     ~GlitchPlayer();
     GlitchPlayer(const GlitchPlayer&) = delete;

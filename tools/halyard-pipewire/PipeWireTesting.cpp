@@ -80,9 +80,11 @@ Child::Child(const std::vector<std::string>& arguments, const fs::path& logFile,
     argv.push_back(nullptr);
     posix_spawn_file_actions_t files;
     posix_spawn_file_actions_init(&files);
-    posix_spawn_file_actions_addopen(&files, 1, logFile.c_str(), O_WRONLY | O_CREAT | O_APPEND,
-                                     0600);
-    posix_spawn_file_actions_adddup2(&files, 1, 2);
+    if (!logFile.empty()) {
+        posix_spawn_file_actions_addopen(&files, 1, logFile.c_str(), O_WRONLY | O_CREAT | O_APPEND,
+                                         0600);
+        posix_spawn_file_actions_adddup2(&files, 1, 2);
+    }
     if (ends.input >= 0) {
         posix_spawn_file_actions_adddup2(&files, ends.input, 0);
     }

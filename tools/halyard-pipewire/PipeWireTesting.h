@@ -24,7 +24,8 @@ public:
         int output = -1;
     };
 
-    // Looks `arguments[0]` up in the path; output goes to `logFile`.
+    // Looks `arguments[0]` up in the path; output goes to `logFile`, or where this
+    // process's goes if that is empty.
     Child(const std::vector<std::string>& arguments, const std::filesystem::path& logFile)
         : Child(arguments, logFile, Ends()) {}
     Child(const std::vector<std::string>& arguments, const std::filesystem::path& logFile,

@@ -36,6 +36,12 @@ pw_properties* clientProperties(const std::string& name) {
 
 Voice::Options voiceOptions(const Player::Options& options) {
     Voice::Options voice = options.voice;
+    if (voice.filter) { // what PipeWire's libjack gives a client's node
+        voice.properties["media.role"] = "DSP";
+        voice.properties.insert({{PW_KEY_MEDIA_CATEGORY, "Duplex"},
+                                 {PW_KEY_NODE_ALWAYS_PROCESS, "true"},
+                                 {PW_KEY_NODE_WANT_DRIVER, "true"}});
+    }
     voice.properties.insert({{PW_KEY_MEDIA_TYPE, "Audio"},
                              {PW_KEY_MEDIA_CATEGORY, voice.capture ? "Capture" : "Playback"},
                              {PW_KEY_APP_NAME, options.name},

@@ -23,7 +23,7 @@ Plays silence on PipeWire and obeys commands, one a line, on its standard input.
   --latency=N/RATE   node.latency (1024/48000)
   --property=KEY=VALUE
   --capture          record
-  --filter           be a filter, as JACK clients are; to be linked by others
+  --filter           be what a JACK client is: runs at once, linked by others
   --ordinary         have no thread of a real-time class
   --streams=N        that many streams of one connection
   --paused           start without running
