@@ -7,11 +7,41 @@ namespace halyard::pipewire {
 
 namespace {
 
+void write(reporting::Dictionary& to, const Contents& contents);
+
+// Writes one fact, whatever it holds.
+struct Writer {
+    reporting::Dictionary& to;
+    const char* key;
+
+    template <class Plain> void operator()(const Plain& fact) const { to.set(key, fact); }
+    void operator()(const Nested& fact) const {
+        for (const Contents& inner : fact.inner) {
+            to.beginDictionary(key);
+            write(to, inner);
+            to.end();
+        }
+    }
+    void operator()(const Dictionaries& facts) const {
+        to.beginList(key);
+        for (const Contents& inner : facts) {
+            to.beginDictionary();
+            write(to, inner);
+            to.end();
+        }
+        to.end();
+    }
+};
+
+void write(reporting::Dictionary& to, const Contents& contents) {
+    for (const auto& entry : contents) {
+        std::visit(Writer{to, entry.key.c_str()}, entry.value);
+    }
+}
+
 reporting::Dictionary toReporting(const Contents& contents) {
     reporting::Dictionary result;
-    for (const auto& entry : contents) {
-        std::visit([&](const auto& fact) { result.set(entry.key.c_str(), fact); }, entry.value);
-    }
+    write(result, contents);
     return result;
 }
 

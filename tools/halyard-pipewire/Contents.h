@@ -14,8 +14,16 @@
 
 namespace halyard::pipewire {
 
+class Contents;
+
 using Names = std::vector<std::string>;
-using Fact = std::variant<std::int64_t, double, std::string, Names>;
+using Dictionaries = std::vector<Contents>;
+// A dictionary in a dictionary.
+struct Nested {
+    std::vector<Contents> inner; // one
+    bool operator==(const Nested&) const = default;
+};
+using Fact = std::variant<std::int64_t, double, std::string, Names, Nested, Dictionaries>;
 
 class Contents final {
 public:
@@ -32,6 +40,7 @@ public:
     void add(std::string key, Fact value) {
         entries_.push_back({std::move(key), std::move(value)});
     }
+    bool empty() const { return entries_.empty(); }
     auto begin() const { return entries_.begin(); }
     auto end() const { return entries_.end(); }
     // What is said of `key`; the kind's empty value when that is nothing, or

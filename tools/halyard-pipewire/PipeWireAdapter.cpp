@@ -48,6 +48,7 @@ public:
 
     void iterate(int timeoutMs);
     void post(std::function<void()> work);
+    void every(std::chrono::milliseconds period, std::function<void()> work);
     void quitOnSignal(int signal);
 
     bool connected() const { return core_ != nullptr && established_; }
@@ -56,6 +57,8 @@ public:
 private:
     void connect();
     void disconnect();
+    void bindProfiler(ObjectId id, std::uint32_t version);
+    void forgetProfiler();
     void lost(const char* reason);
     void established();
     void retryLater();
@@ -71,11 +74,14 @@ private:
                             const char* message);
     static void onSettled(void* data, std::uint64_t expirations);
     static void onRetry(void* data, std::uint64_t expirations);
+    static void onTick(void* data, std::uint64_t expirations);
+    static void onProfile(void* data, const spa_pod* portion);
     static void onPosted(void* data, std::uint64_t count);
     static void onSignal(void* data, int signal);
 
     static const pw_registry_events kRegistryEvents;
     static const pw_core_events kCoreEvents;
+    static const pw_profiler_events kProfilerEvents;
 
     const Options options_;
     const GraphListener outside_;
@@ -90,6 +96,10 @@ private:
     spa_source* settleTimer_ = nullptr;
     spa_source* retryTimer_ = nullptr;
     spa_source* postedEvent_ = nullptr;
+    spa_source* tickTimer_ = nullptr;
+    std::function<void()> tick_;
+    pw_proxy* profiler_ = nullptr;
+    spa_hook profilerHook_{};
     std::map<ObjectId, std::unique_ptr<BoundObject>> objects_;
 
     std::optional<Clock::time_point> burstBegan_;
@@ -115,6 +125,9 @@ const pw_core_events PipeWireAdapter::Impl::kCoreEvents = {.version = PW_VERSION
                                                            .add_mem = nullptr,
                                                            .remove_mem = nullptr};
 
+const pw_profiler_events PipeWireAdapter::Impl::kProfilerEvents = {
+    .version = PW_VERSION_PROFILER_EVENTS, .profile = onProfile};
+
 PipeWireAdapter::Impl::Impl(Options options, GraphListener listener)
     : options_(std::move(options)), outside_(std::move(listener)),
       listener_([this](const GraphEvent& event) { tell(event); }), nextRetry_(options_.firstRetry) {
@@ -127,9 +140,14 @@ PipeWireAdapter::Impl::Impl(Options options, GraphListener listener)
     settleTimer_ = pw_loop_add_timer(loop_, onSettled, this);
     retryTimer_ = pw_loop_add_timer(loop_, onRetry, this);
     postedEvent_ = pw_loop_add_event(loop_, onPosted, this);
+    tickTimer_ = pw_loop_add_timer(loop_, onTick, this);
     if (context_ == nullptr || settleTimer_ == nullptr || retryTimer_ == nullptr ||
-        postedEvent_ == nullptr) {
+        postedEvent_ == nullptr || tickTimer_ == nullptr) {
         throw std::runtime_error("PipeWire gives no context: is its configuration installed?");
+    }
+    // What the profiler says can only be read with its module on this side as well.
+    if (options_.cycle && raw::loadModule(context_, PW_EXTENSION_MODULE_PROFILER) == nullptr) {
+        note("cannot read PipeWire's profiler: glitches are not seen");
     }
     pw_loop_enter(loop_);
     setTimer(retryTimer_, std::chrono::nanoseconds(1));
@@ -153,6 +171,20 @@ void PipeWireAdapter::Impl::post(std::function<void()> work) {
         posted_.push_back(std::move(work));
     }
     pw_loop_signal_event(loop_, postedEvent_);
+}
+
+void PipeWireAdapter::Impl::every(std::chrono::milliseconds period, std::function<void()> work) {
+    tick_ = std::move(work);
+    timespec value = toTimespec(period);
+    timespec interval = value;
+    pw_loop_update_timer(loop_, tickTimer_, &value, &interval, false);
+}
+
+void PipeWireAdapter::Impl::onTick(void* data, std::uint64_t) {
+    // A copy: the work may ask for another.
+    if (const auto work = static_cast<Impl*>(data)->tick_) {
+        work();
+    }
 }
 
 void PipeWireAdapter::Impl::onPosted(void* data, std::uint64_t) {
@@ -208,6 +240,7 @@ void PipeWireAdapter::Impl::connect() {
 
 void PipeWireAdapter::Impl::disconnect() {
     objects_.clear();
+    forgetProfiler();
     burstBegan_.reset();
     if (core_ == nullptr) {
         return;
@@ -268,8 +301,32 @@ void PipeWireAdapter::Impl::bind(ObjectId id, const char* type, std::uint32_t ve
     }
 }
 
+void PipeWireAdapter::Impl::bindProfiler(ObjectId id, std::uint32_t version) {
+    if (!options_.cycle || profiler_ != nullptr) {
+        return;
+    }
+    profiler_ = static_cast<pw_proxy*>(
+        pw_registry_bind(registry_, id, PW_TYPE_INTERFACE_Profiler,
+                         std::min<std::uint32_t>(version, PW_VERSION_PROFILER), 0));
+    if (profiler_ != nullptr) {
+        raw::listen(profiler_, &profilerHook_, &kProfilerEvents, this);
+    }
+}
+
+void PipeWireAdapter::Impl::forgetProfiler() {
+    if (profiler_ != nullptr) {
+        spa_hook_remove(&profilerHook_);
+        pw_proxy_destroy(std::exchange(profiler_, nullptr));
+    }
+}
+
+void PipeWireAdapter::Impl::onProfile(void* data, const spa_pod* portion) {
+    const auto& self = *static_cast<Impl*>(data);
+    readProfile(portion, raw::sizeOf(portion), self.options_.cycle);
+}
+
 void PipeWireAdapter::Impl::onGlobal(void* data, ObjectId id, std::uint32_t, const char* type,
-                                     std::uint32_t, const spa_dict* properties) {
+                                     std::uint32_t version, const spa_dict* properties) {
     auto& self = *static_cast<Impl*>(data);
     self.established();
     const std::string_view kind = type;
@@ -277,6 +334,8 @@ void PipeWireAdapter::Impl::onGlobal(void* data, ObjectId id, std::uint32_t, con
         self.bind<BoundNode>(id, type, PW_VERSION_NODE);
     } else if (kind == PW_TYPE_INTERFACE_Client) {
         self.bind<BoundClient>(id, type, PW_VERSION_CLIENT);
+    } else if (kind == PW_TYPE_INTERFACE_Profiler) {
+        self.bindProfiler(id, version);
     } else if (kind == PW_TYPE_INTERFACE_Link) {
         const auto from = objectId(properties, PW_KEY_LINK_OUTPUT_NODE);
         const auto to = objectId(properties, PW_KEY_LINK_INPUT_NODE);
@@ -329,6 +388,10 @@ void PipeWireAdapter::iterate(std::chrono::milliseconds timeout) {
 
 void PipeWireAdapter::post(std::function<void()> work) {
     impl_->post(std::move(work));
+}
+
+void PipeWireAdapter::every(std::chrono::milliseconds period, std::function<void()> work) {
+    impl_->every(period, std::move(work));
 }
 
 void PipeWireAdapter::quitOnSignal(int signal) {

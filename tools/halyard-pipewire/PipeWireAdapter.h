@@ -1,7 +1,8 @@
 // Watches the graph of a PipeWire daemon and tells it as plain events; waits for
 // the daemon when there is none, and again when it goes away.
 //
-// Only looks on: it subscribes to nodes, clients and links, and changes nothing.
+// Only looks on: it subscribes to nodes, clients, links and
+// the profiler, and changes nothing.
 // libpipewire stays behind this header, because its headers need warnings
 // switched off.
 //
@@ -15,6 +16,7 @@
 #include <string>
 
 #include "GraphEvents.h"
+#include "ProfileReader.h"
 
 namespace halyard::pipewire {
 
@@ -28,8 +30,10 @@ public:
         // The wait before the next attempt to connect, doubled each time.
         std::chrono::milliseconds firstRetry{100};
         std::chrono::milliseconds lastRetry{5000};
+        // Hears of each cycle of each driver that runs, up to a second later.
+        CycleListener cycle = nullptr;
         // Takes a line for people, once an episode.
-        std::function<void(const std::string&)> note;
+        std::function<void(const std::string&)> note = nullptr;
     };
 
     // `listener` hears events from the loop's thread. Throws std::runtime_error
@@ -45,6 +49,8 @@ public:
     void iterate(std::chrono::milliseconds timeout);
     // Calls `work` from the loop.
     void post(std::function<void()> work);
+    // Calls `work` again and again; zero: no more.
+    void every(std::chrono::milliseconds period, std::function<void()> work);
     // Quits on this signal. Requires that every thread of the process blocks it.
     void quitOnSignal(int signal);
 

@@ -4,6 +4,7 @@
 #include <array>
 #include <charconv>
 #include <cmath>
+#include <cstdio>
 #include <string_view>
 #include <utility>
 
@@ -176,6 +177,27 @@ std::optional<std::int64_t> processId(const Properties& node, const Properties& 
     }
     const auto known = positiveNumber(property(client, "pipewire.sec.pid"));
     return known || !numbersAreOurs ? known : positiveNumber(said);
+}
+
+std::optional<double> bufferSeconds(const Properties& node, const std::string& format) {
+    const auto bytes = positiveNumber(property(node, "pulse.attr.tlength"));
+    std::array<char, 32> encoding{};
+    unsigned channels = 0;
+    unsigned rate = 0;
+    if (!bytes ||
+        std::sscanf(format.c_str(), "%31s %uch %uHz", encoding.data(), &channels, &rate) != 3) {
+        return std::nullopt;
+    }
+    // "S24_32LE" is 32 bits wide; "ALAW" is 8.
+    const std::string_view name = encoding.data();
+    const std::size_t last = name.find_last_of("0123456789");
+    const std::size_t before =
+        last == std::string_view::npos ? last : name.find_last_not_of("0123456789", last);
+    const std::size_t first = before == std::string_view::npos ? 0 : before + 1;
+    const auto bits =
+        last == std::string_view::npos ? 8 : positiveNumber(name.substr(first, last + 1 - first));
+    const double second = static_cast<double>(bits.value_or(8)) / 8 * channels * rate;
+    return second > 0 ? std::optional(static_cast<double>(*bytes) / second) : std::nullopt;
 }
 
 double perceivedVolume(float linearVolume) {

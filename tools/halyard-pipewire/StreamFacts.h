@@ -52,6 +52,11 @@ enum class Direction : std::uint8_t { Playback, Capture };
 [[nodiscard]] std::optional<std::int64_t> processId(const Properties& node,
                                                     const Properties& client);
 
+// How much sound a server that speaks for the program holds ready for this stream,
+// of this format ("S16LE 2ch 48000Hz"). Nullopt when there is none, or nothing tells.
+[[nodiscard]] std::optional<double> bufferSeconds(const Properties& node,
+                                                  const std::string& format);
+
 // The volume as sliders show it, 0 to 1, of what multiplies samples.
 [[nodiscard]] double perceivedVolume(float linearVolume);
 

@@ -23,6 +23,9 @@ constexpr const char* kStreamMuted = "stream_muted";
 constexpr const char* kDeviceMuted = "device_muted";
 // Counts a session's runs, so that the second start is no repeat of the first.
 constexpr const char* kRun = "stream_run";
+constexpr const char* kUnreported = "glitches_unreported";
+// What became of a stream's program when the stream went.
+constexpr const char* kProgram = "stream_program";
 
 Names listOf(const std::set<std::string>& names) {
     return Names(names.begin(), names.end());
@@ -68,7 +71,7 @@ void StreamTracker::restate() {
         if (!node.session || !node.session->playing) {
             continue;
         }
-        tellStart(*node.session, *node.direction);
+        tellStart(*node.session);
         if (const auto volume = std::exchange(node.session->toldVolume, std::nullopt)) {
             tellVolume(*node.session, *volume, true);
         }
@@ -76,8 +79,23 @@ void StreamTracker::restate() {
 }
 
 void StreamTracker::closeAll() {
+    if (observer_ != nullptr) {
+        observer_->settleAll();
+    }
     for (auto& [id, node] : nodes_) {
-        close(node);
+        close(id, node);
+    }
+    for (auto& [key, session] : leaving_) {
+        finish(session);
+    }
+    leaving_.clear();
+}
+
+void StreamTracker::settle(StreamKey stream) {
+    const auto found = leaving_.find(stream);
+    if (found != leaving_.end()) {
+        finish(found->second);
+        leaving_.erase(found);
     }
 }
 
@@ -146,7 +164,7 @@ void StreamTracker::on(const LinkAdded& event) {
 
 void StreamTracker::on(const ObjectRemoved& event) {
     if (Node* const node = find(event.id)) {
-        close(*node);
+        close(event.id, *node);
         nodes_.erase(event.id);
     }
     routes_.remove(event.id);
@@ -172,7 +190,10 @@ void StreamTracker::on(const Settled&) {
             direct(node, route);
         }
         if (node.direction) {
-            look(node, route);
+            look(id, node, route);
+            if (node.session && node.session->playing && !(node.running && node.linked)) {
+                endRun(*node.session);
+            }
         }
     }
 }
@@ -191,7 +212,7 @@ void StreamTracker::direct(Node& stream, const Route& route) {
     stream.direction = direction;
 }
 
-void StreamTracker::look(Node& stream, const Route& route) {
+void StreamTracker::look(ObjectId id, Node& stream, const Route& route) {
     const bool runs = stream.running && stream.linked;
     const bool ran = (std::exchange(stream.ranSinceLook, false) && stream.linked) || runs;
     if (!stream.session && ran) {
@@ -205,9 +226,7 @@ void StreamTracker::look(Node& stream, const Route& route) {
     session.mutes.stream = stream.muted;
     const double volume = perceivedVolume(stream.volume * session.deviceVolume);
     if (ran && !session.playing) {
-        session.playing = true;
-        ++session.run;
-        tellStart(session, *stream.direction);
+        beginRun(id, session, stream);
     }
     // Also for a stream that is over already: it played at this volume.
     if (ran) {
@@ -215,10 +234,26 @@ void StreamTracker::look(Node& stream, const Route& route) {
     }
     if (!runs) {
         tellVolume(session, volume, false);
-        if (session.playing) {
-            tellStop(session, *stream.direction);
-        }
     }
+}
+
+void StreamTracker::beginRun(ObjectId id, Session& session, const Node& stream) {
+    session.playing = true;
+    ++session.run;
+    session.facts.node = id;
+    session.facts.bufferSeconds = bufferSeconds(stream.properties, session.format);
+    session.facts.device = session.devices.empty() ? std::string() : *session.devices.begin();
+    if (observer_ != nullptr) {
+        observer_->runs(session.facts);
+    }
+    tellStart(session);
+}
+
+void StreamTracker::endRun(Session& session) {
+    if (observer_ != nullptr) {
+        observer_->stopped(session.reporterID);
+    }
+    tellStop(session, {});
 }
 
 void StreamTracker::open(Node& stream) {
@@ -234,6 +269,12 @@ void StreamTracker::open(Node& stream) {
     const Direction direction = *stream.direction;
     Session& session = stream.session.emplace(Session{});
     session.reporterID = nextReporterID_++;
+    session.facts = {.key = session.reporterID,
+                     .direction = direction,
+                     .application = applicationName(stream.properties, client),
+                     .nodeName = property(stream.properties, "node.name"),
+                     .process = processId(stream.properties, client),
+                     .viaServer = viaServer(stream.properties, client)};
     session.operationProcess = processName(stream.properties, client);
     if (session.operationProcess.empty()) {
         session.operationProcess = applicationName(stream.properties, client);
@@ -242,15 +283,16 @@ void StreamTracker::open(Node& stream) {
                configurationOf(stream.properties, client, direction));
 }
 
-void StreamTracker::close(Node& stream) {
+void StreamTracker::close(ObjectId id, Node& stream) {
     if (!stream.direction) {
         return;
     }
     stream.running = false;
-    look(stream, Route{});
+    look(id, stream, Route{});
     end(stream);
 }
 
+// What is known of a stream's last second comes later.
 void StreamTracker::end(Node& stream) {
     if (!stream.session) {
         return;
@@ -258,10 +300,22 @@ void StreamTracker::end(Node& stream) {
     Session& session = *stream.session;
     if (session.playing) {
         tellVolume(session, session.toldVolume.value_or(0), false);
-        tellStop(session, *stream.direction);
+    }
+    if (observer_ != nullptr && observer_->gone(session.reporterID)) {
+        leaving_.emplace(session.reporterID, std::move(session));
+    } else {
+        finish(session);
+    }
+    stream.session.reset();
+}
+
+void StreamTracker::finish(Session& session) {
+    const StreamEnd end =
+        observer_ != nullptr ? observer_->closing(session.reporterID) : StreamEnd{};
+    if (session.playing || end.unreported != 0) {
+        tellStop(session, end);
     }
     sink_.close(session.reporterID);
-    stream.session.reset();
 }
 
 // A stretch of playback belongs to one device and one format, so a change of
@@ -286,6 +340,9 @@ void StreamTracker::follow(Session& session, const Node& stream, const Route& ro
         session.hears = route.hears;
         session.monitors = route.monitors;
     }
+    if (rerouted && observer_ != nullptr) {
+        observer_->routed(session.reporterID, *route.devices.begin());
+    }
     if (rerouted) {
         const std::set<std::string> previous = std::exchange(session.devices, route.devices);
         if (!previous.empty()) {
@@ -308,17 +365,25 @@ void StreamTracker::addContext(const Session& session, Contents& contents) const
     }
 }
 
-void StreamTracker::tellStart(Session& session, Direction direction) {
+void StreamTracker::tellStart(Session& session) {
     Contents contents{{kRun, session.run}};
     addContext(session, contents);
     addCapture(session, contents);
-    sink_.send(session.reporterID, {categoryOf(direction), HALYARD_TYPE_START, contents});
+    sink_.send(session.reporterID,
+               {categoryOf(session.facts.direction), HALYARD_TYPE_START, contents});
 }
 
-void StreamTracker::tellStop(Session& session, Direction direction) {
+void StreamTracker::tellStop(Session& session, const StreamEnd& end) {
     session.playing = false;
+    Contents contents{{kRun, session.run}};
+    if (end.unreported != 0) {
+        contents.add(kUnreported, static_cast<std::int64_t>(end.unreported));
+    }
+    if (end.program != nullptr) {
+        contents.add(kProgram, std::string(end.program));
+    }
     sink_.send(session.reporterID,
-               {categoryOf(direction), HALYARD_TYPE_STOP, Contents{{kRun, session.run}}});
+               {categoryOf(session.facts.direction), HALYARD_TYPE_STOP, contents});
 }
 
 void StreamTracker::tellRoute(Session& session, const std::set<std::string>& previous) {

@@ -20,6 +20,7 @@
 #include "GraphEvents.h"
 #include "SessionSink.h"
 #include "StreamFacts.h"
+#include "StreamObserver.h"
 #include "StreamRoutes.h"
 
 namespace halyard::pipewire {
@@ -34,6 +35,11 @@ public:
     StreamTracker(SessionSink& sink, std::int64_t firstReporterID);
 
     void handle(const GraphEvent& event);
+
+    // Tells `observer`, which is borrowed, when streams run. A session whose node is
+    // gone stays open until settle() when the observer waits for something.
+    void observe(StreamObserver& observer) { observer_ = &observer; }
+    void settle(StreamKey stream);
 
     // Says again what plays, for a daemon that has just begun to listen and was
     // told only that the sessions exist.
@@ -52,6 +58,7 @@ private:
     // What was told of a stream, and to whom.
     struct Session {
         std::int64_t reporterID = 0;
+        StreamRun facts;
         std::string operationProcess;
         std::int64_t run = 0; // how many times it has started to run
         bool playing = false;
@@ -91,13 +98,16 @@ private:
     template <class Map> bool hasRoom(const Map& map, ObjectId id);
 
     void direct(Node& stream, const Route& route);
-    void look(Node& stream, const Route& route);
+    void look(ObjectId id, Node& stream, const Route& route);
     void open(Node& stream);
-    void close(Node& stream);
+    void close(ObjectId id, Node& stream);
     void end(Node& stream);
+    void finish(Session& session);
+    void beginRun(ObjectId id, Session& session, const Node& stream);
+    void endRun(Session& session);
     void follow(Session& session, const Node& stream, const Route& route);
-    void tellStart(Session& session, Direction direction);
-    void tellStop(Session& session, Direction direction);
+    void tellStart(Session& session);
+    void tellStop(Session& session, const StreamEnd& end);
     void tellRoute(Session& session, const std::set<std::string>& previous);
     void tellVolume(Session& session, double volume, bool playing);
     void addCapture(const Session& session, Contents& contents) const;
@@ -108,6 +118,8 @@ private:
     std::map<ObjectId, Properties> clients_;
     std::map<ObjectId, Node> nodes_;
     StreamRoutes routes_;
+    StreamObserver* observer_ = nullptr;
+    std::map<StreamKey, Session> leaving_; // their nodes are gone
     std::uint64_t ignoredObjects_ = 0;
 };
 

@@ -9,8 +9,13 @@
 #include <getopt.h>
 #include <stdexcept>
 #include <string>
+#include <unistd.h>
+#include <utility>
 
 #include "ClientSessions.h"
+#include "CycleCounter.h"
+#include "CycleFiles.h"
+#include "GlitchWatch.h"
 #include "LookOnce.h"
 #include "PipeWireAdapter.h"
 #include "StreamTracker.h"
@@ -129,15 +134,41 @@ std::int64_t firstReporterID() {
     return std::chrono::duration_cast<std::chrono::milliseconds>(now).count() << 20;
 }
 
+const char* environment(const char* name) {
+    return std::getenv(name);
+}
+
+// Removes the files at its end.
+class WrittenFiles final {
+public:
+    explicit WrittenFiles(const std::string& socketPath)
+        : files_(cycleFolders(environment, ::geteuid() == 0, socketPath), note) {}
+    ~WrittenFiles() { files_.remove(); }
+    WrittenFiles(const WrittenFiles&) = delete;
+    WrittenFiles& operator=(const WrittenFiles&) = delete;
+
+    void write(CycleStatistics& statistics) {
+        files_.write(statistics, std::chrono::steady_clock::now());
+    }
+
+private:
+    CycleFiles files_;
+};
+
 class Watcher final {
 public:
     explicit Watcher(const Arguments& arguments)
-        : graph_({.remote = arguments.remote, .note = note},
-                 [this](const GraphEvent& event) { streams_.handle(event); }),
+        : files_(arguments.socket), graph_({.remote = arguments.remote,
+                                            .cycle = [this](const Cycle& each) { cycle(each); },
+                                            .note = note},
+                                           [this](const GraphEvent& event) { heard(event); }),
           client_({.socketPath = arguments.socket.empty() ? nullptr : arguments.socket.c_str(),
                    .connectionChanged = [this](bool connected) { post(connected); }}),
           sessions_(client_), sink_(sessions_, arguments.verbose),
-          streams_(sink_, firstReporterID()) {
+          streams_(sink_, firstReporterID()),
+          glitches_(sink_, {.note = arguments.verbose ? note : nullptr}) {
+        streams_.observe(glitches_);
+        glitches_.settled = [this](StreamKey stream) { streams_.settle(stream); };
         if (!client_) {
             throw std::runtime_error("libhalyard gives no client: is the socket's path too long?");
         }
@@ -152,6 +183,29 @@ public:
     }
 
 private:
+    void heard(const GraphEvent& event) {
+        devices_.handle(event);
+        streams_.handle(event);
+        watch();
+    }
+    void cycle(const Cycle& cycle) {
+        if (watching_) {
+            glitches_.take(cycle);
+            devices_.take(cycle);
+        }
+    }
+    // Nothing is looked at while nothing runs.
+    void watch() {
+        if (std::exchange(watching_, glitches_.watching()) == watching_) {
+            return;
+        }
+        graph_.every(watching_ ? GlitchWatch::kTick : std::chrono::milliseconds(0), [this] {
+            files_.write(devices_.statistics());
+            glitches_.tick();
+            watch();
+        });
+    }
+
     // On libhalyard's thread.
     void post(bool connected) {
         graph_.post([this, connected] { connectionChanged(connected); });
@@ -174,11 +228,15 @@ private:
         }
     }
 
+    CycleCounter devices_;
+    WrittenFiles files_; // go after the client, which waits for the sessions' end
     PipeWireAdapter graph_;
     reporting::Client client_;
     ClientSessions sessions_;
     NotingSink sink_;
     StreamTracker streams_;
+    GlitchWatch glitches_;
+    bool watching_ = false;
     bool wasLost_ = false;
 };
 
