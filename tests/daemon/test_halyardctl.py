@@ -3,9 +3,11 @@ all. HALYARDCTL names the program."""
 
 import json
 import os
+import select
 import shutil
 import sqlite3
 import subprocess
+import time
 import unittest
 
 from harness import PATIENCE, Daemon, DaemonTest
@@ -258,6 +260,129 @@ class Asking(CtlTest):
                                 for line in shown.stdout.splitlines()) + "\n")
 
 
+class Watching(CtlTest):
+    def watch(self, *arguments):
+        watching = subprocess.Popen(
+            [HALYARDCTL, "--state", os.path.dirname(self.daemon.store_path), "watch", *arguments],
+            stdout=subprocess.PIPE, stderr=subprocess.PIPE, text=True)
+        self.addCleanup(watching.stderr.close)
+        self.addCleanup(watching.stdout.close)
+        self.addCleanup(watching.wait)
+        self.addCleanup(watching.kill)
+        return watching
+
+    def test_messages_come_as_they_are_committed(self):
+        client = self.connect()
+        client.session(1, 4, "clock")
+        client.result("sendMessage", {"n": 0}, 4, 1, [1])
+        self.flush()
+        watching = self.watch("--json")
+        first = None
+        number = 0
+        while first is None:  # What comes before it has begun is not new.
+            number += 1
+            client.result("sendMessage", {"n": number}, 4, 1, [1])
+            self.flush()
+            if select.select([watching.stdout], [], [], 0.2)[0]:
+                first = json.loads(watching.stdout.readline())
+        self.assertGreater(first["payload"]["n"], 0)
+        for number in range(number + 1, number + 20):
+            client.result("sendMessage", {"n": number}, 4, 1, [1])
+            told = first
+            while told["payload"]["n"] != number:
+                told = json.loads(watching.stdout.readline())
+            self.assertEqual((told["application"], told["session"]), ("clock", 1))
+            self.assertLess(time.time() - told["time"], PATIENCE)
+
+    def test_each_kind_is_followed_by_itself(self):
+        client = self.connect()
+        client.session(1, 4, "clock")
+        self.flush()
+        watching = {kind: self.watch(kind, "--json") for kind in ("glitches", "events")}
+        def report():
+            client.result("sendMessage", {"n": time.time()}, 4, 1, [1])
+            client.result("sendMessage", {"glitch_start": time.time(), "issue_type": "memory",
+                                          "rtaid_client": "x"}, 4, 7, [1])
+            self.flush()
+            return all(select.select([one.stdout], [], [], 0.2)[0] for one in watching.values())
+        self.daemon.wait_for(report)
+        self.assertEqual(json.loads(watching["glitches"].stdout.readline())["cause"], "memory")
+        self.assertIn("com.kestrel.halyard.",
+                      json.loads(watching["events"].stdout.readline())["name"])
+
+    def test_it_ends_when_nobody_reads_any_more(self):
+        self.flush()
+        watching = self.watch()
+        watching.stdout.close()
+        self.assertEqual(watching.wait(PATIENCE), 0)
+
+
+class Sending(CtlTest):
+    def test_lines_become_messages_and_bad_ones_are_told(self):
+        client = self.connect()
+        client.session(1)
+        client.session(2)
+        client.session(3)
+        done = self.ctl("send", "--session", "1", "--session", "2", "--category", "playback",
+                        "--type", "1", "--json",
+                        input='{"a": 1}\nnonsense\n\n[1]\n{"a": 9223372036854775808}\n')
+        self.assertEqual(json.loads(done.stdout), {"sent": 2})
+        self.assertEqual(done.returncode, 1)
+        self.assertIn("line 2: no dictionary", done.stderr)
+        self.assertIn("line 4: no dictionary", done.stderr)
+        rows = self.rows("SELECT s.session_id, m.category, m.type, m.payload FROM upload_message m "
+                         "JOIN upload_session s ON s.id = m.upload_session ORDER BY m.id")
+        self.assertEqual([row[:3] for row in rows if "audiotag" in row[3]],
+                         [(1, 4, 1), (2, 4, 1), (1, 4, 1), (2, 4, 1)])
+        self.assertEqual([json.loads(row[3])["a"] for row in rows], [1, 1, 2**63, 2**63])
+        self.assertIn("hyreporting_timestamp", json.loads(rows[0][3]))
+
+    def test_without_a_session_all_that_run_get_it(self):
+        client = self.connect()
+        client.session(1)
+        client.session(2)
+        path = self.daemon.path("lines")
+        with open(path, "w", encoding="utf-8") as file:
+            file.write('{"a": 1}')
+        done = self.ctl("send", "--category", "0x10000007", "--type", "Stop", "--json-file", path)
+        self.assertEqual((done.returncode, done.stdout), (0, "1 message sent\n"))
+        self.assertEqual(len(self.rows("SELECT 1 FROM upload_message WHERE category = 7")), 2)
+
+    def test_what_the_daemon_would_not_take_is_told_and_the_rest_goes_on(self):
+        self.connect().session(1)
+        deep = '{"a":' + "[" * 31 + "]" * 31 + "}"
+        large = json.dumps({"a": "x" * (1 << 20)})
+        done = self.ctl("send", "--category", "4", "--type", "1", "--json",
+                        input=f'{deep}\n{large}\n{{"a": 1}}\n')
+        self.assertEqual((done.returncode, json.loads(done.stdout)), (1, {"sent": 1}))
+        self.assertIn("line 1: ", done.stderr)
+        self.assertIn("line 2: ", done.stderr)
+
+    def test_what_is_no_category_or_type_is_wrong_use(self):
+        for category, kind in (("Moon", "1"), ("4", "65536"), ("-1", "1"), ("4", "")):
+            done = self.ctl("send", "--category", category, "--type", kind)
+            self.assertEqual(done.returncode, 2, done)
+        self.assertEqual(self.ctl("send", "--type", "1").returncode, 2)
+
+    def test_a_session_lasts_as_long_as_its_input(self):
+        done = self.ctl("session", "--service", "alarms", "--app", "clock", "--json", input="""
+            {"category": "Playback", "type": "Start", "message": {"a": 1}}
+            {"category": 14, "type": 3, "message": {"VQSessionVolumePlayingState": 1}}
+            {"category": "Moon", "type": 3, "message": {}}
+            {"category": 4, "type": 3}
+            """)
+        told = json.loads(done.stdout)
+        self.assertEqual((done.returncode, told["sent"]), (1, 2))
+        self.assertIn("line 4: ", done.stderr)
+        self.assertIn("line 5: ", done.stderr)
+        self.flush()
+        [session] = self.listed("sessions")
+        self.assertEqual(session["session_id"], told["session_id"])
+        self.assertEqual((session["application"], session["service"]), ("clock", "alarms"))
+        self.assertIsNotNone(session["closed"])
+        self.assertEqual(self.connect().result("getAllReporters"), [])
+
+
 class NotThere(unittest.TestCase):
     def setUp(self):
         self.daemon = Daemon()
@@ -274,13 +399,14 @@ class NotThere(unittest.TestCase):
         self.assertEqual(self.daemon.terminate(), 0)
 
     def test_without_a_daemon_status_says_how_to_start_it(self):
-        done = ctl("status", daemon=self.daemon)
-        self.assertEqual(done.returncode, 3)
-        self.assertIn("systemctl start halyardd.socket", done.stderr)
+        for command in (("status",), ("send", "--category", "4", "--type", "1"), ("session",)):
+            done = ctl(*command, daemon=self.daemon, input="")
+            self.assertEqual(done.returncode, 3)
+            self.assertIn("systemctl start halyardd.socket", done.stderr)
 
     def test_without_a_store_there_is_none_to_read(self):
         for command in ("sessions", "messages", "glitches", "events", "energy", "incidents",
-                        "metrics"):
+                        "metrics", "watch"):
             done = ctl(command, "--json", state=self.state)
             self.assertEqual((done.returncode, done.stdout), (3, ""))
 

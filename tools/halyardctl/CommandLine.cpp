@@ -6,6 +6,7 @@
 
 #include "commands/Commands.h"
 #include "output/TimeArgument.h"
+#include "output/Words.h"
 
 namespace halyard::ctl {
 namespace {
@@ -18,6 +19,33 @@ std::optional<reading::GlitchKey> glitchKey(const std::string& name) {
            : name == "cause"  ? std::optional(GlitchKey::Cause)
            : name == "hour"   ? std::optional(GlitchKey::Hour)
                               : std::nullopt;
+}
+
+// None for any other word.
+std::optional<Watched> watchedKind(const std::string& name) {
+    return name == "messages"    ? std::optional(Watched::Messages)
+           : name == "glitches"  ? std::optional(Watched::Glitches)
+           : name == "events"    ? std::optional(Watched::Events)
+           : name == "incidents" ? std::optional(Watched::Incidents)
+                                 : std::nullopt;
+}
+
+// An option whose value goes by a printed name or by its number.
+template <class Number>
+CLI::Option* takeNumber(CLI::App* command, const char* name, Number& number,
+                        std::optional<Number> (*read)(std::string_view), const char* what) {
+    return command
+        ->add_option_function<std::string>(
+            name,
+            [&number, name, read](const std::string& text) {
+                const auto value = read(text);
+                if (!value) {
+                    throw CLI::ValidationError(name, "\"" + text + "\" is no name or number");
+                }
+                number = *value;
+            },
+            what)
+        ->type_name("NAME|N");
 }
 
 class CommandLine {
@@ -33,6 +61,9 @@ private:
     void addLists();
     // Commands about files.
     void addFiles();
+    void addWatch();
+    // Commands that report.
+    void addSenders();
     void takeRange(CLI::App* command);
     void takeApplication(CLI::App* command);
 
@@ -40,6 +71,9 @@ private:
     std::string ignored_; // by CLI11's check, which keeps what it stands for
     std::string by_;
     std::string file_;
+    std::string watched_ = "messages";
+    SendOptions send_{};
+    SessionOptions session_{};
     CLI::App app_{"How the sound of this device is doing, and what halyardd knows of it."};
     std::function<Exit()> chosen_;
 };
@@ -51,6 +85,8 @@ CommandLine::CommandLine(Context& context) : context_(context) {
     addPlaces();
     add("status", "What the daemon says of itself", [this] { return runStatus(context_); });
     addLists();
+    addWatch();
+    addSenders();
     addFiles();
 }
 
@@ -126,6 +162,38 @@ void CommandLine::addFiles() {
     CLI::App* const trace = add("trace", "What a trace measured: the durations in a results file",
                                 [this] { return runTrace(context_, file_); });
     trace->add_option("FILE", file_, "tracing_results.pbj of a trace")->required();
+}
+
+void CommandLine::addWatch() {
+    CLI::App* const watch = add("watch", "What comes into the store, as it comes",
+                                [this] { return runWatch(context_, *watchedKind(watched_)); });
+    takeApplication(watch);
+    watch->add_option("KIND", watched_, "messages, glitches, events or incidents")
+        ->type_name("")
+        ->check([](const std::string& name) {
+            return watchedKind(name) ? "" : "messages, glitches, events or incidents";
+        });
+}
+
+void CommandLine::addSenders() {
+    const auto takeFile = [](CLI::App* command, std::string& file, const char* what) {
+        command->add_option("--json-file", file, what)->type_name("FILE|-");
+    };
+    CLI::App* const send =
+        add("send", "Sends messages", [this] { return runSend(context_, send_); });
+    send->add_option("--session", send_.sessions, "To this session, instead of all")
+        ->type_name("ID")
+        ->expected(1)
+        ->multi_option_policy(CLI::MultiOptionPolicy::TakeAll);
+    takeNumber(send, "--category", send_.category, categoryOf, "Of the messages")->required();
+    takeNumber(send, "--type", send_.type, typeOf, "Of the messages")->required();
+    takeFile(send, send_.file, "A dictionary a line; else standard input");
+    CLI::App* const session = add("session", "Holds a session while it reads messages",
+                                  [this] { return runSession(context_, session_); });
+    takeNumber(session, "--service", session_.serviceType, serviceTypeOf, "What it reports for");
+    session->add_option("--app", session_.application, "Its application")->type_name("NAME");
+    takeFile(session, session_.file,
+             "{\"category\": …, \"type\": …, \"message\": {…}} a line; else standard input");
 }
 
 Exit CommandLine::run(int count, const char* const* words) {

@@ -19,6 +19,26 @@ Exit runMessages(Context& context);
 Exit runGlitches(Context& context, std::optional<reading::GlitchKey> by);
 // The rows of a table that is none of the above.
 Exit runTable(Context& context, linux_::StoreTable table);
+
+enum class Watched : std::uint8_t { Messages, Glitches, Events, Incidents };
+// Until nobody reads the output any more.
+Exit runWatch(Context& context, Watched what);
+
+struct SendOptions {
+    std::vector<std::int64_t> sessions{}; // none: all that are started
+    std::uint32_t category = 0;
+    std::uint16_t type = 0;
+    std::string file = "-";
+};
+Exit runSend(Context& context, const SendOptions& options);
+
+struct SessionOptions {
+    std::uint16_t serviceType = 0;
+    std::optional<std::string> application{};
+    std::string file = "-";
+};
+Exit runSession(Context& context, const SessionOptions& options);
+
 Exit runTrace(Context& context, const std::string& file);
 
 } // namespace halyard::ctl

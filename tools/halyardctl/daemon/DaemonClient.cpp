@@ -46,7 +46,8 @@ DaemonClient::DaemonClient(int descriptor, std::filesystem::path socket)
 
 DaemonClient::DaemonClient(DaemonClient&& other) noexcept
     : descriptor_(std::exchange(other.descriptor_, -1)), socket_(std::move(other.socket_)),
-      lastID_(other.lastID_), answered_(other.answered_), received_(std::move(other.received_)) {}
+      lastID_(other.lastID_), answered_(other.answered_), lost_(other.lost_),
+      received_(std::move(other.received_)) {}
 
 DaemonClient::~DaemonClient() {
     if (descriptor_ >= 0) {
@@ -70,7 +71,8 @@ Outcome<DaemonClient> DaemonClient::connect(const std::filesystem::path& socket)
     return client;
 }
 
-Trouble DaemonClient::lost() const {
+Trouble DaemonClient::lost() {
+    lost_ = true;
     if (!answered_) {
         return {Exit::NotAllowed,
                 fmt::format("the daemon at {} closed the connection without an answer: [access] in "
@@ -108,6 +110,7 @@ Outcome<Answer> DaemonClient::receive() {
     const Trouble stranger(Exit::Failed,
                            fmt::format("what answers at {} is no halyardd", socket_.native()));
     if (scanned != Scan::Complete) {
+        lost_ = true;
         return stranger;
     }
     const std::size_t length = scanner_.frameLength();
@@ -115,6 +118,7 @@ Outcome<Answer> DaemonClient::receive() {
     scanner_.reset();
     received_.erase(0, length);
     if (!answer) {
+        lost_ = true;
         return stranger;
     }
     answered_ = true;
@@ -124,8 +128,10 @@ Outcome<Answer> DaemonClient::receive() {
 Outcome<void> DaemonClient::start(protocol::Method method, const protocol::Arguments& arguments) {
     std::string frame;
     protocol::appendCall(frame, ++lastID_, method, arguments);
-    if (frame.size() > protocol::kMaxFrameBytes) {
-        return Trouble(Exit::Failed, "larger than the 1 MiB that the daemon takes");
+    // The daemon closes the connection on what is beyond its bounds.
+    protocol::FrameScanner scanner;
+    if (scanner.scan(frame) != protocol::FrameScanner::Outcome::Complete) {
+        return Trouble(Exit::Failed, "larger or deeper than the daemon takes");
     }
     return send(frame);
 }

@@ -31,17 +31,21 @@ public:
     // Sends a request whose answer nobody waits for; it is passed over when it comes.
     reading::Outcome<void> start(protocol::Method method, const protocol::Arguments& arguments);
 
+    // The connection is gone: nothing more will come of it.
+    bool isLost() const { return lost_; }
+
 private:
     DaemonClient(int descriptor, std::filesystem::path socket);
     reading::Outcome<void> send(std::string_view frame);
     // The next answer, whatever it answers.
     reading::Outcome<protocol::Answer> receive();
-    reading::Trouble lost() const;
+    reading::Trouble lost();
 
     int descriptor_;
     std::filesystem::path socket_;
     std::uint32_t lastID_ = 0;
     bool answered_ = false;
+    bool lost_ = false;
     std::string received_;
     protocol::FrameScanner scanner_;
 };

@@ -41,6 +41,7 @@ public:
         sqlite3_close(database_);
         database_ = nullptr;
     }
+    void reopen() { EXPECT_EQ(sqlite3_open(path().c_str(), &database_), SQLITE_OK); }
     StoreReader open() const {
         auto reader = StoreReader::open(path());
         EXPECT_TRUE(reader.ok()) << reader.failure().message();
