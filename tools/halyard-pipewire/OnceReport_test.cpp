@@ -78,6 +78,14 @@ TEST_F(OnceReportTest, AJackProgramIsShownWithAndWithoutADevice) {
     EXPECT_NE(report_.text().find("synth        -    playback   stopped"), std::string::npos);
 }
 
+TEST_F(OnceReportTest, WhatHasStoppedIsShownAsStopped) {
+    node(kSpeaker, "Audio/Sink", "out.speaker");
+    runs(kSpeaker);
+    EXPECT_NE(report_.text().find("Sink  running"), std::string::npos);
+    report_.handle(NodeStateChanged{kSpeaker, NodeState::Stopped});
+    EXPECT_NE(report_.text().find("Sink  stopped"), std::string::npos);
+}
+
 TEST_F(OnceReportTest, TitlesAndFileNamesAreNotShown) {
     node(kSpeaker, "Audio/Sink", "out.speaker");
     node(kStream, "Stream/Output/Audio", "pw-play");

@@ -32,6 +32,19 @@ TEST_F(StreamTrackerJackTest, AJackProgramThatLosesItsDeviceStopsAndStartsAgain)
     EXPECT_EQ(sink_.takeLines(), (Lines{"playback start", "volume 1 playing"}));
 }
 
+TEST_F(StreamTrackerJackTest, AJackProgramThatRunsUnlinkedIsNoRun) {
+    jack();
+    link(30, kStream, kSpeaker);
+    settle();
+    remove(30);
+    settle();
+    sink_.takeLines();
+    state(NodeState::Stopped);
+    state(NodeState::Running);
+    settle();
+    EXPECT_TRUE(sink_.lines.empty());
+}
+
 TEST_F(StreamTrackerJackTest, AJackProgramLinkedToAMicrophoneAloneRecords) {
     microphone();
     jack();

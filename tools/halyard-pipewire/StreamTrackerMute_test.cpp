@@ -107,6 +107,22 @@ TEST_F(StreamTrackerMuteTest, ARecorderOfBothSaysBoth) {
     EXPECT_EQ(route.contents.get<std::int64_t>("capture_monitor"), 1);
 }
 
+TEST_F(StreamTrackerMuteTest, AnotherSideOfTheSameDeviceIsAnotherRoute) {
+    tracker_.handle(
+        NodeChanged{kMicrophone, {{"media.class", "Audio/Duplex"}, {"node.name", "headset"}}});
+    stream(kStream, "Stream/Input/Audio");
+    link(30, kMicrophone, kStream);
+    state(NodeState::Running);
+    settle();
+    sink_.takeLines();
+    tracker_.handle(NodeChanged{
+        kStream, {{"media.class", "Stream/Input/Audio"}, {"stream.capture.sink", "true"}}});
+    settle();
+    EXPECT_EQ(sink_.takeLines(), (Lines{"volume 1 silent", "route headset", "volume 1 playing"}));
+    sink_.messages.pop_back();
+    EXPECT_EQ(captures(), "0 1");
+}
+
 TEST_F(StreamTrackerMuteTest, WhoPlaysAloneSaysNothingOfCapture) {
     stream();
     link(30, kStream, kSpeaker);
