@@ -1,63 +1,11 @@
 #include "StreamTracker.h"
 
-#include <algorithm>
 #include <charconv>
 #include <utility>
 
 #include "halyard/halyard.h"
 
 namespace halyard::pipewire {
-
-namespace {
-
-constexpr const char* kFormat = "session_selected_format";
-constexpr const char* kActiveDevices = "active_devices";
-constexpr const char* kPreviousDevices = "previous_devices";
-// From what is captured: what a device hears, or what others play on one.
-constexpr const char* kCaptureSource = "capture_source";
-constexpr const char* kCaptureMonitor = "capture_monitor";
-constexpr const char* kVolume = "VQSessionVolume";
-constexpr const char* kPlayingState = "VQSessionVolumePlayingState";
-constexpr const char* kVolumeProcess = "VQSessionVolumeOperationProcess";
-constexpr const char* kStreamMuted = "stream_muted";
-constexpr const char* kDeviceMuted = "device_muted";
-// Counts a session's runs, so that the second start is no repeat of the first.
-constexpr const char* kRun = "stream_run";
-constexpr const char* kUnreported = "glitches_unreported";
-// What became of a stream's program when the stream went.
-constexpr const char* kProgram = "stream_program";
-
-Names listOf(const std::set<std::string>& names) {
-    return Names(names.begin(), names.end());
-}
-
-void addText(Contents& contents, const char* key, const std::string& text) {
-    if (!text.empty()) {
-        contents.add(key, text);
-    }
-}
-
-std::uint32_t categoryOf(Direction direction) {
-    return direction == Direction::Playback ? HALYARD_CATEGORY_PLAYBACK : HALYARD_CATEGORY_RECORD;
-}
-
-// Facts that help to tell streams apart, and none that tell what is listened
-// to: titles and file names stay here.
-Contents configurationOf(const Properties& node, const Properties& client, Direction direction) {
-    Contents configuration;
-    configuration.add("HostApplicationDisplayID", applicationName(node, client));
-    if (const auto pid = processId(node, client)) {
-        configuration.add("application_pid", *pid);
-    }
-    addText(configuration, "application_binary", processName(node, client));
-    addText(configuration, "media_role", property(node, "media.role"));
-    addText(configuration, "node_name", property(node, "node.name"));
-    configuration.add("stream_direction",
-                      direction == Direction::Playback ? "playback" : "capture");
-    return configuration;
-}
-
-} // namespace
 
 StreamTracker::StreamTracker(SessionSink& sink, std::int64_t firstReporterID)
     : sink_(sink), nextReporterID_(firstReporterID) {}
@@ -72,8 +20,8 @@ void StreamTracker::restate() {
             continue;
         }
         tellStart(*node.session);
-        if (const auto volume = std::exchange(node.session->toldVolume, std::nullopt)) {
-            tellVolume(*node.session, *volume, true);
+        if (const auto told = std::exchange(node.session->told, std::nullopt)) {
+            tellVolume(*node.session, told->volume, true);
         }
     }
 }
@@ -223,7 +171,7 @@ void StreamTracker::look(ObjectId id, Node& stream, const Route& route) {
     }
     Session& session = *stream.session;
     follow(session, stream, route);
-    session.mutes.stream = stream.muted;
+    session.around.streamMuted = stream.muted;
     const double volume = perceivedVolume(stream.volume * session.deviceVolume);
     if (ran && !session.playing) {
         beginRun(id, session, stream);
@@ -241,8 +189,9 @@ void StreamTracker::beginRun(ObjectId id, Session& session, const Node& stream) 
     session.playing = true;
     ++session.run;
     session.facts.node = id;
-    session.facts.bufferSeconds = bufferSeconds(stream.properties, session.format);
-    session.facts.device = session.devices.empty() ? std::string() : *session.devices.begin();
+    session.facts.bufferSeconds = bufferSeconds(stream.properties, session.around.format);
+    session.facts.device =
+        session.around.devices.empty() ? std::string() : *session.around.devices.begin();
     if (observer_ != nullptr) {
         observer_->runs(session.facts);
     }
@@ -299,7 +248,7 @@ void StreamTracker::end(Node& stream) {
     }
     Session& session = *stream.session;
     if (session.playing) {
-        tellVolume(session, session.toldVolume.value_or(0), false);
+        tellVolume(session, session.told ? session.told->volume : 0, false);
     }
     if (observer_ != nullptr && observer_->gone(session.reporterID)) {
         leaving_.emplace(session.reporterID, std::move(session));
@@ -322,95 +271,61 @@ void StreamTracker::finish(Session& session) {
 // either ends it before the change is told. Links and format vanish before a
 // stream does; what they were last stays.
 void StreamTracker::follow(Session& session, const Node& stream, const Route& route) {
-    const bool rerouted = !route.devices.empty() &&
-                          (route.devices != session.devices || route.hears != session.hears ||
-                           route.monitors != session.monitors);
-    const bool reformatted = !stream.format.empty() && stream.format != session.format;
-    const bool endsStretch =
-        (rerouted && !session.devices.empty()) || (reformatted && !session.format.empty());
-    if (endsStretch && session.playing && session.toldVolume) {
-        tellVolume(session, *session.toldVolume, false);
+    const bool rerouted = !route.devices.empty() && (route.devices != session.around.devices ||
+                                                     route.hears != session.around.hears ||
+                                                     route.monitors != session.around.monitors);
+    const bool reformatted = !stream.format.empty() && stream.format != session.around.format;
+    const bool endsStretch = (rerouted && !session.around.devices.empty()) ||
+                             (reformatted && !session.around.format.empty());
+    if (endsStretch && session.playing && session.told) {
+        tellVolume(session, session.told->volume, false);
     }
     if (reformatted) {
-        session.format = stream.format;
+        session.around.format = stream.format;
     }
     if (!route.devices.empty()) {
         session.deviceVolume = route.volume;
-        session.mutes.device = route.muted;
-        session.hears = route.hears;
-        session.monitors = route.monitors;
+        session.around.devicesMuted = route.muted;
+        session.around.hears = route.hears;
+        session.around.monitors = route.monitors;
     }
     if (rerouted && observer_ != nullptr) {
         observer_->routed(session.reporterID, *route.devices.begin());
     }
     if (rerouted) {
-        const std::set<std::string> previous = std::exchange(session.devices, route.devices);
+        const std::set<std::string> previous = std::exchange(session.around.devices, route.devices);
         if (!previous.empty()) {
             tellRoute(session, previous);
         }
     }
 }
 
-void StreamTracker::addCapture(const Session& session, Contents& contents) const {
-    if (session.hears || session.monitors) {
-        contents.add(kCaptureSource, std::int64_t{session.hears});
-        contents.add(kCaptureMonitor, std::int64_t{session.monitors});
-    }
-}
-
-void StreamTracker::addContext(const Session& session, Contents& contents) const {
-    addText(contents, kFormat, session.format);
-    if (!session.devices.empty()) {
-        contents.add(kActiveDevices, listOf(session.devices));
-    }
-}
-
 void StreamTracker::tellStart(Session& session) {
-    Contents contents{{kRun, session.run}};
-    addContext(session, contents);
-    addCapture(session, contents);
-    sink_.send(session.reporterID,
-               {categoryOf(session.facts.direction), HALYARD_TYPE_START, contents});
+    sink_.send(session.reporterID, {categoryOf(session.facts.direction), HALYARD_TYPE_START,
+                                    startContents(session.run, session.around)});
 }
 
 void StreamTracker::tellStop(Session& session, const StreamEnd& end) {
     session.playing = false;
-    Contents contents{{kRun, session.run}};
-    if (end.unreported != 0) {
-        contents.add(kUnreported, static_cast<std::int64_t>(end.unreported));
-    }
-    if (end.program != nullptr) {
-        contents.add(kProgram, std::string(end.program));
-    }
-    sink_.send(session.reporterID,
-               {categoryOf(session.facts.direction), HALYARD_TYPE_STOP, contents});
+    sink_.send(session.reporterID, {categoryOf(session.facts.direction), HALYARD_TYPE_STOP,
+                                    stopContents(session.run, end)});
 }
 
 void StreamTracker::tellRoute(Session& session, const std::set<std::string>& previous) {
-    Contents contents{{kPreviousDevices, listOf(previous)}};
-    addContext(session, contents);
-    addCapture(session, contents);
-    sink_.send(session.reporterID,
-               {HALYARD_CATEGORY_ROUTE_CHANGE, HALYARD_TYPE_ACTIVATE, contents});
+    sink_.send(session.reporterID, {HALYARD_CATEGORY_ROUTE_CHANGE, HALYARD_TYPE_ACTIVATE,
+                                    routeContents(previous, session.around)});
 }
 
 void StreamTracker::tellVolume(Session& session, double volume, bool playing) {
-    if (session.toldVolume == volume && session.toldPlaying == playing &&
-        session.toldMutes == session.mutes) {
+    const Loudness loudness{volume, playing, session.around.streamMuted,
+                            session.around.devicesMuted};
+    if (session.told == loudness) {
         return;
     }
-    session.toldMutes = session.mutes;
-    session.toldVolume = volume;
-    session.toldPlaying = playing;
-    Contents contents{{kVolume, volume},
-                      {kPlayingState, std::int64_t{playing}},
-                      {kVolumeProcess, session.operationProcess}};
-    addContext(session, contents);
-    contents.add(kStreamMuted, std::int64_t{session.mutes.stream});
-    if (!session.devices.empty()) {
-        contents.add(kDeviceMuted, std::int64_t{session.mutes.device});
-    }
-    sink_.send(session.reporterID, {HALYARD_CATEGORY_VOLUME, HALYARD_TYPE_ACTIVATE, contents});
+    session.told = loudness;
+    sink_.send(session.reporterID,
+               {HALYARD_CATEGORY_VOLUME, HALYARD_TYPE_ACTIVATE,
+                volumeContents(volume, playing, session.operationProcess, session.around)});
 }
 
 } // namespace halyard::pipewire

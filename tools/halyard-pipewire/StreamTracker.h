@@ -19,6 +19,7 @@
 
 #include "GraphEvents.h"
 #include "SessionSink.h"
+#include "StreamContents.h"
 #include "StreamFacts.h"
 #include "StreamObserver.h"
 #include "StreamRoutes.h"
@@ -50,10 +51,13 @@ public:
     std::uint64_t ignoredObjects() const { return ignoredObjects_; }
 
 private:
-    struct Mutes {
-        bool stream = false;
-        bool device = false; // each device is
-        bool operator==(const Mutes&) const = default;
+    // What a volume message says, but for where.
+    struct Loudness {
+        double volume = 0;
+        bool playing = false;
+        bool streamMuted = false;
+        bool devicesMuted = false;
+        bool operator==(const Loudness&) const = default;
     };
     // What was told of a stream, and to whom.
     struct Session {
@@ -62,15 +66,9 @@ private:
         std::string operationProcess;
         std::int64_t run = 0; // how many times it has started to run
         bool playing = false;
-        std::string format;
-        std::set<std::string> devices;
-        bool hears = false;
-        bool monitors = false;
+        Surroundings around;
         float deviceVolume = 1; // of the loudest device, as a factor of samples
-        Mutes mutes;
-        Mutes toldMutes;
-        std::optional<double> toldVolume;
-        bool toldPlaying = false;
+        std::optional<Loudness> told;
     };
     struct Node {
         Properties properties;
@@ -84,6 +82,7 @@ private:
         std::string format;
         std::optional<Session> session;
     };
+
     void on(const ClientChanged& event);
     void on(const NodeChanged& event);
     void on(const NodeStateChanged& event);
@@ -110,8 +109,6 @@ private:
     void tellStop(Session& session, const StreamEnd& end);
     void tellRoute(Session& session, const std::set<std::string>& previous);
     void tellVolume(Session& session, double volume, bool playing);
-    void addCapture(const Session& session, Contents& contents) const;
-    void addContext(const Session& session, Contents& contents) const;
 
     SessionSink& sink_;
     std::int64_t nextReporterID_;
