@@ -57,41 +57,49 @@ constexpr option kOptions[] = {
     {"paused", no_argument, nullptr, 'p'},         {"ordinary", no_argument, nullptr, 'o'},
     {"help", no_argument, nullptr, 'h'},           {}};
 
+// False for what is none of the streams' own.
+bool describesStreams(Voice::Options& voice, int option, const char* value) {
+    switch (option) {
+    case 't':
+        voice.properties["target.object"] = value;
+        return true;
+    case 'r':
+        voice.properties["media.role"] = value;
+        return true;
+    case 'l':
+        voice.properties["node.latency"] = value;
+        return true;
+    case 'P':
+        setProperty(voice, value);
+        return true;
+    case 'c':
+        return voice.capture = true;
+    case 'f':
+        return voice.filter = true;
+    case 'p':
+        return voice.paused = true;
+    default:
+        return false;
+    }
+}
+
 Arguments parse(int argc, char** argv) {
     Arguments arguments;
-    Voice::Options& voice = arguments.player.voice;
-    voice.properties = {{"media.role", "Music"}, {"node.latency", "1024/48000"}};
+    Player::Options& player = arguments.player;
+    player.voice.properties = {{"media.role", "Music"}, {"node.latency", "1024/48000"}};
     for (int found = 0; (found = getopt_long(argc, argv, "", kOptions, nullptr)) != -1;) {
+        if (describesStreams(player.voice, found, optarg)) {
+            continue;
+        }
         switch (found) {
         case 'n':
-            arguments.player.name = optarg;
-            break;
-        case 't':
-            voice.properties["target.object"] = optarg;
-            break;
-        case 'r':
-            voice.properties["media.role"] = optarg;
-            break;
-        case 'l':
-            voice.properties["node.latency"] = optarg;
-            break;
-        case 'P':
-            setProperty(voice, optarg);
-            break;
-        case 'c':
-            voice.capture = true;
-            break;
-        case 'f':
-            voice.filter = true;
-            break;
-        case 'o':
-            arguments.player.ordinary = true;
+            player.name = optarg;
             break;
         case 's':
-            arguments.player.streams = std::atoi(optarg);
+            player.streams = std::atoi(optarg);
             break;
-        case 'p':
-            voice.paused = true;
+        case 'o':
+            player.ordinary = true;
             break;
         case 'h':
             std::fputs(kUsage, stdout);
