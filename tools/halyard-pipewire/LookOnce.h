@@ -1,5 +1,6 @@
-// A look at a PipeWire daemon that lasts so long and no longer, for people who ask
-// what is there. Has a loop of its own and is done when it returns.
+// A look at a PipeWire daemon that lasts so long, or half a second longer while the
+// cycle of a device that runs is not known yet, for people who ask what is there.
+// Has a loop of its own and is done when it returns.
 #pragma once
 
 #include <chrono>

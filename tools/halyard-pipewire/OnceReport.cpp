@@ -87,6 +87,27 @@ void OnceReport::handle(const GraphEvent& event) {
 
 // ---- The picture
 
+void OnceReport::take(const Cycle& cycle) {
+    const std::string quantum = fmt::format(
+        "{}/{}", cycle.frames, cycle.rateDenominator / std::max(cycle.rateNumerator, 1U));
+    const auto tell = [&](ObjectId id) {
+        if (Node* const node = find(id)) {
+            node->quantum = quantum;
+        }
+    };
+    tell(cycle.driver.id);
+    for (const NodeCycle& follower : cycle.followers) {
+        tell(follower.id);
+    }
+}
+
+bool OnceReport::complete() const {
+    return std::none_of(nodes_.begin(), nodes_.end(), [](const auto& entry) {
+        const Node& node = entry.second;
+        return node.running && isDevice(node.properties) && node.quantum.empty();
+    });
+}
+
 OnceReport::Node* OnceReport::find(ObjectId id) {
     const auto found = nodes_.find(id);
     return found == nodes_.end() ? nullptr : &found->second;
@@ -162,6 +183,7 @@ OnceReport::Row OnceReport::deviceRow(const Node& node) const {
             node.running ? "running" : "stopped",
             fmt::format("{:.2f}", perceivedVolume(node.volume)),
             yesNo(node.muted),
+            node.running ? orNone(node.quantum) : "-",
             orNone(plainText(node.format, kWidest))};
 }
 
@@ -184,7 +206,7 @@ std::optional<OnceReport::Row> OnceReport::streamRow(ObjectId id, const Node& no
 }
 
 std::string OnceReport::text() const {
-    Rows devices{{"NAME", "KIND", "STATE", "VOLUME", "MUTED", "FORMAT"}};
+    Rows devices{{"NAME", "KIND", "STATE", "VOLUME", "MUTED", "QUANTUM", "FORMAT"}};
     Rows streams{{"APPLICATION", "PID", "DIRECTION", "STATE", "VOLUME", "MUTED", "CAPTURES",
                   "FORMAT", "DEVICES"}};
     for (const auto& [id, node] : nodes_) {

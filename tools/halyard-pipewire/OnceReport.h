@@ -12,6 +12,7 @@
 #include <string>
 #include <vector>
 
+#include "Cycle.h"
 #include "GraphEvents.h"
 #include "StreamFacts.h"
 #include "StreamRoutes.h"
@@ -24,7 +25,11 @@ public:
     static constexpr std::size_t kMaxObjects = 8192;
 
     void handle(const GraphEvent& event);
+    // A driver's cycle, which its followers share.
+    void take(const Cycle& cycle);
 
+    // Whether the length of a cycle is known of each device that runs.
+    [[nodiscard]] bool complete() const;
     [[nodiscard]] std::string text() const;
 
 private:
@@ -34,6 +39,7 @@ private:
         float volume = 1;
         bool muted = false;
         std::string format;
+        std::string quantum; // of its last cycle: "1024/48000"
     };
     using Row = std::vector<std::string>;
 

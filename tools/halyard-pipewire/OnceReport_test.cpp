@@ -27,6 +27,15 @@ protected:
             ClientChanged{kClient, {{"application.name", name}, {"pipewire.sec.pid", "42"}}});
     }
     void runs(ObjectId id) { report_.handle(NodeStateChanged{id, NodeState::Running}); }
+    void cycle(ObjectId driver, ObjectId follower) {
+        Cycle cycle;
+        cycle.driver.id = driver;
+        cycle.frames = 1024;
+        cycle.rateNumerator = 1;
+        cycle.rateDenominator = 48000;
+        cycle.followers.push_back({.id = follower});
+        report_.take(cycle);
+    }
     void link(ObjectId from, ObjectId to) { report_.handle(LinkAdded{++lastLink_, from, to}); }
 
     OnceReport report_;
@@ -47,10 +56,11 @@ TEST_F(OnceReportTest, DevicesAndStreamsStandInColumns) {
     report_.handle(NodeVolumeChanged{kStream, 0.064F, false});
     report_.handle(NodeVolumeChanged{kSpeaker, 1, true});
     report_.handle(NodeFormatChanged{kSpeaker, "F32P 2ch 48000Hz"});
+    cycle(kSpeaker, kStream);
     EXPECT_EQ(report_.text(),
               "Devices\n"
-              "  NAME         KIND  STATE    VOLUME  MUTED  FORMAT\n"
-              "  out.speaker  Sink  running  1.00    yes    F32P 2ch 48000Hz\n"
+              "  NAME         KIND  STATE    VOLUME  MUTED  QUANTUM     FORMAT\n"
+              "  out.speaker  Sink  running  1.00    yes    1024/48000  F32P 2ch 48000Hz\n"
               "\n"
               "Streams\n"
               "  APPLICATION  PID  DIRECTION  STATE    VOLUME  MUTED  CAPTURES  FORMAT  DEVICES\n"
@@ -84,6 +94,40 @@ TEST_F(OnceReportTest, WhatHasStoppedIsShownAsStopped) {
     EXPECT_NE(report_.text().find("Sink  running"), std::string::npos);
     report_.handle(NodeStateChanged{kSpeaker, NodeState::Stopped});
     EXPECT_NE(report_.text().find("Sink  stopped"), std::string::npos);
+}
+
+TEST_F(OnceReportTest, ADeviceThatFollowsAnotherHasThatOnesCycle) {
+    node(kSpeaker, "Audio/Sink", "out.speaker");
+    node(kMicrophone, "Audio/Source", "in.microphone");
+    runs(kMicrophone);
+    cycle(kSpeaker, kMicrophone);
+    EXPECT_NE(report_.text().find("no     1024/48000"), std::string::npos);
+}
+
+TEST_F(OnceReportTest, ADeviceThatDoesNotRunHasNoCycle) {
+    node(kSpeaker, "Audio/Sink", "out.speaker");
+    cycle(kSpeaker, kStream);
+    EXPECT_EQ(report_.text().find("1024"), std::string::npos);
+}
+
+TEST_F(OnceReportTest, ItIsCompleteWhenEachRunningDevicesCycleIsKnown) {
+    node(kSpeaker, "Audio/Sink", "out.speaker");
+    node(kStream, "Stream/Output/Audio", "pw-play");
+    runs(kStream);
+    EXPECT_TRUE(report_.complete());
+    runs(kSpeaker);
+    EXPECT_FALSE(report_.complete());
+    cycle(kSpeaker, kStream);
+    EXPECT_TRUE(report_.complete());
+}
+
+TEST_F(OnceReportTest, ACycleOfNonsenseIsShownAsItIs) {
+    node(kSpeaker, "Audio/Sink", "out.speaker");
+    runs(kSpeaker);
+    Cycle cycle;
+    cycle.driver.id = kSpeaker;
+    report_.take(cycle);
+    EXPECT_NE(report_.text().find("0/0"), std::string::npos);
 }
 
 TEST_F(OnceReportTest, TitlesAndFileNamesAreNotShown) {

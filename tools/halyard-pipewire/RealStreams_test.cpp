@@ -138,6 +138,7 @@ TEST_F(RealStreamsTest, ALookShowsWhoPlaysWhere) {
     EXPECT_TRUE(look.answered);
     EXPECT_NE(look.text.find("out.headphones  Sink"), std::string::npos);
     EXPECT_NE(look.text.find("test-player"), std::string::npos);
+    EXPECT_NE(look.text.find("/48000  F32P 2ch 48000Hz"), std::string::npos) << look.text;
     EXPECT_NE(look.text.find("S16LE 2ch 48000Hz  out.speaker\n"), std::string::npos);
     EXPECT_EQ(look.text.find("silence"), std::string::npos) << "a file's name";
 }
