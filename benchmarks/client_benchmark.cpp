@@ -65,6 +65,7 @@ struct Case {
     int messages; // of each thread
     microseconds pause;
     bool build; // the message anew each time
+    bool issue = false;
 };
 
 void fill(Dictionary& message, int number) {
@@ -78,6 +79,12 @@ void fill(Dictionary& message, int number) {
         .set("application", "org.example.player")
         .set("count", number);
 }
+
+constexpr Issue kIssue{.category = HALYARD_CATEGORY_PLAYBACK,
+                       .issueType = "client_slow",
+                       .rtaidClient = "org.example.player",
+                       .node = "Example Player",
+                       .anyChannelSilenceSeconds = 0.02};
 
 void waitUntil(Clock::time_point due, microseconds pause) {
     if (pause >= milliseconds(1)) {
@@ -100,7 +107,11 @@ void report(Session& session, const Case& what, std::vector<double>& times) {
         if (what.build) {
             fill(message, i);
         }
-        session.send(message, HALYARD_CATEGORY_IO, HALYARD_TYPE_STATE);
+        if (what.issue) {
+            session.reportIssue(kIssue, message);
+        } else {
+            session.send(message, HALYARD_CATEGORY_IO, HALYARD_TYPE_STATE);
+        }
         times.push_back(since(before));
     }
 }
@@ -161,6 +172,7 @@ int main() {
     const Case cases[] = {
         {"every 20 us", 1, 200'000, microseconds(20), false},
         {"every 20 us, message built anew", 1, 200'000, microseconds(20), true},
+        {"every 20 us, an issue beside the message", 1, 200'000, microseconds(20), false, true},
         {"every 20 us, in each of 4 threads", 4, 50'000, microseconds(20), false},
         {"back to back", 1, 500'000, microseconds(0), false},
         {"every 5 ms", 1, 1000, milliseconds(5), false},

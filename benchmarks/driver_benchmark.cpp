@@ -3,8 +3,13 @@
 
 #include <benchmark/benchmark.h>
 
+#include <cstdlib>
+#include <filesystem>
+#include <string>
+
 #include "linux/drivers/LinuxHWReport.h"
 #include "linux/system/LinuxFacts.h"
+#include "testing/TempTree.h"
 
 namespace {
 
@@ -64,5 +69,45 @@ void discovery(benchmark::State& state) {
     }
 }
 BENCHMARK(discovery);
+
+// Eight devices of each direction whose cycles are counted, among as many files as
+// the argument says that somebody else has left there.
+void cycles(benchmark::State& state) {
+    const testing::TempTree tree("/dev/shm");
+    const auto flood = [&] {
+        for (std::int64_t i = 0; i < state.range(0); ++i) {
+            std::filesystem::create_symlink("nowhere",
+                                            tree / ("out-" + std::to_string(i) + ".counts"));
+        }
+    };
+    std::string histogram;
+    for (int i = 0; i < 44; ++i) {
+        histogram += std::to_string(i) + " " + std::to_string(i + 1) + " 12345678\n";
+    }
+    for (int i = 0; i < 16; ++i) {
+        const std::string stem = (i % 2 == 0 ? "in-device" : "out-device") + std::to_string(i);
+        for (const char* part : {".wait", ".busy", ".cycle"}) {
+            tree.write(stem + part, histogram);
+        }
+        tree.write(stem + ".counts", "direction sink\ncycles 12345678\nmissed 12\n");
+    }
+    linux_::SystemClock clock;
+    linux_::LinuxHWReport library(
+        clock, {}, {"/nonexistent", {}, tree.path(), [](std::uint32_t) { return true; }});
+    const auto all = library.copyChannelsInGroup(std::nullopt, std::nullopt);
+    const auto subscribed = library.createSubscription(*all.value);
+    const auto sample = [&] {
+        return library.createSamples(subscribed.subscription, subscribed.channels.get()).value;
+    };
+    platform::HWReportSamplesRef samples = sample();
+    flood();
+    for (auto _ : state) {
+        samples = sample();
+        benchmark::DoNotOptimize(samples);
+    }
+    state.counters["bytes"] =
+        static_cast<double>(dynamic_cast<const linux_::SampleSet&>(*samples).footprint());
+}
+BENCHMARK(cycles)->Arg(0)->Arg(100'000);
 
 } // namespace

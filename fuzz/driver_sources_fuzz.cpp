@@ -6,6 +6,7 @@
 #include <string_view>
 
 #include "Require.h"
+#include "linux/drivers/CycleChannels.h"
 #include "linux/drivers/SourceKinds.h"
 #include "linux/drivers/SourceText.h"
 
@@ -55,6 +56,8 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     checkBuckets(parseTraceHistogram(text));
     const auto status = parsePcmStatus(text);
     require(!status || !status->state.empty());
+    const auto device = cycleDeviceName(text);
+    require(!device || (!device->empty() && device->size() <= text.size()));
     checkSource(text);
     return 0;
 }

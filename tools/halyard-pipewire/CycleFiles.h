@@ -40,7 +40,9 @@ public:
 
     // Writes the files of those devices whose counts have changed, unless that was
     // done less than a second ago. Before it does so for the first time, it removes
-    // what earlier runs of the same user left there.
+    // what earlier runs of the same user left there. To be called about once a second
+    // while cycles are counted: what was counted before the first call after a device
+    // came is told with its first file.
     void write(CycleStatistics& statistics, SteadyTime now);
     // Removes all that was written, at the end: after the sessions have been
     // stopped, or their statistics lack these.
