@@ -12,6 +12,7 @@
 #include <unistd.h>
 #include <utility>
 
+#include "BusyProcesses.h"
 #include "ClientSessions.h"
 #include "CycleCounter.h"
 #include "CycleFiles.h"
@@ -32,6 +33,7 @@ Reports the playback and capture streams of a PipeWire daemon to halyardd.
   -r, --remote=NAME   the PipeWire daemon to watch (its usual one)
   -s, --socket=PATH   the socket of halyardd (its usual place)
   -1, --once          look for a second, print what is there, and end
+  -b, --blame         name the busiest processes in what is told of a glitch
   -v, --verbose       say on standard error what is reported
   -h, --help          show this help
   -V, --version       show the version
@@ -44,20 +46,19 @@ struct Arguments {
     std::string remote;
     std::string socket;
     bool once = false;
+    bool blame = false;
     bool verbose = false;
     int exitStatus = -1; // set: nothing to run
 };
 
 Arguments parse(int argc, char** argv) {
-    static const option kOptions[] = {{"remote", required_argument, nullptr, 'r'},
-                                      {"socket", required_argument, nullptr, 's'},
-                                      {"once", no_argument, nullptr, '1'},
-                                      {"verbose", no_argument, nullptr, 'v'},
-                                      {"help", no_argument, nullptr, 'h'},
-                                      {"version", no_argument, nullptr, 'V'},
-                                      {}};
+    static const option kOptions[] = {
+        {"remote", required_argument, nullptr, 'r'}, {"socket", required_argument, nullptr, 's'},
+        {"once", no_argument, nullptr, '1'},         {"blame", no_argument, nullptr, 'b'},
+        {"verbose", no_argument, nullptr, 'v'},      {"help", no_argument, nullptr, 'h'},
+        {"version", no_argument, nullptr, 'V'},      {}};
     Arguments arguments;
-    for (int found = 0; (found = getopt_long(argc, argv, "r:s:1vhV", kOptions, nullptr)) != -1;) {
+    for (int found = 0; (found = getopt_long(argc, argv, "r:s:1bvhV", kOptions, nullptr)) != -1;) {
         switch (found) {
         case 'r':
             arguments.remote = optarg;
@@ -67,6 +68,9 @@ Arguments parse(int argc, char** argv) {
             break;
         case '1':
             arguments.once = true;
+            break;
+        case 'b':
+            arguments.blame = true;
             break;
         case 'v':
             arguments.verbose = true;
@@ -165,8 +169,9 @@ public:
           client_({.socketPath = arguments.socket.empty() ? nullptr : arguments.socket.c_str(),
                    .connectionChanged = [this](bool connected) { post(connected); }}),
           sessions_(client_), sink_(sessions_, arguments.verbose),
-          streams_(sink_, firstReporterID()),
-          glitches_(sink_, {.note = arguments.verbose ? note : nullptr}) {
+          streams_(sink_, firstReporterID()), blame_(arguments.blame),
+          glitches_(sink_, {.note = arguments.verbose ? note : nullptr,
+                            .busiest = [this] { return busiest(); }}) {
         streams_.observe(glitches_);
         glitches_.settled = [this](StreamKey stream) { streams_.settle(stream); };
         if (!client_) {
@@ -194,6 +199,7 @@ private:
             devices_.take(cycle);
         }
     }
+    Dictionaries busiest() const { return blame_ ? busy_.busiest(monotonicNow()) : Dictionaries(); }
     // Nothing is looked at while nothing runs.
     void watch() {
         if (std::exchange(watching_, glitches_.watching()) == watching_) {
@@ -201,6 +207,9 @@ private:
         }
         graph_.every(watching_ ? GlitchWatch::kTick : std::chrono::milliseconds(0), [this] {
             files_.write(devices_.statistics());
+            if (blame_) {
+                busy_.look(monotonicNow());
+            }
             glitches_.tick();
             watch();
         });
@@ -235,6 +244,8 @@ private:
     ClientSessions sessions_;
     NotingSink sink_;
     StreamTracker streams_;
+    const bool blame_;
+    BusyProcesses busy_;
     GlitchWatch glitches_;
     bool watching_ = false;
     bool wasLost_ = false;
