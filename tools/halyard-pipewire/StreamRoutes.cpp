@@ -76,7 +76,9 @@ void StreamRoutes::walk(ObjectId from, const Ways& ways, ObjectId LinkAdded::*en
     }
 }
 
-void StreamRoutes::addVolume(Route& route, const Place& device, bool first) {
+void StreamRoutes::addPrincipal(Route& route, const Place& device, bool first) {
+    const std::string name = property(device.properties, "node.name");
+    route.principal = first ? name : std::min(route.principal, name);
     route.volume = first ? device.volume : std::max(route.volume, device.volume);
     route.muted = device.muted && (first || route.muted);
 }
@@ -84,14 +86,14 @@ void StreamRoutes::addVolume(Route& route, const Place& device, bool first) {
 Route StreamRoutes::routeOf(ObjectId stream) const {
     Route route;
     walk(stream, downstream_, &LinkAdded::inputNode, [&](const Place& device) {
-        addVolume(route, device, !route.plays);
+        addPrincipal(route, device, !route.plays);
         route.plays = true;
         route.devices.insert(property(device.properties, "node.name"));
     });
     const auto listener = places_.find(stream);
     walk(stream, upstream_, &LinkAdded::outputNode, [&](const Place& device) {
         if (!route.plays) {
-            addVolume(route, device, !route.captures());
+            addPrincipal(route, device, !route.captures());
         }
         const bool monitor = listener != places_.end() &&
                              givesMonitor(device.properties, listener->second.properties);

@@ -19,6 +19,7 @@ namespace halyard::pipewire {
 
 struct Route {
     std::set<std::string> devices; // node names of all of them
+    std::string principal;         // the first that plays, else that is captured
     bool plays = false;            // sound goes to a device
     bool hears = false;            // sound comes from what a device hears: a microphone
     bool monitors = false;         // sound comes from what others play on a device
@@ -58,7 +59,7 @@ private:
     using Ways = std::set<std::pair<ObjectId, ObjectId>>;
 
     // Of a device that is the first that counts, or one more.
-    static void addVolume(Route& route, const Place& device, bool first);
+    static void addPrincipal(Route& route, const Place& device, bool first);
     void removeLink(ObjectId id);
     template <class Visit>
     void walk(ObjectId from, const Ways& ways, ObjectId LinkAdded::*end, Visit visit) const;

@@ -57,6 +57,13 @@ TEST_F(StreamRoutesTest, AStreamReachesTheDevicesItIsLinkedTo) {
     EXPECT_EQ(routes_.routeOf(kStream).devices, Devices{"speaker"});
 }
 
+TEST_F(StreamRoutesTest, OfSeveralDevicesTheFirstByNameIsThePrincipal) {
+    link(kStream, kSpeaker);
+    EXPECT_EQ(routes_.routeOf(kStream).principal, "speaker");
+    link(kStream, kHeadphones);
+    EXPECT_EQ(routes_.routeOf(kStream).principal, "headphones");
+}
+
 TEST_F(StreamRoutesTest, ADeviceLinkedTwiceStaysUntilBothLinksAreGone) {
     const ObjectId left = link(kStream, kSpeaker);
     const ObjectId right = link(kStream, kSpeaker);
@@ -109,6 +116,7 @@ TEST_F(StreamRoutesTest, AProgramThatPlaysAndCapturesHasTheDevicesOfBoth) {
     const Route route = routes_.routeOf(kFirstProgram);
     EXPECT_TRUE(route.captures() && route.plays);
     EXPECT_EQ(route.devices, (Devices{"microphone", "speaker"}));
+    EXPECT_EQ(route.principal, "speaker");
     EXPECT_EQ(route.volume, 0.25F);
 }
 

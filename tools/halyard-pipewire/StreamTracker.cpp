@@ -190,8 +190,6 @@ void StreamTracker::beginRun(ObjectId id, Session& session, const Node& stream) 
     ++session.run;
     session.facts.node = id;
     session.facts.bufferSeconds = bufferSeconds(stream.properties, session.around.format);
-    session.facts.device =
-        session.around.devices.empty() ? std::string() : *session.around.devices.begin();
     if (observer_ != nullptr) {
         observer_->runs(session.facts);
     }
@@ -284,13 +282,14 @@ void StreamTracker::follow(Session& session, const Node& stream, const Route& ro
         session.around.format = stream.format;
     }
     if (!route.devices.empty()) {
+        session.facts.device = route.principal;
         session.deviceVolume = route.volume;
         session.around.devicesMuted = route.muted;
         session.around.hears = route.hears;
         session.around.monitors = route.monitors;
     }
     if (rerouted && observer_ != nullptr) {
-        observer_->routed(session.reporterID, *route.devices.begin());
+        observer_->routed(session.reporterID, route.principal);
     }
     if (rerouted) {
         const std::set<std::string> previous = std::exchange(session.around.devices, route.devices);
