@@ -299,6 +299,13 @@ bool GlitchFinder::pending(StreamKey key, Nanoseconds now) const {
     return !seenPast && now - *found->second.until < kPatience;
 }
 
+bool GlitchFinder::waiting(Nanoseconds now) const {
+    return std::any_of(streams_.begin(), streams_.end(), [now](const auto& entry) {
+        const Stream& stream = entry.second;
+        return stream.episode || !stream.until || now - *stream.until < kPatience;
+    });
+}
+
 bool GlitchFinder::isOver(const Stream& stream, Nanoseconds now) const {
     const Episode& episode = *stream.episode;
     const Nanoseconds gap = gapOf(episode);

@@ -73,6 +73,8 @@ public:
 
     // True until everything that is to be known of an ended stream is.
     bool pending(StreamKey stream, Nanoseconds now) const;
+    // Records are waited for: a stream runs, or did so lately, or has an episode.
+    bool waiting(Nanoseconds now) const;
     // The one that is open. Null when none is.
     const Episode* episode(StreamKey stream) const;
     // Of the stream's last cycle; 0 before the first.

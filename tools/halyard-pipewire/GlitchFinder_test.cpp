@@ -180,6 +180,18 @@ TEST_F(GlitchFinderTest, RecordsOfAnEndedStreamStillCount) {
     EXPECT_FALSE(finder_.pending(kStream, stop));
 }
 
+TEST_F(GlitchFinderTest, RecordsAreWaitedForAfterTheLastStreamStopped) {
+    const Nanoseconds stop = graph_.now() + 10 * kLength;
+    EXPECT_TRUE(finder_.waiting(stop));
+    finder_.end(kStream, stop);
+    missed(8);
+    EXPECT_TRUE(finder_.waiting(stop + 2 * GlitchFinder::kPatience)); // to be told
+    due(2 * GlitchFinder::kPatience);
+    EXPECT_EQ(told_.size(), 1U);
+    EXPECT_TRUE(finder_.waiting(stop + GlitchFinder::kPatience - 1));
+    EXPECT_FALSE(finder_.waiting(stop + GlitchFinder::kPatience));
+}
+
 TEST_F(GlitchFinderTest, ANodeIDThatIsUsedAgainIsAnotherStreams) {
     finder_.end(kStream, graph_.now());
     const Nanoseconds again = graph_.now() + 4 * kLength;

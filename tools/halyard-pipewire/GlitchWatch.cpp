@@ -63,11 +63,8 @@ void GlitchWatch::runs(const StreamRun& run) {
     if (!stream.program) {
         stream.program = programOf(run);
     }
-    if (!ranBefore) {
-        ++running_;
-        if (stream.program) {
-            ++stream.program->streams;
-        }
+    if (!ranBefore && stream.program) {
+        ++stream.program->streams;
     }
 }
 
@@ -83,7 +80,6 @@ void GlitchWatch::stopped(StreamKey key) {
     if (found == streams_.end() || !std::exchange(found->second.running, false)) {
         return;
     }
-    --running_;
     if (found->second.program) {
         --found->second.program->streams;
     }

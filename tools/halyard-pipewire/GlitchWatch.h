@@ -54,7 +54,7 @@ public:
     void take(const Cycle& cycle) { finder_.take(cycle); }
     // To be called every kTick while there is something to watch.
     void tick();
-    bool watching() const { return running_ != 0 || !leaving_.empty(); }
+    bool watching() const { return !leaving_.empty() || finder_.waiting(options_.clock()); }
 
     // Called from tick() for a stream of which everything is known after its node
     // went.
@@ -119,7 +119,6 @@ private:
     std::map<StreamKey, Stream> streams_;
     std::map<std::int64_t, std::weak_ptr<Program>> programs_;
     std::map<StreamKey, Nanoseconds> leaving_; // gone, and since when
-    std::size_t running_ = 0;
     std::uint64_t unwatched_ = 0;
 };
 
