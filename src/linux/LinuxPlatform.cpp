@@ -10,6 +10,7 @@
 #include <utility>
 
 #include "linux/queues/BlockingSection.h"
+#include "linux/system/CollectedFiles.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {
@@ -17,7 +18,6 @@ namespace {
 
 constexpr const char* kSocketName = "reporting";
 constexpr const char* kSocketFile = "reporting.sock";
-constexpr const char* kStoreFile = "telemetry.db";
 constexpr const char* kCyclesFolder = "cycles";
 // Sessions may wait nine seconds for their back ends, the store ten for a disk.
 constexpr std::chrono::seconds kShutdownLimit{25};
@@ -45,6 +45,10 @@ Dictionary describe(const ListenerCounters& counters) {
                       {"requests", counters.requests.load()},
                       {"bad_requests", counters.badRequests.load()},
                       {"bytes_read", counters.bytesRead.load()}};
+}
+
+Error errorOf(const Failure& failure) {
+    return {"posix", static_cast<std::int64_t>(failure.code), "cannot purge: " + failure.message()};
 }
 
 } // namespace
@@ -87,7 +91,7 @@ void LinuxPlatform::makeServices(const Settings& settings) {
     incidents_ = std::make_unique<IncidentFolder>(
         system_.clock,
         IncidentFolder::Options{
-            directories_.state / "incidents", "/proc", [this] { return log_.recentLines(); },
+            directories_.state / kIncidentsFolder, "/proc", [this] { return log_.recentLines(); },
             [this](const Dictionary& signature, std::string_view report, platform::WallTime) {
                 (void)store_->store.addIncident(signature, report);
             }});
@@ -241,6 +245,35 @@ void LinuxPlatform::saveWhatWasAccepted() {
 
 void LinuxPlatform::flush(std::function<void()> done) {
     queues_->drain([this, done = std::move(done)] { store_->store.flush(done); });
+}
+
+// In the order in which things are made of each other: what is on its way becomes rows
+// and incidents, an incident becomes a folder and a row.
+void LinuxPlatform::purge(PurgeReply reply) {
+    queues_->drain([this, reply = std::move(reply)] {
+        incidents_->whenIdle([this, reply] {
+            const Result<void> removed = removeCollectedState(directories_.state);
+            store_->store.flush([this, reply, removed] { purgeStore(reply, removed); });
+        });
+    });
+}
+
+void LinuxPlatform::purgeStore(const PurgeReply& reply, const Result<void>& incidents) {
+    store_->store.purge([this, reply, incidents](const auto& rows) {
+        // Again: a file that turned out to be damaged was set aside just now.
+        const Result<void> state = removeCollectedState(directories_.state);
+        const Result<void> logs = removeCollectedLogs(directories_.logs);
+        for (const Result<void>* const result : {&incidents, &state, &logs}) {
+            if (!result->ok()) {
+                return reply(errorOf(result->failure()), 0);
+            }
+        }
+        if (!rows.ok()) {
+            return reply(errorOf(rows.failure()), 0);
+        }
+        HY_LOG_DEFAULT(HYReportingPlatformCategory, "purged {} rows", rows.value());
+        reply(std::nullopt, rows.value());
+    });
 }
 
 Dictionary LinuxPlatform::status() const {

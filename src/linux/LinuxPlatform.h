@@ -48,8 +48,10 @@ public:
 
 private:
     void flush(std::function<void()> done) override;
+    void purge(PurgeReply reply) override;
     Dictionary status() const override;
 
+    void purgeStore(const PurgeReply& reply, const Result<void>& incidents);
     void makeServices(const Settings& settings);
     LinuxHWReport::Options driverOptions();
     void applySettings(const Settings& settings);

@@ -96,6 +96,7 @@ TEST(CallDecoderTest, KnowsEveryMethodAndItsArguments) {
         {"admin.postNotification", {packed("x")}},
         {"admin.flush", {}},
         {"admin.status", {}},
+        {"admin.purge", {}},
     };
     std::size_t index = 0;
     for (const auto& [name, params] : methods) {

@@ -235,7 +235,7 @@ TEST(AppendCallTest, WritesNilForNoIDList) {
 }
 
 TEST(AppendCallTest, IsWhatTheDecoderTakesForEveryMethod) {
-    for (int i = 0; i <= static_cast<int>(Method::AdminStatus); ++i) {
+    for (int i = 0; i <= static_cast<int>(Method::AdminPurge); ++i) {
         const auto method = static_cast<Method>(i);
         const auto decoded = CallDecoder().decode(call(9, method));
         ASSERT_TRUE(decoded.has_value());

@@ -43,6 +43,7 @@ constexpr MethodEntry kMethods[] = {
     {Method::AdminPostNotification, "admin.postNotification", 1, {Argument::Name}},
     {Method::AdminFlush, "admin.flush"},
     {Method::AdminStatus, "admin.status"},
+    {Method::AdminPurge, "admin.purge"},
 };
 
 constexpr bool inOrder() {

@@ -33,6 +33,7 @@ enum class Method : std::uint8_t {
     AdminPostNotification,
     AdminFlush,
     AdminStatus,
+    AdminPurge,
 };
 
 using ReporterIDs = std::vector<std::int64_t>;

@@ -114,6 +114,7 @@ void RequestDispatch::handle(protocol::Request request) {
     case Method::AdminPostNotification:
     case Method::AdminFlush:
     case Method::AdminStatus:
+    case Method::AdminPurge:
         return handleAdministration(std::move(request));
     }
 }
@@ -127,6 +128,12 @@ void RequestDispatch::handleAdministration(protocol::Request request) {
     case Method::AdminFlush:
         platform::current().operations->flush(
             [reply = std::move(request.reply)] { reply(std::nullopt, true); });
+        break;
+    case Method::AdminPurge:
+        platform::current().operations->purge(
+            [reply = std::move(request.reply)](const MaybeError& error, std::uint64_t rows) {
+                reply(error, rows);
+            });
         break;
     default:
         answerStatus(request.reply);

@@ -164,6 +164,22 @@ TEST_F(RequestDispatchTest, AFlushIsAnsweredWhenItIsDone) {
     EXPECT_TRUE(succeeded(answer));
 }
 
+TEST_F(RequestDispatchTest, APurgeIsAnsweredWithTheRowsThatWent) {
+    const auto answer = ask(Method::AdminPurge);
+    EXPECT_FALSE(answer->given());
+    ASSERT_THAT(platform_.operations.purges, SizeIs(1));
+    platform_.operations.purges[0](std::nullopt, 12);
+    EXPECT_TRUE(answer->given());
+    EXPECT_EQ(answer->result, Value(12));
+}
+
+TEST_F(RequestDispatchTest, APurgeThatFailedSaysSo) {
+    const auto answer = ask(Method::AdminPurge);
+    ASSERT_THAT(platform_.operations.purges, SizeIs(1));
+    platform_.operations.purges[0](Error{"posix", 5, "cannot purge"}, 0);
+    EXPECT_EQ(answer->error->message, "cannot purge");
+}
+
 TEST_F(RequestDispatchTest, TheStatusJoinsTheAdaptersCountersAndTheServices) {
     platform_.operations.counters = {{"uptime_sec", 12}};
     const Peer peer = connect(100);

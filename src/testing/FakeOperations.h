@@ -8,13 +8,15 @@
 
 namespace halyard::testing {
 
-// Keeps the flushes until the test completes them.
+// Keeps flushes and purges until the test completes them.
 class FakeOperations final : public platform::Operations {
 public:
     void flush(std::function<void()> done) override { flushes.push_back(std::move(done)); }
+    void purge(PurgeReply reply) override { purges.push_back(std::move(reply)); }
     Dictionary status() const override { return counters; }
 
     std::vector<std::function<void()>> flushes;
+    std::vector<PurgeReply> purges;
     Dictionary counters;
 };
 

@@ -19,7 +19,8 @@ constexpr std::size_t kKeptCapacity = 4096;
 
 bool needsAdministrator(Method method) {
     return method == Method::KillService || method == Method::AdminPostNotification ||
-           method == Method::AdminFlush || method == Method::AdminStatus;
+           method == Method::AdminFlush || method == Method::AdminStatus ||
+           method == Method::AdminPurge;
 }
 
 std::string_view reason(FrameScanner::Outcome outcome) {

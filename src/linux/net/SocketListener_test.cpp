@@ -81,7 +81,7 @@ TEST_F(SocketListenerTest, OrdinaryPeersMayNotAdminister) {
     rights_ = PeerRights::Client;
     const int client = connect();
     for (const Method method : {Method::KillService, Method::AdminFlush, Method::AdminStatus,
-                                Method::AdminPostNotification}) {
+                                Method::AdminPostNotification, Method::AdminPurge}) {
         send(client, call(method));
         EXPECT_EQ(answer(client).error->code, static_cast<int>(IpcErrorCode::NotAllowed));
     }

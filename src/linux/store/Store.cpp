@@ -141,6 +141,13 @@ bool Store::close() {
     return ended;
 }
 
+void Store::purge(StoreWriter::PurgeReply reply) {
+    if (open_) {
+        return writer_->purge(std::move(reply));
+    }
+    reply(StoreFailure{{{}, "the daemon runs without a store"}, SQLITE_CANTOPEN});
+}
+
 StoreUploadPtr Store::openUpload(std::int64_t sessionID, const Dictionary& sessionInfo,
                                  const Dictionary& userInfo) {
     auto upload = std::make_shared<StoreUpload>();

@@ -64,6 +64,10 @@ public:
     // the store's thread, or at once when nothing is waiting.
     void flush(std::function<void()> done) { queue_->flush(std::move(done)); }
 
+    // Takes out all that was committed: see StoreDatabase::purge. The answer comes on the
+    // store's thread, at once without a store.
+    void purge(StoreWriter::PurgeReply reply);
+
     void setLimits(StoreLimits limits) { writer_->setLimits(limits); }
     StoreStatus status() const { return writer_->status(); }
 

@@ -7,6 +7,7 @@
 #include <utility>
 
 #include "common/Utf8.h"
+#include "linux/store/StorePurge.h"
 
 namespace halyard::linux_ {
 namespace {
@@ -300,6 +301,13 @@ void StoreDatabase::rollback() {
         upload->row = 0;
     }
     groupUploads_.clear();
+}
+
+Result<std::uint64_t, StoreFailure> StoreDatabase::purge() {
+    auto purged = storePurge(database_, firstUpload_);
+    logPages_ = triedLogPages_ = purged.ok() ? 0 : logPages_;
+    const StoreResult counted = readPageCounts();
+    return counted.ok() ? purged : counted.failure();
 }
 
 StoreResult StoreDatabase::boundLog(std::uint64_t maxBytes, std::uint64_t checkpointBytes) {

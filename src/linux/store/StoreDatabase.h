@@ -70,6 +70,10 @@ public:
     // What the last commit wrote.
     const RowCounts& committedRows() const { return committedRows_; }
 
+    // How many rows went; open sessions of this run keep theirs, empty. No bytes of
+    // rows are left in file or log when it succeeded. Requires no begin().
+    Result<std::uint64_t, StoreFailure> purge();
+
     // Bounds the write-ahead log, which cannot be reused while a reader stays in
     // one transaction. SQLITE_BUSY when a reader keeps more of it than `maxBytes`.
     StoreResult boundLog(std::uint64_t maxBytes, std::uint64_t checkpointBytes);

@@ -148,6 +148,7 @@ void StoreWriter::closeDatabase() {
 
 void StoreWriter::run() {
     for (;;) {
+        purgeIfAsked();
         const auto idle = trimMore_            ? std::chrono::nanoseconds(0)
                           : database_.isOpen() ? options_.agePeriod
                                                : options_.lastRetry;
@@ -210,6 +211,44 @@ void StoreWriter::maintain() {
     if (const StoreResult done = attempt({}); !done.ok()) {
         beginEpisode(lossOf(done.failure()), done.failure().text);
     }
+}
+
+void StoreWriter::purge(PurgeReply reply) {
+    {
+        const MutexLock lock(mutex_);
+        purges_.push_back(std::move(reply));
+    }
+    queue_->wake();
+}
+
+void StoreWriter::purgeIfAsked() {
+    std::vector<PurgeReply> asked;
+    {
+        const MutexLock lock(mutex_);
+        asked.swap(purges_);
+    }
+    if (asked.empty()) {
+        return;
+    }
+    busySince_.store(clock_.steadyTime().time_since_epoch().count());
+    const auto purged = purgeRows();
+    busySince_.store(0);
+    noteSizes();
+    for (const PurgeReply& reply : asked) {
+        reply(purged);
+    }
+}
+
+Result<std::uint64_t, StoreFailure> StoreWriter::purgeRows() {
+    if (const StoreResult open = reopenIfNeeded(); !open.ok()) {
+        return open.failure();
+    }
+    auto purged = database_.purge();
+    if (!purged.ok() && purged.failure().isDamage()) {
+        const StoreResult replaced = replaceDamaged(purged.failure());
+        return replaced.ok() ? database_.purge() : replaced.failure();
+    }
+    return purged;
 }
 
 StoreResult StoreWriter::attempt(std::span<StoreItem> group) {

@@ -6,6 +6,7 @@
 #pragma once
 
 #include <atomic>
+#include <functional>
 #include <memory>
 #include <optional>
 #include <span>
@@ -70,6 +71,11 @@ public:
     // Looks whether run() hangs. Any thread.
     void watch();
 
+    // Removes every row that was committed by then, see StoreDatabase. The answer comes
+    // on the writer's thread, or not at all when that has ended.
+    using PurgeReply = std::function<void(const Result<std::uint64_t, StoreFailure>&)>;
+    void purge(PurgeReply reply) HY_EXCLUDES(mutex_);
+
     void setLimits(StoreLimits limits) HY_EXCLUDES(mutex_);
     StoreStatus status() const HY_EXCLUDES(mutex_);
 
@@ -87,6 +93,8 @@ private:
     StoreResult reopenIfNeeded();
     void writeGroup(std::span<StoreItem> group);
     void maintain();
+    void purgeIfAsked() HY_EXCLUDES(mutex_);
+    Result<std::uint64_t, StoreFailure> purgeRows();
     StoreResult attempt(std::span<StoreItem> group);
     StoreResult writeRows(std::span<StoreItem> group);
     StoreResult insertAll(std::span<StoreItem> group);
@@ -120,6 +128,7 @@ private:
     StoreLimits limits_ HY_GUARDED_BY(mutex_);
     std::optional<Episode> episode_ HY_GUARDED_BY(mutex_);
     StoreStatus status_ HY_GUARDED_BY(mutex_);
+    std::vector<PurgeReply> purges_ HY_GUARDED_BY(mutex_);
 };
 
 } // namespace halyard::linux_

@@ -57,6 +57,9 @@ public:
     void snapshotWithSignature(const Dictionary& signature, double duration, const Value& event,
                                const Value& payload, Reply reply) override;
 
+    // Runs `task` on the worker, behind the snapshots that wait.
+    void whenIdle(std::function<void()> task) { worker_.post(std::move(task)); }
+
     std::uint64_t refusedSnapshots() const { return refused_.load(); }
     std::uint64_t failedSnapshots() const { return failed_.load(); }
 

@@ -1,0 +1,22 @@
+// The files that hold what was collected, beside the store itself.
+//
+// Free functions; any thread.
+#pragma once
+
+#include <filesystem>
+
+#include "common/Result.h"
+
+namespace halyard::linux_ {
+
+// Where the daemon keeps its store and its incidents, and what it calls them.
+inline constexpr const char* kStoreFile = "telemetry.db";
+inline constexpr const char* kIncidentsFolder = "incidents";
+
+// Removes incidents and files of the store that were set aside. Links are removed and
+// not followed. Goes on after a failure, and tells of the first.
+Result<void> removeCollectedState(const std::filesystem::path& state);
+// Removes summaries and traces.
+Result<void> removeCollectedLogs(const std::filesystem::path& logs);
+
+} // namespace halyard::linux_
