@@ -331,10 +331,11 @@ class Sending(CtlTest):
         self.assertIn("line 2: no dictionary", done.stderr)
         self.assertIn("line 4: no dictionary", done.stderr)
         rows = self.rows("SELECT s.session_id, m.category, m.type, m.payload FROM upload_message m "
-                         "JOIN upload_session s ON s.id = m.upload_session ORDER BY m.id")
-        self.assertEqual([row[:3] for row in rows if "audiotag" in row[3]],
-                         [(1, 4, 1), (2, 4, 1), (1, 4, 1), (2, 4, 1)])
-        self.assertEqual([json.loads(row[3])["a"] for row in rows], [1, 1, 2**63, 2**63])
+                         "JOIN upload_session s ON s.id = m.upload_session "
+                         "ORDER BY s.session_id, m.id")
+        self.assertEqual([row[:3] for row in rows],
+                         [(1, 4, 1), (1, 4, 1), (2, 4, 1), (2, 4, 1)])
+        self.assertEqual([json.loads(row[3])["a"] for row in rows], [1, 2**63, 1, 2**63])
         self.assertIn("hyreporting_timestamp", json.loads(rows[0][3]))
 
     def test_without_a_session_all_that_run_get_it(self):
@@ -383,6 +384,138 @@ class Sending(CtlTest):
         self.assertEqual(self.connect().result("getAllReporters"), [])
 
 
+class Caring(CtlTest):
+    configuration = '[device_properties]\nInternalBuild = true\n'
+
+    def collected(self):
+        """All bytes in the daemon's state and logs directories."""
+        found = b""
+        for top in ("state", "log"):
+            for folder, _, names in os.walk(self.daemon.path(top)):
+                for name in names:
+                    with open(os.path.join(folder, name), "rb") as file:
+                        found += name.encode() + file.read()
+        return found
+
+    def collect(self):
+        """Rows, a summary, an incident and a file that was set aside, all with a secret."""
+        client = self.connect()
+        start = client.session(1, 3, "secret-application")
+        client.session(2, 3, "secret-too")
+        for number in range(3):
+            client.result("sendMessage", {"Haptic_Active_Hardware_Time_Seconds": number,
+                                          "text": "secret"}, 4, 8, [1])
+        client.result("stopReportingSessionForID", 1)
+        client.answer(start)
+        for path in ("state/telemetry.db.damaged-x", "log/Traces/trace"):
+            os.makedirs(os.path.dirname(self.daemon.path(path)), exist_ok=True)
+            with open(self.daemon.path(path), "w", encoding="utf-8") as file:
+                file.write("secret")
+        self.daemon.wait_for(lambda: self.rows("SELECT 1 FROM incident"))
+        self.flush()
+        for text in (b"secret-application", b"secret-too", b".json"):
+            self.assertIn(text, self.collected())
+
+    def test_a_purge_through_the_daemon_leaves_not_a_byte(self):
+        self.collect()
+        tables = [row[0] for row in self.daemon.rows(
+            "SELECT name FROM sqlite_master WHERE type = 'table'")]
+        rows = sum(self.daemon.rows(f"SELECT count(*) FROM {table}")[0][0] for table in tables)
+        # Clients that have just gone leave a row each.
+        self.assertGreaterEqual(self.listed("purge")["rows"], rows - 1)
+        self.assertNotIn(b"secret", self.collected())
+        [session] = self.listed("sessions")
+        self.assertEqual((session["session_id"], session["application"]), (2, None))
+        self.assertEqual((self.listed("messages"), self.listed("energy")), ([], []))
+        self.connect().result("sendMessage", {"n": 1}, 4, 1, [2])
+        self.flush()
+        self.assertEqual(len(self.listed("messages")), 1)
+
+    def test_a_purge_without_a_daemon_does_the_same(self):
+        self.collect()
+        self.assertEqual(self.daemon.terminate(), 0)
+        done = self.ctl("purge", "--json", env={**os.environ,
+                                                "LOGS_DIRECTORY": self.daemon.path("log")})
+        self.assertEqual(done.returncode, 0, done.stderr)
+        self.assertGreater(json.loads(done.stdout)["rows"], 3)
+        self.assertNotIn(b"secret", self.collected())
+        self.assertEqual(self.listed("sessions"), [])
+
+    def test_a_purge_of_another_store_leaves_the_daemons_alone(self):
+        self.collect()
+        copy = self.daemon.path("copy")
+        shutil.copytree(os.path.dirname(self.daemon.store_path), copy)
+        done = subprocess.run([HALYARDCTL, "--state", copy, "--socket", self.daemon.socket_path,
+                               "purge"], timeout=PATIENCE, check=False, capture_output=True)
+        self.assertEqual(done.returncode, 0, done.stderr)
+        self.assertEqual(ctl("sessions", "--json", state=copy).stdout, "[\n]\n")
+        self.assertEqual(len(self.listed("sessions")), 2)
+
+    def test_a_purge_is_for_administrators(self):
+        if os.geteuid() != 0:
+            self.skipTest("only root becomes somebody else")
+        self.daemon.configure('[access]\nusers = [65534]\n')
+        os.chmod(self.daemon.root, 0o755)
+        os.chmod(os.path.dirname(self.daemon.store_path), 0o755)
+        os.chmod(self.daemon.store_path, 0o644)
+        self.daemon.wait_for(lambda: self.ctl("send", "--category", "4", "--type", "1", input="",
+                                              **as_nobody()).returncode == 0)
+        done = self.ctl("purge", **as_nobody())
+        self.assertEqual(done.returncode, 4, done.stderr)
+
+    def test_a_sound_store_is_said_to_be_sound(self):
+        self.collect()
+        told = self.listed("check")
+        self.assertEqual((told["ok"], told["integrity"]), (True, []))
+        self.assertEqual(told["schema"], self.daemon.rows("PRAGMA user_version")[0][0])
+        self.assertEqual(told["rows"]["upload_session"], 2)
+        self.assertEqual(told["unclosed_sessions"], 1)
+        self.assertGreater(told["bytes"], 4096)
+        self.assertIn("is sound", self.ctl("check").stdout)
+        self.assertEqual(self.ctl("check", "--repair").returncode, 0)
+
+    def damage(self):
+        with open(self.daemon.store_path, "r+b") as file:
+            size = os.path.getsize(self.daemon.store_path)
+            file.seek(size // 2 // 8192 * 8192)
+            file.write(b"Z" * 8192 * 2)
+
+    def test_damage_is_told_and_repaired_without_the_daemon(self):
+        client = self.connect()
+        client.session(1)
+        for number in range(2000):
+            client.notify("sendMessage", {"n": number, "text": "x" * 300}, 4, 1, [1])
+        self.flush()
+        self.daemon.kill()
+        # The log is moved into the file, where it can be damaged.
+        store = sqlite3.connect(self.daemon.store_path)
+        store.execute("PRAGMA wal_checkpoint(TRUNCATE)")
+        store.close()
+        self.damage()
+        done = self.ctl("check", "--json")
+        self.assertEqual(done.returncode, 1)
+        told = json.loads(done.stdout)
+        self.assertFalse(told["ok"])
+        self.assertGreater(len(told["integrity"]), 0)
+        self.assertEqual(self.ctl("check").returncode, 1)
+
+        reader = sqlite3.connect(self.daemon.store_path)
+        reader.execute("SELECT count(*) FROM upload_session").fetchone()
+        refused = self.ctl("check", "--repair")
+        self.assertEqual((refused.returncode, refused.stdout), (1, ""))
+        self.assertIn(f"process {os.getpid()} has", refused.stderr)
+        reader.close()
+
+        done = self.ctl("check", "--repair", "--json")
+        self.assertEqual(done.returncode, 0, done.stderr)
+        told = json.loads(done.stdout)
+        self.assertTrue(told["ok"])
+        self.assertTrue(os.path.exists(os.path.join(os.path.dirname(self.daemon.store_path),
+                                                    told["set_aside"])))
+        self.assertGreater(told["rows"]["upload_message"], 1000)
+        self.assertEqual(self.listed("check")["ok"], True)
+
+
 class NotThere(unittest.TestCase):
     def setUp(self):
         self.daemon = Daemon()
@@ -406,7 +539,7 @@ class NotThere(unittest.TestCase):
 
     def test_without_a_store_there_is_none_to_read(self):
         for command in ("sessions", "messages", "glitches", "events", "energy", "incidents",
-                        "metrics", "watch"):
+                        "metrics", "watch", "check", "purge"):
             done = ctl(command, "--json", state=self.state)
             self.assertEqual((done.returncode, done.stdout), (3, ""))
 

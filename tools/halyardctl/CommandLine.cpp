@@ -62,6 +62,8 @@ private:
     // Commands about files.
     void addFiles();
     void addWatch();
+    // Commands about the store as a whole.
+    void addCare();
     // Commands that report.
     void addSenders();
     void takeRange(CLI::App* command);
@@ -72,6 +74,7 @@ private:
     std::string by_;
     std::string file_;
     std::string watched_ = "messages";
+    bool repair_ = false;
     SendOptions send_{};
     SessionOptions session_{};
     CLI::App app_{"How the sound of this device is doing, and what halyardd knows of it."};
@@ -88,6 +91,7 @@ CommandLine::CommandLine(Context& context) : context_(context) {
     addWatch();
     addSenders();
     addFiles();
+    addCare();
 }
 
 CLI::App* CommandLine::add(const char* name, const char* what, std::function<Exit()> run) {
@@ -162,6 +166,13 @@ void CommandLine::addFiles() {
     CLI::App* const trace = add("trace", "What a trace measured: the durations in a results file",
                                 [this] { return runTrace(context_, file_); });
     trace->add_option("FILE", file_, "tracing_results.pbj of a trace")->required();
+}
+
+void CommandLine::addCare() {
+    add("check", "Whether the store is sound", [this] { return runCheck(context_, repair_); })
+        ->add_flag("--repair", repair_,
+                   "Set a damaged store aside and save what can be read; without a daemon only");
+    add("purge", "Removes everything that was collected", [this] { return runPurge(context_); });
 }
 
 void CommandLine::addWatch() {

@@ -39,6 +39,8 @@ struct SessionOptions {
 };
 Exit runSession(Context& context, const SessionOptions& options);
 
+Exit runCheck(Context& context, bool repair);
+Exit runPurge(Context& context);
 Exit runTrace(Context& context, const std::string& file);
 
 } // namespace halyard::ctl

@@ -196,12 +196,16 @@ Trouble StoreReader::troubleOf(int code) const {
     const std::string text = said == nullptr ? sqlite3_errstr(code) : said;
     const int primary = code & 0xFF;
     if (primary == SQLITE_CORRUPT || primary == SQLITE_NOTADB) {
-        return {Exit::Failed,
-                isOutdated()
-                    ? fmt::format("{} changed while it was read: try again", path_.native())
-                    : fmt::format("{} is damaged ({}): \"halyardctl check\" says how badly, "
-                                  "\"check --repair\" saves what can be read",
-                                  path_.native(), text)};
+        if (isOutdated()) {
+            return {Exit::Failed,
+                    fmt::format("{} changed while it was read: try again", path_.native())};
+        }
+        Trouble damage(Exit::Failed,
+                       fmt::format("{} is damaged ({}): \"halyardctl check\" says how badly, "
+                                   "\"check --repair\" saves what can be read",
+                                   path_.native(), text));
+        damage.isDamage = true;
+        return damage;
     }
     if (primary == SQLITE_PERM || primary == SQLITE_AUTH) {
         return notAllowed(path_);

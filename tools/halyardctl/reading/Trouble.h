@@ -23,6 +23,7 @@ enum class Exit : int {
 struct Trouble : Failure {
     Trouble(Exit with, std::string why) : Failure{{}, std::move(why)}, exit(with) {}
     Exit exit;
+    bool isDamage = false; // of the store
 };
 
 template <class T> using Outcome = Result<T, Trouble>;
