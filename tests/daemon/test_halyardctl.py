@@ -516,6 +516,70 @@ class Caring(CtlTest):
         self.assertEqual(self.listed("check")["ok"], True)
 
 
+class Overview(CtlTest):
+    def test_five_lines_say_how_the_device_is_doing(self):
+        client = self.connect()
+        client.session(1, 7, "firefox")
+        now = time.time()
+        for number in range(3):
+            client.result("sendMessage", {
+                "glitch_start": now + number, "any_channel_silence_seconds": 0.5,
+                "rtaid_client": "firefox" if number else "vlc", "issue_type": "memory"}, 4, 7, [1])
+        self.flush()
+        told = self.listed()
+        self.assertEqual(
+            {key: told[key] for key in ("sessions", "open_sessions", "glitches", "silent_seconds",
+                                        "daemon_runs", "store_ok", "worst_application")},
+            {"sessions": 1, "open_sessions": 1, "glitches": 3, "silent_seconds": 1.5,
+             "daemon_runs": True, "store_ok": True,
+             "worst_application": {"name": "firefox", "glitches": 2, "seconds": 1.0}})
+        shown = self.ctl()
+        lines = shown.stdout.splitlines()
+        self.assertEqual(shown.returncode, 0)
+        self.assertEqual([line.split()[0] for line in lines[:6]],
+                         ["Today,", "Sessions", "Played", "Glitches", "Daemon", "Store"])
+        self.assertIn("3, 1.5 s without sound; worst is firefox with 2; mostly it waited for "
+                      "memory", lines[3])
+        self.assertIn("runs for", lines[4])
+        self.assertIn("sound, ", lines[5])
+        self.assertIn("halyardctl sessions", shown.stdout)
+
+    def test_it_says_what_is_not_there(self):
+        self.daemon.terminate()
+        shown = self.ctl()
+        self.assertEqual(shown.returncode, 0)
+        self.assertIn("does not run: start it with systemctl start halyardd.socket", shown.stdout)
+        os.remove(self.daemon.store_path)
+        shown = self.ctl()
+        self.assertEqual(shown.returncode, 3)
+        self.assertIn("no store at", shown.stdout)
+
+    def test_a_time_line_has_sessions_glitches_and_volumes(self):
+        client = self.connect()
+        self.play(client, 1, "one \u202e")
+        client.session(2, 7, "two")
+        client.result("sendMessage", {"glitch_start": 1500.5, "issue_type": "memory",
+                                      "glitch_evidence": {"major_faults": 2}}, 4, 7, [2])
+        self.flush()
+        path = self.daemon.path("line.json")
+        self.assertEqual(self.listed("timeline", "--output", path),
+                         {"sessions": 2, "glitches": 1, "volumes": 2})
+        with open(path, encoding="utf-8") as file:
+            events = json.load(file)["traceEvents"]
+        slices = [e for e in events if e["ph"] == "X"]
+        self.assertEqual([(e["name"], e["tid"]) for e in slices],
+                         [("longformaudio", 1), ("longformaudio", 2)])
+        self.assertEqual({e["args"]["name"] for e in events if e["name"] == "process_name"},
+                         {"one \u202e", "two"})
+        [glitch] = [e for e in events if e["ph"] == "i"]
+        self.assertEqual((glitch["name"], glitch["ts"], glitch["tid"], glitch["args"]["evidence"]),
+                         ("memory", 1500500000, 2, {"major_faults": 2}))
+        self.assertEqual([(e["ts"], e["args"]["volume"]) for e in events if e["ph"] == "C"],
+                         [(1000000000, 0.5), (1002000000, 0)])
+        self.assertEqual(self.ctl("timeline", "--output", "/nonexistent/x").returncode, 1)
+        self.assertEqual(self.ctl("timeline").returncode, 2)
+
+
 class NotThere(unittest.TestCase):
     def setUp(self):
         self.daemon = Daemon()

@@ -165,6 +165,14 @@ void CommandLine::addLists() {
 void CommandLine::addFiles() {
     CLI::App* const trace = add("trace", "What a trace measured: the durations in a results file",
                                 [this] { return runTrace(context_, file_); });
+    CLI::App* const timeline =
+        add("timeline", "Sessions, glitches and volumes as trace events, for viewers",
+            [this] { return runTimeline(context_, file_); });
+    timeline->add_option("--output", file_, "The file to write")
+        ->type_name("FILE.json")
+        ->required();
+    takeRange(timeline);
+    takeApplication(timeline);
     trace->add_option("FILE", file_, "tracing_results.pbj of a trace")->required();
 }
 
@@ -214,7 +222,7 @@ Exit CommandLine::run(int count, const char* const* words) {
         // Help and version come this way, too.
         return app_.exit(error) == 0 ? Exit::Done : Exit::WrongUse;
     }
-    return chosen_ ? chosen_() : Exit::WrongUse;
+    return chosen_ ? chosen_() : runOverview(context_);
 }
 
 } // namespace

@@ -12,6 +12,8 @@
 
 namespace halyard::ctl {
 
+// Of no command at all.
+Exit runOverview(Context& context);
 Exit runStatus(Context& context);
 Exit runSessions(Context& context);
 Exit runMessages(Context& context);
@@ -41,6 +43,8 @@ Exit runSession(Context& context, const SessionOptions& options);
 
 Exit runCheck(Context& context, bool repair);
 Exit runPurge(Context& context);
+// Into `file`.
+Exit runTimeline(Context& context, const std::string& file);
 Exit runTrace(Context& context, const std::string& file);
 
 } // namespace halyard::ctl

@@ -9,6 +9,9 @@
 namespace halyard::ctl {
 namespace {
 
+// It answers within a second, unless it hangs.
+constexpr std::chrono::seconds kPatience{20};
+
 using Align = Table::Column::Align;
 
 // A line for each entry, those of a dictionary inside under its name.
@@ -32,7 +35,7 @@ Exit runStatus(Context& context) {
     if (!socket.ok()) {
         return fail(socket.failure());
     }
-    auto daemon = DaemonClient::connect(socket.value());
+    auto daemon = DaemonClient::connect(socket.value(), kPatience);
     if (!daemon.ok()) {
         return fail(daemon.failure());
     }

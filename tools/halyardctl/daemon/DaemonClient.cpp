@@ -5,6 +5,7 @@
 #include <cstring>
 #include <fmt/format.h>
 #include <sys/socket.h>
+#include <sys/time.h>
 #include <sys/un.h>
 #include <unistd.h>
 #include <utility>
@@ -55,7 +56,8 @@ DaemonClient::~DaemonClient() {
     }
 }
 
-Outcome<DaemonClient> DaemonClient::connect(const std::filesystem::path& socket) {
+Outcome<DaemonClient> DaemonClient::connect(const std::filesystem::path& socket,
+                                            std::chrono::seconds patience) {
     sockaddr_un address{};
     address.sun_family = AF_UNIX;
     if (socket.native().size() >= sizeof address.sun_path) {
@@ -68,6 +70,8 @@ Outcome<DaemonClient> DaemonClient::connect(const std::filesystem::path& socket)
     if (client.descriptor_ < 0 || ::connect(client.descriptor_, any, sizeof address) != 0) {
         return troubleOfConnect(socket, errno);
     }
+    const timeval limit{patience.count(), 0};
+    (void)::setsockopt(client.descriptor_, SOL_SOCKET, SO_RCVTIMEO, &limit, sizeof limit);
     return client;
 }
 
@@ -101,6 +105,11 @@ Outcome<Answer> DaemonClient::receive() {
         const ssize_t count = ::recv(descriptor_, buffer.data(), buffer.size(), 0);
         if (count < 0 && errno == EINTR) {
             continue;
+        }
+        if (count < 0 && errno == EAGAIN) {
+            lost_ = true;
+            return Trouble(Exit::Failed,
+                           fmt::format("the daemon at {} does not answer", socket_.native()));
         }
         if (count <= 0) {
             return lost();

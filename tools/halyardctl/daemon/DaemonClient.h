@@ -6,6 +6,7 @@
 // Blocking; not thread-safe.
 #pragma once
 
+#include <chrono>
 #include <cstdint>
 #include <filesystem>
 #include <optional>
@@ -19,13 +20,15 @@ namespace halyard::ctl {
 
 class DaemonClient {
 public:
-    static reading::Outcome<DaemonClient> connect(const std::filesystem::path& socket);
+    // An answer may take `patience`, if that is not 0.
+    static reading::Outcome<DaemonClient> connect(const std::filesystem::path& socket,
+                                                  std::chrono::seconds patience = {});
     ~DaemonClient();
     DaemonClient(DaemonClient&& other) noexcept;
     DaemonClient(const DaemonClient&) = delete;
     DaemonClient& operator=(const DaemonClient&) = delete;
 
-    // Waits for the answer, however long it takes.
+    // Waits for the answer.
     reading::Outcome<Value> call(protocol::Method method,
                                  const protocol::Arguments& arguments = {});
     // Sends a request whose answer nobody waits for; it is passed over when it comes.

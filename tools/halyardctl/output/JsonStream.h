@@ -30,7 +30,9 @@ public:
     void beginElement();
     // A document of its own, a line each.
     void beginDocument() { writer_.Reset(bytes_); }
-    void endDocument() { bytes_.Put('\n'); }
+    void endDocument() { endLine(); }
+    // Between two things, where it means nothing.
+    void endLine() { bytes_.Put('\n'); }
 
     void beginObject() { writer_.StartObject(); }
     void endObject() { writer_.EndObject(); }

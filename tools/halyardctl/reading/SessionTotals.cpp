@@ -24,8 +24,8 @@ std::string columns() {
 
 } // namespace
 
-SessionTotals::SessionTotals(std::vector<Session>& sessions)
-    : sessions_(sessions), running_(sessions.size()) {}
+SessionTotals::SessionTotals(std::vector<Session>& sessions, const TimeRange& range)
+    : sessions_(sessions), range_(range), running_(sessions.size()) {}
 
 Outcome<void> SessionTotals::read(StoreReader& reader, StoreReader::Ids ids) {
     if (sessions_.empty()) {
@@ -89,7 +89,7 @@ void SessionTotals::takePlayingState(Session& session, Running& running, double 
     if (*state != 0) {
         running.playingSince = running.playingSince.value_or(time);
     } else if (running.playingSince) {
-        session.playedSeconds += std::max(0.0, time - *running.playingSince);
+        addStretch(session, *running.playingSince, time);
         running.playingSince.reset();
     }
 }
@@ -102,6 +102,12 @@ void SessionTotals::takeGlitch(Session& session, Running& running, std::optional
     }
 }
 
+void SessionTotals::addStretch(Session& session, double from, double to) const {
+    session.playedSeconds += std::max(0.0, to - from);
+    session.playedInRange +=
+        std::max(0.0, std::min(to, range_.until) - std::max(from, range_.since));
+}
+
 void SessionTotals::finish(std::optional<double> now) {
     for (std::size_t i = 0; i < sessions_.size(); ++i) {
         Session& session = sessions_[i];
@@ -111,7 +117,7 @@ void SessionTotals::finish(std::optional<double> now) {
         }
         if (running.playingSince) {
             const double end = session.closed ? *session.closed : now.value_or(session.lastHeard);
-            session.playedSeconds += std::max(0.0, end - *running.playingSince);
+            addStretch(session, *running.playingSince, end);
         }
     }
 }

@@ -18,7 +18,7 @@ namespace halyard::reading {
 class SessionTotals {
 public:
     // Borrows the sessions, which stand by rising ids.
-    explicit SessionTotals(std::vector<Session>& sessions);
+    SessionTotals(std::vector<Session>& sessions, const TimeRange& range);
 
     Outcome<void> read(StoreReader& reader, StoreReader::Ids ids);
     // Ends what has not ended: with the session; at `now` when it still runs; else with
@@ -39,7 +39,10 @@ private:
     static void takeGlitch(Session& session, Running& running, std::optional<double> start);
     void takeDevices(Session& session) const;
 
+    void addStretch(Session& session, double from, double to) const;
+
     std::vector<Session>& sessions_;
+    const TimeRange range_;
     std::vector<Running> running_;
     JsonFields fields_;
 };

@@ -48,7 +48,8 @@ std::string conditionOf(const TimeRange& range) {
 // Sessions that wait for the pass over their messages.
 class Group {
 public:
-    Group(StoreReader& reader, double now) : reader_(reader), now_(now) {}
+    Group(StoreReader& reader, const TimeRange& range, double now)
+        : reader_(reader), range_(range), now_(now) {}
 
     void add(SessionRow&& row) {
         Session session;
@@ -65,7 +66,7 @@ public:
         if (!ids.ok()) {
             return ids.failure();
         }
-        SessionTotals totals(sessions_);
+        SessionTotals totals(sessions_, range_);
         const auto read = totals.read(reader_, ids.value());
         if (!read.ok()) {
             return read;
@@ -92,6 +93,7 @@ private:
     }
 
     StoreReader& reader_;
+    const TimeRange range_;
     const double now_;
     std::vector<Session> sessions_;
 };
@@ -138,7 +140,7 @@ Outcome<void> forEachSession(StoreReader& reader, const TimeRange& range, double
                              const std::function<bool(const Session&)>& take) {
     const bool hasEnded = reader.hasColumn("upload_session", "ended");
     JsonFields fields;
-    Group group(reader, now);
+    Group group(reader, range, now);
     bool more = true;
     Outcome<void> told;
     const auto read =

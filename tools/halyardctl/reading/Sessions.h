@@ -50,6 +50,7 @@ struct Session : SessionRow {
     std::uint64_t messages = 0;
     std::uint64_t glitches = 0;
     double playedSeconds = 0;
+    double playedInRange = 0;         // of that, within the range that was asked for
     std::vector<std::string> devices; // in the order of their first use
     double lastHeard = 0;             // the time of its last message
 };

@@ -11,7 +11,6 @@
 #include "linux/store/Schema.h"
 #include "linux/store/StoreDatabase.h"
 #include "linux/store/StoreSalvage.h"
-#include "reading/StoreReader.h"
 
 namespace halyard::reading {
 namespace {
@@ -158,6 +157,12 @@ Outcome<StoreCheck> checkStore(const fs::path& path, const std::function<void(do
     check.unclosedSessions = count(reader, "upload_session WHERE closed IS NULL", check.integrity);
     check.ok = check.integrity.empty();
     return check;
+}
+
+bool isSound(StoreReader& reader) {
+    StoreStatement quick;
+    return quick.prepare(reader.handle(), "PRAGMA quick_check(1)") == SQLITE_OK &&
+           quick.step() == SQLITE_ROW && quick.text(0) == "ok";
 }
 
 Outcome<StoreRepair> repairStore(const fs::path& path) {

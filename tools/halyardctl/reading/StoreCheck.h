@@ -11,6 +11,7 @@
 #include <utility>
 #include <vector>
 
+#include "reading/StoreReader.h"
 #include "reading/Trouble.h"
 
 namespace halyard::reading {
@@ -29,6 +30,9 @@ struct StoreCheck {
 // looked at is trouble.
 Outcome<StoreCheck> checkStore(const std::filesystem::path& path,
                                const std::function<void(double)>& progress);
+
+// SQLite's quick look at every page.
+bool isSound(StoreReader& reader);
 
 struct StoreRepair {
     std::filesystem::path aside;
