@@ -11,15 +11,6 @@ namespace halyard::pipewire {
 namespace {
 
 constexpr Nanoseconds kMinute = 60'000'000'000;
-constexpr Nanoseconds kTickTime = 50'000'000;
-// Long enough for a dozen cycles of the longest usual length, and for the others to
-// be told apart.
-constexpr Nanoseconds kSearch = 400'000'000;
-constexpr int kMaxTries = 8;
-
-bool isStopped(const ThreadSample& sample) {
-    return sample.state == 'T' || sample.state == 't';
-}
 
 } // namespace
 
@@ -33,7 +24,7 @@ GlitchWatch::~GlitchWatch() = default;
 
 // ---- Streams
 
-std::shared_ptr<GlitchWatch::Program> GlitchWatch::programOf(const StreamRun& run) {
+std::shared_ptr<WatchedProgram> GlitchWatch::programOf(const StreamRun& run) {
     if (!run.process) {
         return nullptr;
     }
@@ -46,8 +37,8 @@ std::shared_ptr<GlitchWatch::Program> GlitchWatch::programOf(const StreamRun& ru
         ++unwatched_;
         return nullptr;
     }
-    auto program =
-        std::make_shared<Program>(ProcessReader(static_cast<pid_t>(*run.process), options_.places));
+    auto program = std::make_shared<WatchedProgram>(
+        ProcessReader(static_cast<pid_t>(*run.process), options_.places));
     programs_[*run.process] = program;
     return program;
 }
@@ -64,7 +55,7 @@ void GlitchWatch::runs(const StreamRun& run) {
         stream.program = programOf(run);
     }
     if (!ranBefore && stream.program) {
-        ++stream.program->streams;
+        stream.program->streamRuns();
     }
 }
 
@@ -81,7 +72,7 @@ void GlitchWatch::stopped(StreamKey key) {
         return;
     }
     if (found->second.program) {
-        --found->second.program->streams;
+        found->second.program->streamStopped();
     }
     found->second.stoppedSince.reset();
     finder_.end(key, options_.clock());
@@ -105,7 +96,7 @@ StreamEnd GlitchWatch::closing(StreamKey key) {
     stopped(key);
     StreamEnd end{.unreported = found->second.unreported};
     if (found->second.program) {
-        const auto ending = found->second.program->reader.ending();
+        const auto ending = found->second.program->ending();
         end.program = !ending.gone ? "lives" : ending.died() ? "died" : "ended";
     }
     leaving_.erase(key);
@@ -135,8 +126,8 @@ void GlitchWatch::sample(Nanoseconds now) {
     machine_.add(machineReader_.sample(now));
     for (auto& [id, weak] : programs_) {
         const auto program = weak.lock();
-        if (program && program->streams > 0) {
-            program->history.add(program->reader.sample(now));
+        if (program && program->runs()) {
+            program->sample(now);
         }
     }
     for (auto& [key, stream] : streams_) {
@@ -144,38 +135,21 @@ void GlitchWatch::sample(Nanoseconds now) {
             continue;
         }
         if (stream.program && !stream.run.viaServer) {
-            seek(*stream.program, stream, now);
+            stream.program->seek(now, finder_.cycleLength(key));
         }
         if (stream.run.viaServer) {
             inferStop(key, stream, now);
         }
         if (const Episode* const episode = finder_.episode(key)) {
-            fold(stream, episode->end);
+            stream.inquiry->fold(episode->end);
         }
-    }
-}
-
-// The thread of a program that just started to play is found by watching its threads
-// for a while.
-void GlitchWatch::seek(Program& program, Stream& stream, Nanoseconds now) {
-    const Nanoseconds length = finder_.cycleLength(stream.run.key);
-    if (program.reader.threadKnown() || program.tries >= kMaxTries || length == 0) {
-        return;
-    }
-    if (program.searchedSince == 0) {
-        program.reader.findThread(0);
-        program.searchedSince = now;
-    } else if (now - program.searchedSince >= std::max(kSearch, 4 * length)) {
-        const auto wakeUps = static_cast<std::uint64_t>((now - program.searchedSince) / length);
-        ++program.tries;
-        program.reader.findThread(wakeUps);
     }
 }
 
 // The server plays on without a program that is stopped: what it had in its buffer,
 // and then silence.
 void GlitchWatch::inferStop(StreamKey key, Stream& stream, Nanoseconds now) {
-    const ThreadSample* const last = stream.program ? stream.program->history.latest() : nullptr;
+    const ThreadSample* const last = stream.program ? stream.program->history().latest() : nullptr;
     if (last == nullptr || !stream.run.bufferSeconds || (!isStopped(*last) && !last->frozen)) {
         stream.stoppedSince.reset();
         return;
@@ -214,7 +188,7 @@ void GlitchWatch::settle(Nanoseconds now) {
 // the server ever so quick to take its node away.
 void GlitchWatch::conclude(StreamKey key, Stream& stream, Nanoseconds since) {
     const Nanoseconds length = finder_.cycleLength(key);
-    if (stream.program && length > 0 && stream.program->reader.ending().died()) {
+    if (stream.program && length > 0 && stream.program->ending().died()) {
         finder_.end(key, since, true);
         if (finder_.episode(key) == nullptr) {
             finder_.infer(key, since, length);
@@ -226,51 +200,10 @@ void GlitchWatch::conclude(StreamKey key, Stream& stream, Nanoseconds since) {
 
 void GlitchWatch::open(const Episode& episode) {
     const auto found = streams_.find(episode.stream);
-    if (found == streams_.end()) {
-        return;
+    if (found != streams_.end()) {
+        Stream& stream = found->second;
+        stream.inquiry.emplace(episode.start, stream.program, stream.run.viaServer, machine_);
     }
-    Stream& stream = found->second;
-    Gathered& gathered = stream.gathered.emplace();
-    gathered.foldedUntil = episode.start;
-    if (const auto* const machine = machine_.before(episode.start)) {
-        gathered.machine = *machine;
-    }
-    if (!stream.program) {
-        return;
-    }
-    if (const auto* const before = stream.program->history.before(episode.start)) {
-        gathered.before = *before;
-        gathered.usual = usualRates(stream.program->history, before->at);
-    }
-}
-
-// Before the samples of a long episode are gone.
-void GlitchWatch::fold(Stream& stream, Nanoseconds until) {
-    if (!stream.gathered || until <= stream.gathered->foldedUntil) {
-        return;
-    }
-    Gathered& gathered = *stream.gathered;
-    if (stream.program) {
-        stream.program->history.each(gathered.foldedUntil, until, [&](const ThreadSample& sample) {
-            gathered.stopped = gathered.stopped || isStopped(sample);
-            gathered.frozen = gathered.frozen || sample.frozen;
-            if (gathered.state == 0 || isStopped(sample)) {
-                gathered.state = sample.state;
-            }
-        });
-    }
-    const MachineSample* last = nullptr;
-    machine_.each(gathered.foldedUntil - 2 * kTickTime, until + 2 * kTickTime,
-                  [&](const MachineSample& sample) {
-                      if (last != nullptr) {
-                          const Nanoseconds waited =
-                              growth(last->ownDelay, sample.ownDelay).value_or(0);
-                          gathered.stoodStill = std::max(gathered.stoodStill,
-                                                         sample.at - last->at - kTickTime - waited);
-                      }
-                      last = &sample;
-                  });
-    gathered.foldedUntil = until;
 }
 
 std::optional<double> GlitchWatch::othersCpu(const Episode& episode, const Stream& stream) const {
@@ -280,9 +213,9 @@ std::optional<double> GlitchWatch::othersCpu(const Episode& episode, const Strea
             continue;
         }
         const auto* const before =
-            other.program ? other.program->history.before(episode.start) : nullptr;
+            other.program ? other.program->history().before(episode.start) : nullptr;
         const auto* const after =
-            other.program ? other.program->history.after(episode.end) : nullptr;
+            other.program ? other.program->history().after(episode.end) : nullptr;
         const auto ran = before != nullptr ? growth(before->cpu, after->cpu) : std::nullopt;
         if (!ran) {
             return std::nullopt;
@@ -293,61 +226,11 @@ std::optional<double> GlitchWatch::othersCpu(const Episode& episode, const Strea
 }
 
 CauseFacts GlitchWatch::factsOf(const Episode& episode, const Stream& stream) const {
-    CauseFacts facts;
-    facts.cycleSeconds = seconds(episode.cycleLength);
-    facts.missingSeconds = seconds(episode.missing);
-    facts.heldSeconds = seconds(episode.held);
-    facts.lateShare = episode.cycles != 0 ? static_cast<double>(episode.lateCycles) /
-                                                static_cast<double>(episode.cycles)
-                                          : 0;
-    facts.latenessSeconds = seconds(episode.lateness);
-    facts.woke = episode.woke;
-    facts.ownCycles = episode.busyCycles;
-    facts.othersCycles = episode.othersCycles;
-    facts.largestOther = episode.largestOther;
-    facts.gone = stream.program && stream.program->reader.ending().died();
-    if (!stream.gathered) {
-        return facts;
-    }
-    const Gathered& gathered = *stream.gathered;
-    facts.stopped = gathered.stopped;
-    facts.frozen = gathered.frozen;
-    facts.stoodStillSeconds = seconds(gathered.stoodStill);
-    if (const auto* const after = machine_.after(episode.end); after && gathered.machine) {
-        facts.asleepSeconds = seconds(after->asleep - gathered.machine->asleep);
-    }
-    const Nanoseconds end = episode.end + episode.cycleLength;
-    const auto* const after = stream.program ? stream.program->history.after(end) : nullptr;
-    // The figures of a program behind a server say nothing of the server's work.
-    if (after != nullptr && gathered.before && !stream.run.viaServer) {
-        facts.thread = excessOf(gathered.usual, *gathered.before, *after);
+    CauseFacts facts = stream.inquiry->factsOf(episode);
+    if (facts.thread.cpu) {
         facts.othersCpuSeconds = othersCpu(episode, stream);
     }
     return facts;
-}
-
-Contents GlitchWatch::evidenceOf(const Episode& episode, const Stream& stream) const {
-    GlitchEvidence evidence;
-    evidence.busyCycles = episode.busyCycles;
-    evidence.driverLateSeconds = seconds(episode.lateness);
-    evidence.waitedForOthers = episode.waitedForOthers;
-    if (stream.gathered) {
-        evidence.state = stream.gathered->state;
-        evidence.machineBefore = stream.gathered->machine;
-        evidence.threadBefore = stream.gathered->before;
-    }
-    if (const auto* const after = machine_.after(episode.end)) {
-        evidence.machineAfter = *after;
-    }
-    if (const auto* const after =
-            stream.program ? stream.program->history.after(episode.end + episode.cycleLength)
-                           : nullptr) {
-        evidence.threadAfter = *after;
-    }
-    if (options_.busiest) {
-        evidence.busiest = options_.busiest();
-    }
-    return contentsOf(evidence);
 }
 
 // One place is kept for the end of an episode that is told before its end.
@@ -365,28 +248,32 @@ bool GlitchWatch::allowed(Stream& stream, bool over) {
 
 void GlitchWatch::tell(const Episode& episode, bool over) {
     const auto found = streams_.find(episode.stream);
-    if (found == streams_.end()) {
+    if (found == streams_.end() || !found->second.inquiry) {
         return;
     }
     Stream& stream = found->second;
-    fold(stream, episode.end);
+    stream.inquiry->fold(episode.end);
     const CauseFacts facts = factsOf(episode, stream);
     const GlitchCause cause = causeOf(facts);
     note(stream, episode, facts, cause);
     if (allowed(stream, over)) {
-        GlitchMessage message{.cause = cause,
-                              .application = stream.run.application,
-                              .node = stream.run.nodeName,
-                              .device = stream.run.device,
-                              .evidence = evidenceOf(episode, stream),
-                              .unreported = std::exchange(stream.unreported, 0)};
+        GlitchEvidence evidence = stream.inquiry->evidenceOf(episode);
+        if (options_.busiest) {
+            evidence.busiest = options_.busiest();
+        }
+        const GlitchMessage message{.cause = cause,
+                                    .application = stream.run.application,
+                                    .node = stream.run.nodeName,
+                                    .device = stream.run.device,
+                                    .evidence = contentsOf(evidence),
+                                    .unreported = std::exchange(stream.unreported, 0)};
         sink_.send(episode.stream,
                    messageOf(episode, message, stream.run.direction, realTimeOffset()));
     } else if (over) {
         ++stream.unreported;
     }
     if (over) {
-        stream.gathered.reset();
+        stream.inquiry.reset();
     }
 }
 

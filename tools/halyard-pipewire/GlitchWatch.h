@@ -18,10 +18,12 @@
 
 #include "GlitchCause.h"
 #include "GlitchFinder.h"
+#include "GlitchInquiry.h"
 #include "MachineReader.h"
 #include "ProcessReader.h"
 #include "SessionSink.h"
 #include "StreamObserver.h"
+#include "WatchedProgram.h"
 
 namespace halyard::pipewire {
 
@@ -64,49 +66,26 @@ public:
     std::uint64_t unwatched() const { return unwatched_ + finder_.ignoredStreams(); }
 
 private:
-    // A process, and its thread in the graph; shared by its streams.
-    struct Program {
-        explicit Program(ProcessReader from) : reader(std::move(from)) {}
-        ProcessReader reader;
-        History<ThreadSample> history;
-        int streams = 0; // that run
-        int tries = 0;
-        Nanoseconds searchedSince = 0;
-    };
-    // What was gathered for an open episode.
-    struct Gathered {
-        std::optional<ThreadSample> before;
-        std::optional<MachineSample> machine;
-        UsualRates usual;
-        Nanoseconds foldedUntil = 0;
-        bool stopped = false;
-        bool frozen = false;
-        char state = 0;
-        Nanoseconds stoodStill = 0;
-    };
     struct Stream {
         StreamRun run;
-        std::shared_ptr<Program> program;
+        std::shared_ptr<WatchedProgram> program;
         bool running = false;
         std::deque<Nanoseconds> told;
         std::uint64_t unreported = 0;
-        std::optional<Gathered> gathered;
+        std::optional<GlitchInquiry> inquiry;    // into the open episode
         std::optional<Nanoseconds> stoppedSince; // a program behind a server
         Nanoseconds inferredUntil = 0;
     };
 
-    std::shared_ptr<Program> programOf(const StreamRun& run);
+    std::shared_ptr<WatchedProgram> programOf(const StreamRun& run);
     void sample(Nanoseconds now);
-    void seek(Program& program, Stream& stream, Nanoseconds now);
     void inferStop(StreamKey key, Stream& stream, Nanoseconds now);
     void conclude(StreamKey key, Stream& stream, Nanoseconds now);
     void settle(Nanoseconds now);
     void open(const Episode& episode);
-    void fold(Stream& stream, Nanoseconds until);
     void tell(const Episode& episode, bool over);
     CauseFacts factsOf(const Episode& episode, const Stream& stream) const;
     std::optional<double> othersCpu(const Episode& episode, const Stream& stream) const;
-    Contents evidenceOf(const Episode& episode, const Stream& stream) const;
     bool allowed(Stream& stream, bool over);
     void note(const Stream& stream, const Episode& episode, const CauseFacts& facts,
               GlitchCause cause) const;
@@ -117,7 +96,7 @@ private:
     MachineReader machineReader_;
     History<MachineSample> machine_;
     std::map<StreamKey, Stream> streams_;
-    std::map<std::int64_t, std::weak_ptr<Program>> programs_;
+    std::map<std::int64_t, std::weak_ptr<WatchedProgram>> programs_;
     std::map<StreamKey, Nanoseconds> leaving_; // gone, and since when
     std::uint64_t unwatched_ = 0;
 };

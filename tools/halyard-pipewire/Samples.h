@@ -33,6 +33,11 @@ struct MachineSample {
     std::optional<Nanoseconds> ownDelay = std::nullopt;
 };
 
+// By a signal or a debugger.
+inline bool isStopped(const ThreadSample& sample) {
+    return sample.state == 'T' || sample.state == 't';
+}
+
 // How much a total grew; nothing when either is unknown, or it began anew.
 template <class Number>
 std::optional<Number> growth(const std::optional<Number>& from, const std::optional<Number>& to) {
