@@ -91,4 +91,19 @@ void BoundNode::updateVolume(const spa_pod* props) {
     listener_(NodeVolumeChanged{id_, linearVolume_, muted_});
 }
 
+// ---- The profiler
+
+const pw_profiler_events BoundProfiler::kEvents = {.version = PW_VERSION_PROFILER_EVENTS,
+                                                   .profile = onProfile};
+
+BoundProfiler::BoundProfiler(ObjectId id, pw_proxy* proxy, const GraphListener& listener,
+                             const CycleListener& cycles)
+    : BoundObject(id, proxy, listener), cycles_(cycles) {
+    pw_proxy_add_object_listener(proxy_, &hook_, &kEvents, this);
+}
+
+void BoundProfiler::onProfile(void* data, const spa_pod* portion) {
+    readProfile(portion, raw::sizeOf(portion), static_cast<BoundProfiler*>(data)->cycles_);
+}
+
 } // namespace halyard::pipewire

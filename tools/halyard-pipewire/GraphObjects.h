@@ -6,6 +6,7 @@
 
 #include "GraphEvents.h"
 #include "PipeWireHeaders.h"
+#include "ProfileReader.h"
 
 namespace halyard::pipewire {
 
@@ -50,6 +51,21 @@ private:
     std::uint32_t formatFlags_ = 0;
     float linearVolume_ = 1;
     bool muted_ = false;
+};
+
+// What the daemon tells of each cycle of each driver. Requires that the module of the
+// profiler is loaded on this side.
+class BoundProfiler final : public BoundObject {
+public:
+    // Borrows `cycles` as well.
+    BoundProfiler(ObjectId id, pw_proxy* proxy, const GraphListener& listener,
+                  const CycleListener& cycles);
+
+private:
+    static void onProfile(void* data, const spa_pod* portion);
+    static const pw_profiler_events kEvents;
+
+    const CycleListener& cycles_;
 };
 
 } // namespace halyard::pipewire

@@ -57,15 +57,14 @@ public:
 private:
     void connect();
     void disconnect();
-    void bindProfiler(ObjectId id, std::uint32_t version);
-    void forgetProfiler();
     void lost(const char* reason);
     void established();
     void retryLater();
     void setTimer(spa_source* timer, std::chrono::nanoseconds delay);
     void tell(const GraphEvent& event);
     void note(const std::string& text) const;
-    template <class Object> void bind(ObjectId id, const char* type, std::uint32_t version);
+    template <class Object, class... More>
+    void bind(ObjectId id, const char* type, std::uint32_t version, const More&... more);
 
     static void onGlobal(void* data, ObjectId id, std::uint32_t permissions, const char* type,
                          std::uint32_t version, const spa_dict* properties);
@@ -75,13 +74,11 @@ private:
     static void onSettled(void* data, std::uint64_t expirations);
     static void onRetry(void* data, std::uint64_t expirations);
     static void onTick(void* data, std::uint64_t expirations);
-    static void onProfile(void* data, const spa_pod* portion);
     static void onPosted(void* data, std::uint64_t count);
     static void onSignal(void* data, int signal);
 
     static const pw_registry_events kRegistryEvents;
     static const pw_core_events kCoreEvents;
-    static const pw_profiler_events kProfilerEvents;
 
     const Options options_;
     const GraphListener outside_;
@@ -98,8 +95,6 @@ private:
     spa_source* postedEvent_ = nullptr;
     spa_source* tickTimer_ = nullptr;
     std::function<void()> tick_;
-    pw_proxy* profiler_ = nullptr;
-    spa_hook profilerHook_{};
     std::map<ObjectId, std::unique_ptr<BoundObject>> objects_;
 
     std::optional<Clock::time_point> burstBegan_;
@@ -124,9 +119,6 @@ const pw_core_events PipeWireAdapter::Impl::kCoreEvents = {.version = PW_VERSION
                                                            .bound_id = nullptr,
                                                            .add_mem = nullptr,
                                                            .remove_mem = nullptr};
-
-const pw_profiler_events PipeWireAdapter::Impl::kProfilerEvents = {
-    .version = PW_VERSION_PROFILER_EVENTS, .profile = onProfile};
 
 PipeWireAdapter::Impl::Impl(Options options, GraphListener listener)
     : options_(std::move(options)), outside_(std::move(listener)),
@@ -240,7 +232,6 @@ void PipeWireAdapter::Impl::connect() {
 
 void PipeWireAdapter::Impl::disconnect() {
     objects_.clear();
-    forgetProfiler();
     burstBegan_.reset();
     if (core_ == nullptr) {
         return;
@@ -293,36 +284,13 @@ void PipeWireAdapter::Impl::onCoreError(void* data, std::uint32_t id, int, int r
 
 // ---- The graph
 
-template <class Object>
-void PipeWireAdapter::Impl::bind(ObjectId id, const char* type, std::uint32_t version) {
+template <class Object, class... More>
+void PipeWireAdapter::Impl::bind(ObjectId id, const char* type, std::uint32_t version,
+                                 const More&... more) {
     auto* const proxy = static_cast<pw_proxy*>(pw_registry_bind(registry_, id, type, version, 0));
     if (proxy != nullptr) {
-        objects_[id] = std::make_unique<Object>(id, proxy, listener_);
+        objects_[id] = std::make_unique<Object>(id, proxy, listener_, more...);
     }
-}
-
-void PipeWireAdapter::Impl::bindProfiler(ObjectId id, std::uint32_t version) {
-    if (!options_.cycle || profiler_ != nullptr) {
-        return;
-    }
-    profiler_ = static_cast<pw_proxy*>(
-        pw_registry_bind(registry_, id, PW_TYPE_INTERFACE_Profiler,
-                         std::min<std::uint32_t>(version, PW_VERSION_PROFILER), 0));
-    if (profiler_ != nullptr) {
-        raw::listen(profiler_, &profilerHook_, &kProfilerEvents, this);
-    }
-}
-
-void PipeWireAdapter::Impl::forgetProfiler() {
-    if (profiler_ != nullptr) {
-        spa_hook_remove(&profilerHook_);
-        pw_proxy_destroy(std::exchange(profiler_, nullptr));
-    }
-}
-
-void PipeWireAdapter::Impl::onProfile(void* data, const spa_pod* portion) {
-    const auto& self = *static_cast<Impl*>(data);
-    readProfile(portion, raw::sizeOf(portion), self.options_.cycle);
 }
 
 void PipeWireAdapter::Impl::onGlobal(void* data, ObjectId id, std::uint32_t, const char* type,
@@ -334,8 +302,9 @@ void PipeWireAdapter::Impl::onGlobal(void* data, ObjectId id, std::uint32_t, con
         self.bind<BoundNode>(id, type, PW_VERSION_NODE);
     } else if (kind == PW_TYPE_INTERFACE_Client) {
         self.bind<BoundClient>(id, type, PW_VERSION_CLIENT);
-    } else if (kind == PW_TYPE_INTERFACE_Profiler) {
-        self.bindProfiler(id, version);
+    } else if (kind == PW_TYPE_INTERFACE_Profiler && self.options_.cycle) {
+        self.bind<BoundProfiler>(id, type, std::min<std::uint32_t>(version, PW_VERSION_PROFILER),
+                                 self.options_.cycle);
     } else if (kind == PW_TYPE_INTERFACE_Link) {
         const auto from = objectId(properties, PW_KEY_LINK_OUTPUT_NODE);
         const auto to = objectId(properties, PW_KEY_LINK_INPUT_NODE);

@@ -32,10 +32,6 @@ inline void listen(pw_registry* registry, spa_hook* hook, const pw_registry_even
 inline void enumerateParams(pw_proxy* node, std::uint32_t id) {
     pw_node_enum_params(reinterpret_cast<pw_node*>(node), 0, id, 0, UINT32_MAX, nullptr);
 }
-inline void listen(pw_proxy* profiler, spa_hook* hook, const pw_profiler_events* events,
-                   void* data) {
-    pw_proxy_add_object_listener(profiler, hook, events, data);
-}
 inline pw_impl_module* loadModule(pw_context* context, const char* name) {
     return pw_context_load_module(context, name, nullptr, nullptr);
 }
