@@ -320,17 +320,23 @@ bool GlitchFinder::isOver(const Stream& stream, Nanoseconds now) const {
 // The last cycle or two of a stream that is being stopped.
 bool GlitchFinder::isEnding(const Stream& stream) {
     const Episode& episode = *stream.episode;
+    const Nanoseconds ending = std::max(kEnding, 2 * episode.cycleLength);
     return stream.until && !stream.broken && !episode.inferred &&
-           episode.end > *stream.until - kEnding && episode.end - episode.start <= kEnding;
+           episode.end > *stream.until - ending && episode.end - episode.start <= ending;
 }
 
 // What still holds it up has done so until the last missed cycle's end, at least.
-void GlitchFinder::close(Stream& stream) {
+Episode GlitchFinder::soFar(const Stream& stream) {
+    Episode episode = *stream.episode;
     if (stream.stall) {
-        stream.episode->held += std::max<Nanoseconds>(0, stream.episode->end - stream.stall->begin);
-        stream.stall.reset();
+        episode.held += std::max<Nanoseconds>(0, episode.end - stream.stall->begin);
     }
-    const Episode episode = *stream.episode;
+    return episode;
+}
+
+void GlitchFinder::close(Stream& stream) {
+    const Episode episode = soFar(stream);
+    stream.stall.reset();
     const bool ending = isEnding(stream);
     stream.episode.reset();
     if (!ending && tell) {
@@ -348,7 +354,7 @@ void GlitchFinder::due(Nanoseconds now) {
         } else if (!stream.told && stream.episode->end - stream.episode->start >= kLong) {
             stream.told = true;
             if (tell) {
-                tell(*stream.episode, false);
+                tell(soFar(stream), false);
             }
         }
     }

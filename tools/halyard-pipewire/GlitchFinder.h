@@ -56,7 +56,7 @@ public:
     static constexpr Nanoseconds kPatience = 1'700'000'000;
     // An episode that lasts longer is told with what is known.
     static constexpr Nanoseconds kLong = 10'000'000'000;
-    // Missed cycles this close to the end of a run belong to it.
+    // Missed cycles this close to the end of a run, or two at the most, belong to it.
     static constexpr Nanoseconds kEnding = 100'000'000;
 
     // The stream of this node runs from `now` on. False when there are too many.
@@ -77,6 +77,8 @@ public:
     bool waiting(Nanoseconds now) const;
     // The one that is open. Null when none is.
     const Episode* episode(StreamKey stream) const;
+    // What is missed less than this after its end belongs to it.
+    static Nanoseconds gapOf(const Episode& episode);
     // Of the stream's last cycle; 0 before the first.
     Nanoseconds cycleLength(StreamKey stream) const;
 
@@ -138,7 +140,7 @@ private:
     void miss(StreamKey key, Stream& stream, const NodeCycle& node, const Moment& moment);
     static void recover(Stream& stream, const NodeCycle& node, const Moment& moment);
     Episode& episodeOf(StreamKey key, Stream& stream, Nanoseconds start);
-    static Nanoseconds gapOf(const Episode& episode);
+    static Episode soFar(const Stream& stream);
     void close(Stream& stream);
     bool isOver(const Stream& stream, Nanoseconds now) const;
     static bool isEnding(const Stream& stream);

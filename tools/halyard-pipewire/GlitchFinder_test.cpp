@@ -116,6 +116,7 @@ TEST_F(GlitchFinderTest, ALongOneIsToldAfterTenSecondsAndAtItsEnd) {
     due();
     ASSERT_EQ(told_.size(), 1U);
     EXPECT_FALSE(told_[0].over);
+    EXPECT_EQ(told_[0].episode.held, told_[0].episode.end - told_[0].episode.start);
     missed(100);
     due();
     EXPECT_EQ(told_.size(), 1U);
@@ -149,6 +150,21 @@ TEST_F(GlitchFinderTest, AMoveToAnotherDeviceIsNoGlitch) {
 
 TEST_F(GlitchFinderTest, TheLastCyclesBeforeAStopAreNoGlitch) {
     missed(2);
+    finder_.end(kStream, graph_.now());
+    due(10 * kSecond);
+    EXPECT_TRUE(told_.empty());
+}
+
+TEST_F(GlitchFinderTest, TheLastLongCycleBeforeAStopIsNoGlitch) {
+    graph_ = TestGraph(graph_.now());
+    for (int i = 0; i < 6; ++i) {
+        Cycle cycle = graph_.cycle({{kNode, i < 5 ? Progress::Finished : Progress::Triggered}});
+        cycle.frames = 8192; // 171 ms
+        cycle.nextClock = 0;
+        cycle.clock = cycle.driver.signal + (i < 5 ? 0 : cycle.length());
+        finder_.take(cycle);
+        graph_.skip(cycle.length() - kLength);
+    }
     finder_.end(kStream, graph_.now());
     due(10 * kSecond);
     EXPECT_TRUE(told_.empty());
