@@ -15,13 +15,14 @@ constexpr Nanoseconds kTick = 50'000'000;
 GlitchInquiry::GlitchInquiry(Nanoseconds start, std::shared_ptr<const WatchedProgram> program,
                              bool viaServer, const History<MachineSample>& machine)
     : machine_(machine), program_(std::move(program)), viaServer_(viaServer), foldedUntil_(start) {
-    if (const auto* const before = machine_.before(start)) {
+    if (const auto* const before = machine_.before(start); before && before->at <= start) {
         machineBefore_ = *before;
     }
     if (program_ == nullptr) {
         return;
     }
-    if (const auto* const before = program_->history().before(start)) {
+    if (const auto* const before = program_->history().before(start);
+        before && before->at <= start) {
         threadBefore_ = *before;
         usual_ = usualRates(program_->history(), before->at);
     }
@@ -71,8 +72,10 @@ CauseFacts GlitchInquiry::factsOf(const Episode& episode) const {
     facts.othersCycles = episode.othersCycles;
     facts.largestOther = episode.largestOther;
     facts.gone = program_ != nullptr && program_->ending().died();
-    facts.stopped = stopped_;
-    facts.frozen = frozen_;
+    // What a server missed for a program that was stopped meanwhile is the server's.
+    const bool own = !viaServer_ || episode.inferred;
+    facts.stopped = stopped_ && own;
+    facts.frozen = frozen_ && own;
     facts.stoodStillSeconds = seconds(stoodStill_);
     if (const auto* const after = machine_.after(episode.end); after && machineBefore_) {
         facts.asleepSeconds = seconds(after->asleep - machineBefore_->asleep);
@@ -87,7 +90,6 @@ CauseFacts GlitchInquiry::factsOf(const Episode& episode) const {
 
 GlitchEvidence GlitchInquiry::evidenceOf(const Episode& episode) const {
     GlitchEvidence evidence{.state = state_,
-                            .threadBefore = threadBefore_,
                             .machineBefore = machineBefore_,
                             .busyCycles = episode.busyCycles,
                             .driverLateSeconds = seconds(episode.lateness),
@@ -95,7 +97,8 @@ GlitchEvidence GlitchInquiry::evidenceOf(const Episode& episode) const {
     if (const auto* const after = machine_.after(episode.end)) {
         evidence.machineAfter = *after;
     }
-    if (const auto* const after = threadAfter(episode)) {
+    if (const auto* const after = threadAfter(episode); after && !viaServer_) {
+        evidence.threadBefore = threadBefore_;
         evidence.threadAfter = *after;
     }
     return evidence;

@@ -11,11 +11,14 @@ namespace halyard::pipewire {
 namespace {
 
 constexpr Nanoseconds kMinute = 60'000'000'000;
+// Many streams may begin at once, and the history is short.
+constexpr Nanoseconds kSoon = 5'000'000;
 
 } // namespace
 
 GlitchWatch::GlitchWatch(SessionSink& sink, Options options)
-    : sink_(sink), options_(std::move(options)), machineReader_(options_.places.processes) {
+    : sink_(sink), options_(std::move(options)),
+      machineReader_(options_.places.processes, options_.asleep) {
     finder_.opened = [this](const Episode& episode) { open(episode); };
     finder_.tell = [this](const Episode& episode, bool over) { tell(episode, over); };
 }
@@ -54,8 +57,12 @@ void GlitchWatch::runs(const StreamRun& run) {
     if (!stream.program) {
         stream.program = programOf(run);
     }
-    if (!ranBefore && stream.program) {
-        stream.program->streamRuns();
+    if (!ranBefore) {
+        if (stream.program) {
+            stream.program->streamRuns(now);
+        }
+        sampleMachine(now);
+        noteThread(stream);
     }
 }
 
@@ -72,7 +79,7 @@ void GlitchWatch::stopped(StreamKey key) {
         return;
     }
     if (found->second.program) {
-        found->second.program->streamStopped();
+        found->second.program->streamStopped(options_.clock());
     }
     found->second.stoppedSince.reset();
     finder_.end(key, options_.clock());
@@ -122,8 +129,14 @@ void GlitchWatch::tick() {
     settle(now);
 }
 
+void GlitchWatch::sampleMachine(Nanoseconds now) {
+    if (machine_.latest() == nullptr || now - machine_.latest()->at >= kSoon) {
+        machine_.add(machineReader_.sample(now));
+    }
+}
+
 void GlitchWatch::sample(Nanoseconds now) {
-    machine_.add(machineReader_.sample(now));
+    sampleMachine(now);
     for (auto& [id, weak] : programs_) {
         const auto program = weak.lock();
         if (program && program->runs()) {
@@ -136,6 +149,7 @@ void GlitchWatch::sample(Nanoseconds now) {
         }
         if (stream.program && !stream.run.viaServer) {
             stream.program->seek(now, finder_.cycleLength(key));
+            noteThread(stream);
         }
         if (stream.run.viaServer) {
             inferStop(key, stream, now);
@@ -225,8 +239,15 @@ std::optional<double> GlitchWatch::othersCpu(const Episode& episode, const Strea
     return sum;
 }
 
+// What a program missed some time before it died has another cause.
+bool GlitchWatch::endsWithProgram(const Episode& episode) const {
+    const auto left = leaving_.find(episode.stream);
+    return left != leaving_.end() && left->second - episode.end < GlitchFinder::gapOf(episode);
+}
+
 CauseFacts GlitchWatch::factsOf(const Episode& episode, const Stream& stream) const {
     CauseFacts facts = stream.inquiry->factsOf(episode);
+    facts.gone = facts.gone && endsWithProgram(episode);
     if (facts.thread.cpu) {
         facts.othersCpuSeconds = othersCpu(episode, stream);
     }
@@ -275,6 +296,16 @@ void GlitchWatch::tell(const Episode& episode, bool over) {
     if (over) {
         stream.inquiry.reset();
     }
+}
+
+void GlitchWatch::noteThread(Stream& stream) const {
+    if (!options_.note || !stream.program || stream.run.viaServer ||
+        stream.program->thread() == stream.notedThread) {
+        return;
+    }
+    stream.notedThread = stream.program->thread();
+    options_.note(fmt::format("session {}: the thread of \"{}\" in the graph is {}", stream.run.key,
+                              stream.run.application, stream.notedThread));
 }
 
 void GlitchWatch::note(const Stream& stream, const Episode& episode, const CauseFacts& facts,

@@ -35,6 +35,7 @@ public:
 
     struct Options {
         std::function<Nanoseconds()> clock = monotonicNow;
+        std::function<Nanoseconds()> asleep = timeAsleep;
         ProcessReader::Places places = {};
         // Takes each decision with its figures.
         std::function<void(const std::string&)> note = nullptr;
@@ -70,6 +71,7 @@ private:
         StreamRun run;
         std::shared_ptr<WatchedProgram> program;
         bool running = false;
+        std::string notedThread;
         std::deque<Nanoseconds> told;
         std::uint64_t unreported = 0;
         std::optional<GlitchInquiry> inquiry;    // into the open episode
@@ -79,14 +81,17 @@ private:
 
     std::shared_ptr<WatchedProgram> programOf(const StreamRun& run);
     void sample(Nanoseconds now);
+    void sampleMachine(Nanoseconds now);
     void inferStop(StreamKey key, Stream& stream, Nanoseconds now);
     void conclude(StreamKey key, Stream& stream, Nanoseconds now);
     void settle(Nanoseconds now);
     void open(const Episode& episode);
     void tell(const Episode& episode, bool over);
     CauseFacts factsOf(const Episode& episode, const Stream& stream) const;
+    bool endsWithProgram(const Episode& episode) const;
     std::optional<double> othersCpu(const Episode& episode, const Stream& stream) const;
     bool allowed(Stream& stream, bool over);
+    void noteThread(Stream& stream) const;
     void note(const Stream& stream, const Episode& episode, const CauseFacts& facts,
               GlitchCause cause) const;
 

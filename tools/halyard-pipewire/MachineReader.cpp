@@ -5,6 +5,7 @@
 #include <fcntl.h>
 #include <string_view>
 #include <unistd.h>
+#include <utility>
 
 namespace halyard::pipewire {
 
@@ -39,8 +40,14 @@ std::optional<Nanoseconds> pressure(const Descriptor& file) {
 
 } // namespace
 
-MachineReader::MachineReader(const std::filesystem::path& processes)
-    : ownTimes_(::open((processes / "thread-self/schedstat").c_str(), O_RDONLY | O_CLOEXEC)) {
+Nanoseconds timeAsleep() {
+    return clock(CLOCK_BOOTTIME) - clock(CLOCK_MONOTONIC);
+}
+
+MachineReader::MachineReader(const std::filesystem::path& processes,
+                             std::function<Nanoseconds()> asleep)
+    : asleep_(std::move(asleep)),
+      ownTimes_(::open((processes / "thread-self/schedstat").c_str(), O_RDONLY | O_CLOEXEC)) {
     const char* const names[] = {"cpu", "memory", "io"};
     for (std::size_t i = 0; i < pressure_.size(); ++i) {
         const auto path = processes / "pressure" / names[i];
@@ -53,7 +60,7 @@ MachineSample MachineReader::sample(Nanoseconds now) const {
             .cpuPressure = pressure(pressure_[0]),
             .memoryPressure = pressure(pressure_[1]),
             .ioPressure = pressure(pressure_[2]),
-            .asleep = clock(CLOCK_BOOTTIME) - clock(CLOCK_MONOTONIC),
+            .asleep = asleep_(),
             .ownDelay = numberAfter(ownTimes_, " ")};
 }
 

@@ -5,19 +5,26 @@
 
 #include <array>
 #include <filesystem>
+#include <functional>
 
 #include "ProcessReader.h"
 #include "Samples.h"
 
 namespace halyard::pipewire {
 
+// Boot time ahead of monotonic time.
+[[nodiscard]] Nanoseconds timeAsleep();
+
 class MachineReader final {
 public:
-    explicit MachineReader(const std::filesystem::path& processes = "/proc");
+    // `asleep`: how long the machine was, all in all.
+    explicit MachineReader(const std::filesystem::path& processes = "/proc",
+                           std::function<Nanoseconds()> asleep = timeAsleep);
 
     [[nodiscard]] MachineSample sample(Nanoseconds now) const;
 
 private:
+    std::function<Nanoseconds()> asleep_;
     std::array<Descriptor, 3> pressure_;
     Descriptor ownTimes_;
 };

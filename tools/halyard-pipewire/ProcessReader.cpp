@@ -8,6 +8,7 @@
 #include <cstdlib>
 #include <dirent.h>
 #include <fcntl.h>
+#include <functional>
 #include <memory>
 #include <sched.h>
 #include <string_view>
@@ -156,29 +157,53 @@ ProcessReader::ProcessReader(pid_t process, Places places)
           ::open((places_.processes / std::to_string(process)).c_str(), kReadOnly | O_DIRECTORY)),
       processStat_(openAt(folder_, "stat")), groups_(openAt(folder_, "cgroup")) {}
 
-bool ProcessReader::openThread(const std::string& thread) {
+void ProcessReader::openThread(const std::string& thread) {
+    if (thread == thread_) {
+        return;
+    }
     threadStat_ = openAt(folder_, "task/" + thread + "/stat");
     threadTimes_ = openAt(folder_, "task/" + thread + "/schedstat");
+    thread_ = threadStat_ ? thread : "";
+}
+
+void ProcessReader::beginSearch() {
+    if (known_) {
+        return;
+    }
     candidates_.clear();
-    return threadKnown();
+    const std::vector<Thread> threads = threadsOf(folder_);
+    for (const Thread& thread : threads) {
+        candidates_.emplace(thread.id, Candidate{thread.slices});
+    }
+    const auto takeOnly = [&](bool Thread::*kind) {
+        const auto found = std::find_if(threads.begin(), threads.end(), std::mem_fn(kind));
+        if (std::count_if(threads.begin(), threads.end(), std::mem_fn(kind)) != 1) {
+            return false;
+        }
+        openThread(found->id);
+        return !thread_.empty();
+    };
+    known_ = takeOnly(&Thread::named);
+    if (!known_) {
+        takeOnly(&Thread::realTime);
+    }
 }
 
 bool ProcessReader::findThread(std::uint64_t wakeUps) {
-    if (threadKnown()) {
-        return true;
-    }
-    const bool first = candidates_.empty();
     const Thread* best = nullptr;
     std::pair<int, double> bestRank;
-    const std::vector<Thread> threads = threadsOf(folder_);
+    const std::vector<Thread> threads = known_ ? std::vector<Thread>() : threadsOf(folder_);
     for (const Thread& thread : threads) {
-        const auto [known, isNew] = candidates_.try_emplace(thread.id, Candidate{thread.slices});
-        const double woken = static_cast<double>(thread.slices - known->second.slices);
+        const auto before = candidates_.find(thread.id);
+        if (before == candidates_.end()) {
+            continue;
+        }
+        const double woken = static_cast<double>(thread.slices - before->second.slices);
         const double off = std::abs(woken - static_cast<double>(wakeUps));
         const int kind = thread.named ? 0 : thread.realTime ? 1 : 2;
         // One of others that was scheduled half as often, or twice, is not woken by cycles.
         const bool unlikely = kind == 2 && off > 0.5 * static_cast<double>(wakeUps);
-        if (first || isNew || wakeUps == 0 || woken < 1 || unlikely) {
+        if (woken < 1 || unlikely) {
             continue;
         }
         const std::pair rank(kind, off);
@@ -187,7 +212,11 @@ bool ProcessReader::findThread(std::uint64_t wakeUps) {
             bestRank = rank;
         }
     }
-    return best != nullptr && openThread(best->id);
+    if (best != nullptr) {
+        openThread(best->id);
+        known_ = !thread_.empty();
+    }
+    return known_;
 }
 
 bool ProcessReader::Ending::died() const {
@@ -215,11 +244,11 @@ ThreadSample ProcessReader::sample(Nanoseconds now) {
     static const Nanoseconds kTick = 1'000'000'000 / ::sysconf(_SC_CLK_TCK);
     std::array<char, 4096> buffer{};
     ThreadSample sample{.at = now};
-    const auto fields = statFields(readAll(threadKnown() ? threadStat_ : processStat_, buffer));
+    const auto fields = statFields(readAll(threadStat_ ? threadStat_ : processStat_, buffer));
     if (!fields.empty() && !fields[kState].empty()) {
         sample.state = fields[kState][0];
     }
-    if (threadKnown()) {
+    if (threadStat_) {
         sample.majorFaults = number<std::uint64_t>(fields, kMajorFaults);
         // Zero for all threads where the kernel does not count it.
         const auto ticks = number<std::int64_t>(fields, kIoTicks);

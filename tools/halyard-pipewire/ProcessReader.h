@@ -49,10 +49,15 @@ public:
     // which nothing is known.
     ProcessReader(pid_t process, Places places);
 
-    // Looks for the thread that was scheduled about `wakeUps` times since the first
-    // call. True when it is known; to be called until it is.
+    // Looks at the threads for the first time. The only one that PipeWire has named for
+    // it is known then; the only one of a real-time class is taken for now.
+    void beginSearch();
+    // Looks for the thread that was scheduled about `wakeUps` times since then. True
+    // when it is known; to be called until it is.
     bool findThread(std::uint64_t wakeUps);
-    bool threadKnown() const { return static_cast<bool>(threadStat_); }
+    bool threadKnown() const { return known_; }
+    // The one that is read: known, or taken for now. Empty when there is none.
+    const std::string& thread() const { return thread_; }
 
     [[nodiscard]] ThreadSample sample(Nanoseconds now);
     // How the process ended.
@@ -68,7 +73,7 @@ private:
     struct Candidate {
         std::uint64_t slices = 0;
     };
-    bool openThread(const std::string& thread);
+    void openThread(const std::string& thread);
     bool frozen();
     void followGroup(const std::string& groups);
 
@@ -79,6 +84,8 @@ private:
     Descriptor groups_;
     Descriptor threadStat_;
     Descriptor threadTimes_;
+    std::string thread_;
+    bool known_ = false;
     std::string knownGroups_;
     Descriptor freezerOne_; // freezer.state, of the first kind of control groups
     Descriptor freezerTwo_; // cgroup.events, of the second

@@ -4,6 +4,7 @@
 // Not thread-safe.
 #pragma once
 
+#include <string>
 #include <utility>
 
 #include "History.h"
@@ -16,16 +17,20 @@ class WatchedProgram final {
 public:
     explicit WatchedProgram(ProcessReader reader) : reader_(std::move(reader)) {}
 
-    // Streams that run.
-    void streamRuns() { ++streams_; }
-    void streamStopped() { --streams_; }
+    // Streams that run. Each begin and end of a run is looked at, so that what it does
+    // at once is seen whole.
+    void streamRuns(Nanoseconds now);
+    void streamStopped(Nanoseconds now);
     bool runs() const { return streams_ > 0; }
 
-    void sample(Nanoseconds now) { history_.add(reader_.sample(now)); }
-    // The thread of a program that just started to play is found by watching its
-    // threads for a while. `cycleLength`: of one of its streams, 0 while unknown.
+    void sample(Nanoseconds now);
+    // A thread without a name of its own is found by watching all of them for a while,
+    // from the first run on.
+    // `cycleLength`: of one of its streams, 0 while unknown.
     void seek(Nanoseconds now, Nanoseconds cycleLength);
 
+    // The thread that works in the graph, as far as is known; empty for none.
+    const std::string& thread() const { return reader_.thread(); }
     const History<ThreadSample>& history() const { return history_; }
     ProcessReader::Ending ending() const { return reader_.ending(); }
 
