@@ -150,5 +150,30 @@ TEST_F(StreamTrackerObserverTest, ClosingAllWaitsForNobody) {
                                         "playback stop", "close 1001"}));
 }
 
+TEST_F(StreamTrackerObserverTest, ANodeIDThatIsUsedAgainMeanwhileIsAnotherSession) {
+    play();
+    remove(kStream);
+    play();
+    EXPECT_EQ(observer_.last.key, kFirstID + 1);
+    EXPECT_EQ(observer_.last.node, kStream);
+    tracker_.settle(kFirstID);
+    EXPECT_EQ(sink_.takeLines(), (Lines{"playback stop", "close 1000"}));
+    remove(kStream);
+    tracker_.settle(kFirstID + 1);
+    EXPECT_EQ(sink_.takeLines(), (Lines{"volume 1 silent", "playback stop", "close 1001"}));
+}
+
+TEST_F(StreamTrackerObserverTest, ALostConnectionEndsThoseThatWaitToo) {
+    play();
+    remove(kStream);
+    sink_.takeLines();
+    observer_.takeLines();
+    tracker_.handle(Disconnected{});
+    EXPECT_EQ(observer_.lines.front(), "settle all");
+    EXPECT_EQ(sink_.takeLines(), (Lines{"playback stop", "close 1000"}));
+    tracker_.settle(kFirstID); // says nothing any more
+    EXPECT_TRUE(sink_.takeLines().empty());
+}
+
 } // namespace
 } // namespace halyard::pipewire
