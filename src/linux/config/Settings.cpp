@@ -241,6 +241,9 @@ void SettingsReader::readSection(const toml::node& node, const std::string& name
     if (section == nullptr) {
         return;
     }
+    for (const Key& key : keys) {
+        result_.known.insert(join(name, key.name));
+    }
     for (const auto& [key, element] : *section) {
         const std::string_view keyName = key.str();
         const std::string path = join(name, keyName);

@@ -8,6 +8,7 @@
 #include <cstdint>
 #include <map>
 #include <optional>
+#include <set>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -56,6 +57,8 @@ struct ParsedSettings {
     Settings settings;
     std::vector<SettingsWarning> warnings; // by line, at most kMaxSettingsWarnings
     std::size_t warningsLeftOut = 0;
+    // The dotted names of all that the tables of the file may hold.
+    std::set<std::string, std::less<>> known;
 };
 
 inline constexpr std::size_t kMaxSettingsWarnings = 32;
