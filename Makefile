@@ -12,7 +12,7 @@ RUN_PACKAGES := pipewire pipewire-bin pipewire-pulse libspa-0.2-modules wireplum
 	sox espeak-ng sqlite3 procps
 TEST_PACKAGES := libmsgpack-cxx-dev libgtest-dev libgmock-dev libbenchmark-dev libsndfile1-dev \
 	clang-format python3-msgpack \
-	neovim pipewire-jack jackd2
+	neovim pipewire-jack jackd2 systemd
 CHECK_PACKAGES := clang clang-tidy libclang-rt-14-dev
 BENCH_PACKAGES := libmsgpack-cxx-dev libbenchmark-dev sqlite3
 
@@ -22,6 +22,9 @@ FUZZ_SECONDS ?= 60
 # `make check PRESETS=gcc-tsan` for one of them; `make check TIDY=1` adds clang-tidy.
 PRESETS ?= gcc-debug gcc-release gcc-asan gcc-tsan clang-debug clang-release clang-asan clang-tsan
 TIDY ?=
+# `make install PREFIX=/usr DESTDIR=DIR` puts everything below DIR.
+PREFIX ?= /usr/local
+DESTDIR ?=
 # `make run KEEP=DIR` leaves the demonstration's directories there.
 KEEP ?=
 
@@ -33,7 +36,7 @@ CTEST_FLAGS := --output-on-failure --no-label-summary --parallel $(TEST_JOBS)
 FIXED_ADDRESSES := setarch $(shell uname -m) -R
 
 .DEFAULT_GOAL := build
-.PHONY: deps build run test check fuzz tidy bench format clean
+.PHONY: deps build install run test check fuzz tidy bench format clean
 
 deps:
 	@scripts/install-deps.sh $(BUILD_PACKAGES) $(RUN_PACKAGES) $(TEST_PACKAGES)
@@ -42,6 +45,13 @@ build:
 	@scripts/install-deps.sh $(BUILD_PACKAGES)
 	cmake --preset release
 	cmake --build --preset release --parallel $(JOBS)
+
+# The build folder remembers the prefix, which some of the installed files name.
+install:
+	@scripts/install-deps.sh $(BUILD_PACKAGES)
+	cmake --preset release -D CMAKE_INSTALL_PREFIX=$(PREFIX)
+	cmake --build --preset release --parallel $(JOBS)
+	DESTDIR=$(abspath $(DESTDIR)) cmake --install build/release
 
 run:
 	@scripts/install-deps.sh $(BUILD_PACKAGES) $(RUN_PACKAGES)

@@ -1,5 +1,8 @@
-/* The program of docs/client.md: reports one session of playback. Built as C11
- * against the shared library, and run by the tests. */
+/* A player that reports one session of playback, to the daemon at its usual place or at
+ * the socket that the argument names.
+ *
+ *     cc player.c $(pkg-config --cflags --libs halyard) -o player
+ */
 #include <halyard/halyard.h>
 
 int main(int argc, char** argv) {
