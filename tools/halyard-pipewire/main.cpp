@@ -19,6 +19,7 @@
 #include "GlitchWatch.h"
 #include "LookOnce.h"
 #include "PipeWireAdapter.h"
+#include "PlainText.h"
 #include "StreamTracker.h"
 
 namespace {
@@ -96,8 +97,11 @@ Arguments parse(int argc, char** argv) {
     return arguments;
 }
 
+constexpr std::size_t kLongestNote = 2000;
+
+// Names in it are what programs call themselves.
 void note(const std::string& text) {
-    fmt::print(stderr, "halyard-pipewire: {}\n", text);
+    fmt::print(stderr, "halyard-pipewire: {}\n", plainText(text, kLongestNote));
 }
 
 // Hands everything on, and says so when asked.
