@@ -57,7 +57,7 @@ bool GlitchFinder::begin(StreamKey key, ObjectId node, Nanoseconds now) {
     stream.from = now;
     stream.until.reset();
     stream.warm = false;
-    stream.stall.reset();
+    dropStall(stream);
     return true;
 }
 
@@ -158,7 +158,7 @@ void GlitchFinder::look(StreamKey key, Stream& stream, const NodeCycle& node,
     if (stream.driver != moment.driver) {
         stream.driver = moment.driver;
         stream.warm = false;
-        stream.stall.reset();
+        dropStall(stream);
     }
     // One that was not told to work waits for another that is not done, or takes no part.
     const bool waits = node.progress == Progress::NotTriggered && moment.incomplete;
@@ -334,9 +334,17 @@ Episode GlitchFinder::soFar(const Stream& stream) {
     return episode;
 }
 
-void GlitchFinder::close(Stream& stream) {
-    const Episode episode = soFar(stream);
+// Another device, or another run, begins anew.
+void GlitchFinder::dropStall(Stream& stream) {
+    if (stream.episode) {
+        stream.episode = soFar(stream);
+    }
     stream.stall.reset();
+}
+
+void GlitchFinder::close(Stream& stream) {
+    dropStall(stream);
+    const Episode episode = *stream.episode;
     const bool ending = isEnding(stream);
     stream.episode.reset();
     if (!ending && tell) {

@@ -141,6 +141,7 @@ private:
     static void recover(Stream& stream, const NodeCycle& node, const Moment& moment);
     Episode& episodeOf(StreamKey key, Stream& stream, Nanoseconds start);
     static Episode soFar(const Stream& stream);
+    static void dropStall(Stream& stream);
     void close(Stream& stream);
     bool isOver(const Stream& stream, Nanoseconds now) const;
     static bool isEnding(const Stream& stream);

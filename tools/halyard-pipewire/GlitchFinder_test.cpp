@@ -148,6 +148,19 @@ TEST_F(GlitchFinderTest, AMoveToAnotherDeviceIsNoGlitch) {
     EXPECT_TRUE(told_.empty());
 }
 
+TEST_F(GlitchFinderTest, AMoveInTheMiddleOfAGlitchKeepsWhatHeldItUp) {
+    missed(4);
+    for (int i = 0; i < 15; ++i) {
+        Cycle cycle = graph_.cycle({{kNode}});
+        cycle.driver.id = 30;
+        finder_.take(cycle);
+    }
+    due();
+    ASSERT_EQ(told_.size(), 1U);
+    EXPECT_EQ(told_[0].episode.cycles, 4U);
+    EXPECT_EQ(told_[0].episode.held, 4 * kLength);
+}
+
 TEST_F(GlitchFinderTest, TheLastCyclesBeforeAStopAreNoGlitch) {
     missed(2);
     finder_.end(kStream, graph_.now());
