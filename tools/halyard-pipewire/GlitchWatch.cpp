@@ -216,6 +216,7 @@ void GlitchWatch::open(const Episode& episode) {
     const auto found = streams_.find(episode.stream);
     if (found != streams_.end()) {
         Stream& stream = found->second;
+        stream.realTime = options_.realTime();
         stream.inquiry.emplace(episode.start, stream.program, stream.run.viaServer, machine_);
     }
 }
@@ -289,7 +290,7 @@ void GlitchWatch::tell(const Episode& episode, bool over) {
                                     .evidence = contentsOf(evidence),
                                     .unreported = std::exchange(stream.unreported, 0)};
         sink_.send(episode.stream,
-                   messageOf(episode, message, stream.run.direction, realTimeOffset()));
+                   messageOf(episode, message, stream.run.direction, stream.realTime));
     } else if (over) {
         ++stream.unreported;
     }

@@ -36,6 +36,8 @@ public:
     struct Options {
         std::function<Nanoseconds()> clock = monotonicNow;
         std::function<Nanoseconds()> asleep = timeAsleep;
+        // What to add to the clock for the time since 1970.
+        std::function<Nanoseconds()> realTime = realTimeOffset;
         ProcessReader::Places places = {};
         // Takes each decision with its figures.
         std::function<void(const std::string&)> note = nullptr;
@@ -75,6 +77,7 @@ private:
         std::deque<Nanoseconds> told;
         std::uint64_t unreported = 0;
         std::optional<GlitchInquiry> inquiry;    // into the open episode
+        Nanoseconds realTime = 0;                // as it began
         std::optional<Nanoseconds> stoppedSince; // a program behind a server
         Nanoseconds inferredUntil = 0;
     };
