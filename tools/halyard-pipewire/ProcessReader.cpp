@@ -189,7 +189,8 @@ void ProcessReader::beginSearch() {
     }
 }
 
-bool ProcessReader::findThread(std::uint64_t wakeUps) {
+bool ProcessReader::findThread(std::uint64_t wakeUps, int streams) {
+    const auto expected = static_cast<double>(wakeUps);
     const Thread* best = nullptr;
     std::pair<int, double> bestRank;
     const std::vector<Thread> threads = known_ ? std::vector<Thread>() : threadsOf(folder_);
@@ -199,10 +200,11 @@ bool ProcessReader::findThread(std::uint64_t wakeUps) {
             continue;
         }
         const double woken = static_cast<double>(thread.slices - before->second.slices);
-        const double off = std::abs(woken - static_cast<double>(wakeUps));
+        const double off = std::abs(woken - expected);
         const int kind = thread.named ? 0 : thread.realTime ? 1 : 2;
         // One of others that was scheduled half as often, or twice, is not woken by cycles.
-        const bool unlikely = kind == 2 && off > 0.5 * static_cast<double>(wakeUps);
+        const bool unlikely =
+            kind == 2 && (woken < 0.5 * expected || woken > (streams + 0.5) * expected);
         if (woken < 1 || unlikely) {
             continue;
         }

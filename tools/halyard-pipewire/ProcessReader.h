@@ -52,9 +52,9 @@ public:
     // Looks at the threads for the first time. The only one that PipeWire has named for
     // it is known then; the only one of a real-time class is taken for now.
     void beginSearch();
-    // Looks for the thread that was scheduled about `wakeUps` times since then. True
-    // when it is known; to be called until it is.
-    bool findThread(std::uint64_t wakeUps);
+    // Looks for the thread that was scheduled about `wakeUps` times since then, or that
+    // for each of several streams. True when it is known; to be called until it is.
+    bool findThread(std::uint64_t wakeUps, int streams = 1);
     bool threadKnown() const { return known_; }
     // The one that is read: known, or taken for now. Empty when there is none.
     const std::string& thread() const { return thread_; }

@@ -85,6 +85,15 @@ TEST_F(ProcessReaderTest, AnOrdinaryThreadThatDoesNotWakeWithTheCyclesIsNotTaken
     EXPECT_TRUE(reader.findThread(20));
 }
 
+TEST_F(ProcessReaderTest, AnOrdinaryThreadOfSeveralStreamsMayWakeForEachOfThem) {
+    thread(2, "worker", 0);
+    ProcessReader reader(kProgram, processes_.places());
+    reader.beginSearch();
+    thread(2, "worker", 50);
+    EXPECT_FALSE(reader.findThread(20));
+    EXPECT_TRUE(reader.findThread(20, 2));
+}
+
 TEST_F(ProcessReaderTest, AThreadThatCameAfterTheFirstLookIsNotTaken) {
     ProcessReader reader(kProgram, processes_.places());
     thread(1, "main", 0);

@@ -42,7 +42,7 @@ void WatchedProgram::seek(Nanoseconds now, Nanoseconds cycleLength) {
     }
     const std::string taken = reader_.thread();
     ++tries_;
-    reader_.findThread(static_cast<std::uint64_t>((now - searchedSince_) / cycleLength));
+    reader_.findThread(static_cast<std::uint64_t>((now - searchedSince_) / cycleLength), streams_);
     if (!taken.empty() && reader_.thread() != taken) {
         history_ = {}; // it was another's
     }
