@@ -3,6 +3,8 @@ all. HALYARDCTL names the program."""
 
 import json
 import os
+import pty
+import re
 import select
 import shutil
 import sqlite3
@@ -258,6 +260,51 @@ class Asking(CtlTest):
         self.assertIn(f"pid  {self.daemon.process.pid}\n",
                       "\n".join(" ".join(line.split()).replace(" ", "  ", 1)
                                 for line in shown.stdout.splitlines()) + "\n")
+
+
+class OnATerminal(CtlTest):
+    def shown(self, *arguments, **variables):
+        """What a terminal of 60 columns gets to see."""
+        master, slave = pty.openpty()
+        with subprocess.Popen(
+                [HALYARDCTL, "--state", os.path.dirname(self.daemon.store_path), *arguments],
+                stdout=slave, stdin=slave, close_fds=True,
+                env={**os.environ, "COLUMNS": "60", "TERM": "xterm", **variables}) as process:
+            os.close(slave)
+            text = b""
+            try:
+                while chunk := os.read(master, 65536):
+                    text += chunk
+            except OSError:  # the end, of a terminal
+                pass
+            self.assertEqual(process.wait(PATIENCE), 0)
+        os.close(master)
+        return text.decode().replace("\r\n", "\n")
+
+    def test_tables_fit_and_have_colours(self):
+        self.play(self.connect(), 1, "an application with a name that goes on for too long")
+        self.flush()
+        for pager in ({"PAGER": "cat"}, {"PAGER": ""}, {}):
+            for command in ("sessions", "messages", "events"):
+                shown = self.shown(command, **pager)
+                self.assertIn("\x1b[1m", shown)
+                self.assertIn("…", shown)
+                lines = re.sub("\x1b\\[[0-9;?]*[a-zA-Z=>]|\x1b[=>]", "", shown).splitlines()
+                self.assertLessEqual(max(len(line) for line in lines), 60, lines)
+
+    def test_who_wants_no_colours_gets_none(self):
+        self.play(self.connect())
+        self.flush()
+        self.assertNotIn("\x1b", self.shown("sessions", NO_COLOR="1", PAGER="cat"))
+        self.assertNotIn("\x1b", self.shown("sessions", TERM="dumb", PAGER="cat"))
+
+    def test_the_pager_is_what_was_asked_for(self):
+        self.play(self.connect())
+        self.flush()
+        self.assertTrue(self.shown("sessions", PAGER="sed s/^/paged:/").startswith("paged:"))
+        self.assertEqual(self.shown("sessions", PAGER="true"), "")
+        self.assertNotIn("paged:", self.ctl("sessions", env={
+            **os.environ, "PAGER": "sed s/^/paged:/"}).stdout)
 
 
 class Watching(CtlTest):

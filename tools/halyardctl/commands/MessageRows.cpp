@@ -41,11 +41,11 @@ void writeMessage(JsonStream& json, const Message& message) {
 }
 
 std::vector<Table::Column> messageColumns() {
-    return {{"ID", Align::Right},
+    return {{"ID", Align::Right, false, 3},
             {"TIME"},
-            {"SESSION", Align::Right},
+            {"SESSION", Align::Right, false, 2},
             {"APPLICATION", Align::Left, true},
-            {"SERVICE", Align::Left, true},
+            {"SERVICE", Align::Left, true, 1},
             {"CATEGORY"},
             {"TYPE"},
             {"PAYLOAD", Align::Left, true}};

@@ -81,15 +81,15 @@ Exit runSessions(Context& context) {
     }
     const std::vector<Table::Column> columns = {{"ID", Align::Right},
                                                 {"OPENED"},
-                                                {"LENGTH", Align::Right},
-                                                {"ENDED"},
+                                                {"LENGTH", Align::Right, false, 5},
+                                                {"ENDED", Align::Left, false, 2},
                                                 {"APPLICATION", Align::Left, true},
-                                                {"SERVICE", Align::Left, true},
-                                                {"DIRECTION"},
-                                                {"MESSAGES", Align::Right},
+                                                {"SERVICE", Align::Left, true, 1},
+                                                {"DIRECTION", Align::Left, false, 4},
+                                                {"MESSAGES", Align::Right, false, 3},
                                                 {"GLITCHES", Align::Right},
                                                 {"PLAYED", Align::Right},
-                                                {"DEVICES", Align::Left, true}};
+                                                {"DEVICES", Align::Left, true, 6}};
     return listAsTable<Session>(context, forEach, columns, cellsOf, "No sessions.");
 }
 

@@ -129,7 +129,7 @@ std::vector<Cell> metricCells(const Row& row) {
 }
 
 std::vector<Table::Column> columnsOf(const linux_::StoreTableSchema& table) {
-    std::vector<Table::Column> columns = {{"ID", Align::Right}};
+    std::vector<Table::Column> columns = {{"ID", Align::Right, false, 1}};
     for (const linux_::StoreColumn& column : table.columns) {
         std::string title(column.name);
         for (char& letter : title) {
@@ -180,11 +180,11 @@ Exit runTable(Context& context, StoreTable table) {
         });
     }
     if (table == StoreTable::Metric) {
-        const std::vector<Table::Column> columns = {{"ID", Align::Right},
-                                                    {"METRIC", Align::Right},
+        const std::vector<Table::Column> columns = {{"ID", Align::Right, false, 2},
+                                                    {"METRIC", Align::Right, false, 1},
                                                     {"TIME"},
                                                     {"DURATION", Align::Right},
-                                                    {"ISSUE"},
+                                                    {"ISSUE", Align::Left, true},
                                                     {"NODE", Align::Left, true},
                                                     {"CLIENT", Align::Left, true}};
         return listAsTable<Row>(context, forEach, columns, metricCells, "Nothing.");

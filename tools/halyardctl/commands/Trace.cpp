@@ -69,9 +69,10 @@ Exit runTrace(Context& context, const std::string& file) {
         return listAsJson<TraceDurations>(context, forEach, write);
     }
     const std::vector<Table::Column> columns = {
-        {"NAME", Align::Left, true}, {"COUNT", Align::Right}, {"MIN", Align::Right},
-        {"MEDIAN", Align::Right},    {"P90", Align::Right},   {"P99", Align::Right},
-        {"MAX", Align::Right},       {"TOTAL", Align::Right}};
+        {"NAME", Align::Left, true},     {"COUNT", Align::Right},
+        {"MIN", Align::Right, false, 2}, {"MEDIAN", Align::Right},
+        {"P90", Align::Right, false, 1}, {"P99", Align::Right},
+        {"MAX", Align::Right, false, 4}, {"TOTAL", Align::Right, false, 3}};
     return listAsTable<TraceDurations>(context, forEach, columns, cellsOf, "Nothing was measured.");
 }
 

@@ -1,7 +1,6 @@
 #include "output/Table.h"
 
 #include <algorithm>
-#include <numeric>
 
 #include "output/Sanitise.h"
 
@@ -10,7 +9,7 @@ namespace {
 
 constexpr std::string_view kGap = "  ";
 // Nothing is cut to less.
-constexpr std::size_t kLeastCut = 8;
+constexpr std::size_t kLeastCut = 6;
 
 } // namespace
 
@@ -52,7 +51,7 @@ void Table::layOut() {
             widths_[i] = std::max(widths_[i], displayWidth(line[i].text));
         }
     }
-    fit(widths_);
+    fit();
     Line titles;
     for (const Column& column : columns_) {
         titles.emplace_back(column.title, Colour::Bold);
@@ -64,43 +63,69 @@ void Table::layOut() {
     held_.clear();
 }
 
-// Takes cells from the widest of the columns that may shrink, until the line fits.
-void Table::fit(std::vector<std::size_t>& widths) const {
-    const std::size_t room = terminal_.width();
-    const auto needed = [&] {
-        return std::accumulate(widths.begin(), widths.end(), kGap.size() * (widths.size() - 1));
-    };
-    while (room != 0 && needed() > room) {
-        std::size_t widest = columns_.size();
-        for (std::size_t i = 0; i < columns_.size(); ++i) {
-            if (columns_[i].shrinks && (widest == columns_.size() || widths[i] > widths[widest])) {
-                widest = i;
-            }
-        }
-        if (widest == columns_.size() || widths[widest] <= kLeastCut) {
-            return;
-        }
-        --widths[widest];
+std::size_t Table::neededRoom() const {
+    std::size_t needed = 0;
+    for (std::size_t i = 0; i < widths_.size(); ++i) {
+        needed += dropped_[i] ? 0 : widths_[i] + (needed > 0 ? kGap.size() : 0);
     }
+    return needed;
+}
+
+void Table::fit() {
+    dropped_.assign(columns_.size(), false);
+    while (terminal_.width() != 0 && neededRoom() > terminal_.width() &&
+           (shrinkWidest() || dropLeast())) {
+    }
+}
+
+// False when all that may shrink has.
+bool Table::shrinkWidest() {
+    std::size_t widest = columns_.size();
+    for (std::size_t i = 0; i < columns_.size(); ++i) {
+        const bool shrinks = columns_[i].shrinks && !dropped_[i] && widths_[i] > kLeastCut;
+        if (shrinks && (widest == columns_.size() || widths_[i] > widths_[widest])) {
+            widest = i;
+        }
+    }
+    if (widest == columns_.size()) {
+        return false;
+    }
+    --widths_[widest];
+    return true;
+}
+
+// False when all that may go has gone.
+bool Table::dropLeast() {
+    std::size_t least = columns_.size();
+    for (std::size_t i = 0; i < columns_.size(); ++i) {
+        const bool goes = columns_[i].rank > 0 && !dropped_[i];
+        if (goes && (least == columns_.size() || columns_[i].rank < columns_[least].rank)) {
+            least = i;
+        }
+    }
+    if (least == columns_.size()) {
+        return false;
+    }
+    dropped_[least] = true;
+    return true;
 }
 
 void Table::writeLine(const Line& line) {
     std::string out;
+    std::string blanks; // before the next cell
     for (std::size_t i = 0; i < line.size(); ++i) {
+        if (dropped_[i]) {
+            continue;
+        }
         const bool cut = terminal_.width() != 0 && columns_[i].shrinks;
         const std::string text = cut ? shortened(line[i].text, widths_[i]) : line[i].text;
         const std::size_t width = displayWidth(text);
-        const std::string blanks(width < widths_[i] ? widths_[i] - width : 0, ' ');
-        const std::string shown = coloured(terminal_, line[i].colour, text);
-        const bool last = i + 1 == line.size();
-        if (columns_[i].align == Column::Align::Right) {
-            out += blanks + shown;
-        } else {
-            out += last ? shown : shown + blanks;
-        }
-        out += last ? "\n" : kGap;
+        const std::string fill(width < widths_[i] ? widths_[i] - width : 0, ' ');
+        const bool right = columns_[i].align == Column::Align::Right;
+        out += blanks + (right ? fill : "") + coloured(terminal_, line[i].colour, text);
+        blanks = (right ? "" : fill) + std::string(kGap);
     }
-    terminal_.write(out);
+    terminal_.write(out + "\n");
 }
 
 } // namespace halyard::ctl

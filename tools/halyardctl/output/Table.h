@@ -3,7 +3,8 @@
 // The first rows are held back until it is known how wide their columns are; what
 // comes later goes straight through, so that a table of any length takes the memory
 // of its beginning. On a terminal, lines are as long as it is wide: columns that may
-// shrink are cut. Elsewhere nothing is cut, and scripts find the columns in their order.
+// shrink are cut, and when that is not enough, the least important ones are left out. Elsewhere
+// nothing is cut, and scripts find the columns in their order.
 //
 // Not thread-safe.
 #pragma once
@@ -31,6 +32,9 @@ public:
         std::string title;
         enum class Align { Left, Right } align = Align::Left;
         bool shrinks = false;
+        // Where there is no room left, the column of the least of these goes first; one
+        // with 0 stays.
+        int rank = 0;
     };
 
     // Borrows the terminal.
@@ -47,12 +51,16 @@ private:
 
     void layOut();
     void writeLine(const Line& line);
-    void fit(std::vector<std::size_t>& widths) const;
+    std::size_t neededRoom() const;
+    void fit();
+    bool shrinkWidest();
+    bool dropLeast();
 
     Terminal& terminal_;
     const std::vector<Column> columns_;
     std::vector<Line> held_;
     std::vector<std::size_t> widths_;
+    std::vector<bool> dropped_;
     bool laidOut_ = false;
 };
 

@@ -21,6 +21,8 @@ namespace {
 
 constexpr std::size_t kLeastWidth = 40;
 constexpr std::size_t kUsualWidth = 80;
+// Small systems have no pager.
+constexpr const char* kUsualPager = "command -v less >/dev/null 2>&1 && exec less -R -F; exec cat";
 
 bool isSet(const char* name) {
     const char* const value = std::getenv(name);
@@ -91,7 +93,7 @@ void Terminal::page() {
     const char* const wanted = std::getenv("PAGER");
     // An empty one means none.
     if (wanted == nullptr || *wanted != '\0') {
-        startPager(wanted == nullptr ? "less -R -F" : wanted);
+        startPager(wanted == nullptr ? kUsualPager : wanted);
     }
 }
 

@@ -4,10 +4,17 @@
 // next of state 0. Devices: the lists of active devices. Direction, where the session
 // does not say it: that of its playback or record messages, if only one kind came.
 //
+// A session that lasts as long as the store reaches back makes this a pass over all
+// messages. So rows do not come out of SQLite one by one: two functions that its
+// statement calls look at them where they lie, and only those that may tell something
+// are parsed. A statement takes some ten thousand rows, so that no transaction is long.
+//
 // Not thread-safe.
 #pragma once
 
+#include <cstdint>
 #include <optional>
+#include <string_view>
 #include <unordered_set>
 #include <vector>
 
@@ -26,6 +33,13 @@ public:
     void finish(std::optional<double> now);
 
 private:
+    // Borrowed from the row.
+    struct Message {
+        std::int64_t category = 0;
+        std::int64_t type = 0;
+        double time = 0;
+        std::string_view payload;
+    };
     struct Running {
         std::optional<double> playingSince;
         std::unordered_set<double> glitchStarts;
@@ -33,18 +47,25 @@ private:
         bool captured = false;
     };
 
-    void take(const Row& row);
-    void takePayload(Session& session, Running& running, const Row& row);
-    void takePlayingState(Session& session, Running& running, double time) const;
-    static void takeGlitch(Session& session, Running& running, std::optional<double> start);
-    void takeDevices(Session& session) const;
+    // What the statement calls: whether a message belongs to one of the sessions, and
+    // then what it is.
+    static void isOurs(sqlite3_context* answer, int count, sqlite3_value** values);
+    static void takeRow(sqlite3_context* answer, int count, sqlite3_value** values);
 
+    bool find(std::int64_t session);
+    void take(const Message& message);
+    void takePlayingState(double time);
+    void takeGlitch(std::optional<double> start);
+    void takeDevices();
     void addStretch(Session& session, double from, double to) const;
 
     std::vector<Session>& sessions_;
     const TimeRange range_;
     std::vector<Running> running_;
     JsonFields fields_;
+    // Of the message at hand.
+    Session* session_ = nullptr;
+    Running* state_ = nullptr;
 };
 
 } // namespace halyard::reading
