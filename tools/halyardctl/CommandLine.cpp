@@ -7,6 +7,7 @@
 #include "commands/Commands.h"
 #include "output/TimeArgument.h"
 #include "output/Words.h"
+#include "report/Report.h"
 
 namespace halyard::ctl {
 namespace {
@@ -61,6 +62,7 @@ private:
     void addLists();
     // Commands about files.
     void addFiles();
+    void addReport();
     void addWatch();
     // Commands about the store as a whole.
     void addCare();
@@ -77,6 +79,7 @@ private:
     bool repair_ = false;
     SendOptions send_{};
     SessionOptions session_{};
+    ReportOptions report_{};
     CLI::App app_{"How the sound of this device is doing, and what halyardd knows of it."};
     std::function<Exit()> chosen_;
 };
@@ -92,6 +95,7 @@ CommandLine::CommandLine(Context& context) : context_(context) {
     addSenders();
     addFiles();
     addCare();
+    addReport();
 }
 
 CLI::App* CommandLine::add(const char* name, const char* what, std::function<Exit()> run) {
@@ -181,6 +185,22 @@ void CommandLine::addCare() {
         ->add_flag("--repair", repair_,
                    "Set a damaged store aside and save what can be read; without a daemon only");
     add("purge", "Removes everything that was collected", [this] { return runPurge(context_); });
+}
+
+void CommandLine::addReport() {
+    CLI::App* const report =
+        add("report", "A page that shows how the sound did, to open in a browser", [this] {
+            if (report_.output.empty() && !context_.json) {
+                return fail({Exit::WrongUse, "report needs --output FILE.html, or --json"});
+            }
+            return runReport(context_, report_);
+        });
+    takeRange(report);
+    takeApplication(report);
+    report->add_option("--output", report_.output, "The page, which is written anew")
+        ->type_name("FILE.html");
+    report->add_option("--trace", report_.trace, "With the durations of this trace's results file")
+        ->type_name("FILE");
 }
 
 void CommandLine::addWatch() {
