@@ -12,7 +12,7 @@ RUN_PACKAGES := pipewire pipewire-bin pipewire-pulse libspa-0.2-modules wireplum
 	sox espeak-ng sqlite3 procps
 TEST_PACKAGES := libmsgpack-cxx-dev libgtest-dev libgmock-dev libbenchmark-dev libsndfile1-dev \
 	clang-format python3-msgpack \
-	neovim pipewire-jack jackd2 systemd
+	neovim pipewire-jack jackd2 systemd chromium chromium-driver python3-selenium
 CHECK_PACKAGES := clang clang-tidy libclang-rt-14-dev
 BENCH_PACKAGES := libmsgpack-cxx-dev libbenchmark-dev sqlite3
 
@@ -61,6 +61,7 @@ run:
 test: deps
 	cmake --preset test
 	cmake --build --preset test --parallel $(JOBS)
+	scripts/fetch-axe.sh build/test/axe
 	$(CTEST) --preset test $(CTEST_FLAGS)
 
 check: deps
@@ -70,6 +71,7 @@ check: deps
 		wrapper=; case $$preset in *-tsan) wrapper="$(FIXED_ADDRESSES)";; esac; \
 		cmake --preset $$preset; \
 		$$wrapper cmake --build --preset $$preset --parallel $(JOBS); \
+		scripts/fetch-axe.sh build/$$preset/axe; \
 		$$wrapper $(CTEST) --preset $$preset $(CTEST_FLAGS); \
 	done
 	$(MAKE) fuzz

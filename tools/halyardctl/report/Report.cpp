@@ -5,6 +5,7 @@
 #include <cstdio>
 #include <fmt/format.h>
 
+#include "output/Progress.h"
 #include "output/Words.h"
 #include "report/DigestGathering.h"
 #include "report/DigestJson.h"
@@ -28,7 +29,9 @@ Outcome<void> gather(Context& context, const ReportOptions& options, Digest& dig
     if (!reader.ok()) {
         return reader.failure();
     }
-    return gatherDigest(reader.value(), digest, limits, [](double) {});
+    Progress progress("Reading the store");
+    return gatherDigest(reader.value(), digest, limits,
+                        [&progress](double share) { progress.update(share); });
 }
 
 Exit printJson(Context& context, const Digest& digest) {
