@@ -64,7 +64,7 @@ function glitchSentence(digest) {
 }
 
 function leaderInWords(application, { totals: { glitches }, by_application: all }) {
-  if (!application) return [` ${counted(all.length, "application", "applications")} had them alike.`];
+  if (!application) return [` No application leads, of ${whole(all.length)}.`];
   return [" ", name(nameOr(application.name, "An application without a name")),
     application.glitches < glitches ? ` had the most (${whole(application.glitches)}).`
       : glitches === 1 ? " had it." : " had them all."];

@@ -1,10 +1,16 @@
 // Glitches by application, device and cause: a bar for each.
 
 const MOST_BARS = 8;
+const BAR_FONT = "13px";
+
+function valueOf(bar) {
+  return `${whole(bar.glitches)} · ${lengthOf(bar.seconds)}`;
+}
 
 function barsOf(sums, say) {
-  const shown = sums.slice(0, MOST_BARS).map((sum) => ({ ...sum, title: sum.others ? "all others" : say(sum.name) }));
-  const rest = sums.slice(MOST_BARS);
+  const most = sums.length === MOST_BARS + 1 ? sums.length : MOST_BARS;
+  const shown = sums.slice(0, most).map((sum) => ({ ...sum, title: sum.others ? "all others" : say(sum.name) }));
+  const rest = sums.slice(most);
   if (rest.length > 0) {
     shown.push({ title: counted(rest.length, "other", "others"), glitches: d3.sum(rest, (sum) => sum.glitches),
       seconds: d3.sum(rest, (sum) => sum.seconds) });
@@ -19,9 +25,10 @@ function barDrawing(title, bars, width) {
   const x = d3.scaleLinear().domain([0, d3.max(bars, (bar) => bar.glitches)]).range([0, width]);
   const y = d3.scaleBand().domain(d3.range(bars.length)).range([0, bars.length * line]);
   const rows = svg.selectAll("g").data(bars).join("g").attr("transform", (_, index) => `translate(0,${y(index)})`);
-  rows.append("text").attr("class", "name").attr("y", 15).text((bar) => fittedText(bar.title, Math.floor(width / 9.5)));
+  rows.append("text").attr("class", "name").attr("y", 15)
+    .text((bar) => fittedText(bar.title, width - textWidth(valueOf(bar), BAR_FONT) - 12, BAR_FONT));
   rows.append("text").attr("class", "value").attr("x", width).attr("y", 15).attr("text-anchor", "end")
-    .text((bar) => `${whole(bar.glitches)} · ${lengthOf(bar.seconds)}`);
+    .text(valueOf);
   rows.append("rect").attr("class", "track").attr("y", 22).attr("width", width).attr("height", 8).attr("rx", 2);
   rows.append("rect").attr("class", "bar").attr("y", 22).attr("height", 8).attr("rx", 2)
     .attr("width", (bar) => Math.max(2, x(bar.glitches)));

@@ -32,9 +32,20 @@ function chapter(id) {
   return section.querySelector(".body") ?? section;
 }
 
-// A text cut to what fits into a drawing, whose whole is its tip.
-function fittedText(text, most) {
-  return shortened(text, most);
+// How wide a text is in a drawing.
+const measure = document.createElement("canvas").getContext("2d");
+function textWidth(text, font) {
+  measure.font = `${font} ${getComputedStyle(document.documentElement).fontFamily}`;
+  return measure.measureText(text).width;
+}
+
+// A text cut to what fits into a drawing.
+function fittedText(text, width, font) {
+  let fitted = plain(text);
+  for (let most = Math.min(fitted.length, 200); most > 1 && textWidth(fitted, font) > width; --most) {
+    fitted = shortened(text, most);
+  }
+  return fitted;
 }
 
 function widthOf(place) {

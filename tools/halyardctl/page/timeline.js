@@ -3,6 +3,7 @@
 
 const LANE = { played: 30, captured: 12, row: 66 };
 const FEW_ROWS = 12;
+const LABEL_FONT = "600 13.5px";
 
 class Timeline {
   constructor(place, digest) {
@@ -121,10 +122,10 @@ class Timeline {
       row.glitches.length > 0 ? counted(row.glitches.length, "glitch", "glitches") : ""].filter(Boolean).join(" · ");
     const label = body.append("text").attr("class", "label");
     if (this.narrow) {
-      label.attr("x", 0).attr("y", top + 16).text(fittedText(row.title, 24));
+      label.attr("x", 0).attr("y", top + 16).text(fittedText(row.title, plot / 2, LABEL_FONT));
       label.append("tspan").attr("class", "small").attr("dx", 8).text(said);
     } else {
-      label.attr("x", -this.left + 4).attr("y", top + 30).text(fittedText(row.title, 20));
+      label.attr("x", -this.left + 4).attr("y", top + 30).text(fittedText(row.title, this.left - 12, LABEL_FONT));
       label.append("tspan").attr("class", "small").attr("x", -this.left + 4).attr("dy", 17).text(said);
     }
     label.append("title").text(row.title);
@@ -138,7 +139,7 @@ class Timeline {
       .attr("aria-label", (mark) => this.markInWords(mark));
     marks.append("circle").attr("class", "reach").attr("r", 12);
     const single = marks.filter((mark) => mark.glitches.length === 1);
-    single.append("path").attr("class", "sign").attr("d", d3.symbol(d3.symbolDiamond, 70));
+    single.append("path").attr("class", "sign").attr("d", d3.symbol(d3.symbolDiamond, 110));
     const several = marks.filter((mark) => mark.glitches.length > 1);
     several.append("circle").attr("class", "sign").attr("r", 8.5);
     several.append("text").attr("dy", "0.35em").text((mark) => mark.glitches.length > 99 ? "…" : mark.glitches.length);
