@@ -269,6 +269,16 @@ TEST_F(GlitchWatchTest, WhatAThreadDidWhileItWasPausedIsNotCounted) {
     EXPECT_EQ(cause(), "client_blocked");
 }
 
+TEST_F(GlitchWatchTest, WhatAThreadDidJustBeforeItStoppedIsCounted) {
+    plays();
+    live(220, Progress::Triggered);
+    thread_.cpu += 220 * kMillisecond;
+    processes_.thread(kProgram, thread_);
+    watch_->stopped(kKey); // between two looks
+    live(2000);
+    EXPECT_EQ(cause(), "client_slow");
+}
+
 TEST_F(GlitchWatchTest, WhatWasNotMeasuredIsNotSaid) {
     auto unknown = run();
     unknown.process.reset();
