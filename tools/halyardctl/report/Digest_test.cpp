@@ -23,7 +23,7 @@ std::string memory(const std::function<void(std::FILE*)>& write) {
     return result;
 }
 
-class DigestTest : public ::testing::Test {
+class ReportDigestTest : public ::testing::Test {
 protected:
     std::int64_t addSession(const std::string& application, double from, std::optional<double> to,
                             const std::string& direction = "playback") {
@@ -81,7 +81,7 @@ protected:
     std::optional<Digest> digest_;
 };
 
-TEST_F(DigestTest, SumsUpWhatPlayedAndCaptured) {
+TEST_F(ReportDigestTest, SumsUpWhatPlayedAndCaptured) {
     const auto music = addSession("music", 0, 100);
     const auto call = addSession("call", 0, 100, "capture");
     addVolume(music, 10, 1, 0.5);
@@ -99,7 +99,7 @@ TEST_F(DigestTest, SumsUpWhatPlayedAndCaptured) {
     EXPECT_DOUBLE_EQ(digest.applications[1].capturedSeconds, 5);
 }
 
-TEST_F(DigestTest, AChangeOfVolumeBeginsAnotherStretch) {
+TEST_F(ReportDigestTest, AChangeOfVolumeBeginsAnotherStretch) {
     const auto music = addSession("music", 0, 100);
     addVolume(music, 10, 1, 0.5);
     addVolume(music, 20, 1, 0.25);
@@ -115,13 +115,13 @@ TEST_F(DigestTest, AChangeOfVolumeBeginsAnotherStretch) {
     EXPECT_EQ(stretches[1].volume, 0.25);
 }
 
-TEST_F(DigestTest, AStretchEndsWithItsSession) {
+TEST_F(ReportDigestTest, AStretchEndsWithItsSession) {
     addVolume(addSession("music", 0, 100), 90, 1, 1);
 
     EXPECT_DOUBLE_EQ(gather().playedSeconds, 10);
 }
 
-TEST_F(DigestTest, WhatLiesOutsideOfTheTimeAskedForIsCutOff) {
+TEST_F(ReportDigestTest, WhatLiesOutsideOfTheTimeAskedForIsCutOff) {
     const auto music = addSession("music", 0, 500);
     addVolume(music, 10, 1, 1);
     addGlitch(music, 50, 0.1, "memory");
@@ -136,7 +136,7 @@ TEST_F(DigestTest, WhatLiesOutsideOfTheTimeAskedForIsCutOff) {
     EXPECT_EQ(digest.tables.front().rows.taken(), 1U);
 }
 
-TEST_F(DigestTest, OnlyWantedApplicationsCount) {
+TEST_F(ReportDigestTest, OnlyWantedApplicationsCount) {
     addVolume(addSession("music", 0, 100), 50, 1, 1);
     addVolume(addSession("muzak", 0, 100), 10, 1, 1);
     store_.insert("analytics_event(name, payload, time)", "'e', '{}', 1795000001");
@@ -150,7 +150,7 @@ TEST_F(DigestTest, OnlyWantedApplicationsCount) {
     EXPECT_EQ(digest.tables.front().rows.taken(), 1U);
 }
 
-TEST_F(DigestTest, GlitchesAreSummedUpByAll) {
+TEST_F(ReportDigestTest, GlitchesAreSummedUpByAll) {
     const auto music = addSession("music", 0, 3600);
     addVolume(music, 0, 1, 1);
     addGlitch(music, 1, 0.25, "memory", ",\"glitch_device\":\"out\"");
@@ -170,7 +170,7 @@ TEST_F(DigestTest, GlitchesAreSummedUpByAll) {
     EXPECT_EQ(digest["glitches"].Size(), 3U);
 }
 
-TEST_F(DigestTest, TellsTheStatisticsOfASession) {
+TEST_F(ReportDigestTest, TellsTheStatisticsOfASession) {
     const auto music = addSession("music", 0, 100);
     add(music, 12, 16, 99, R"("out_Speaker_Simple_Cycles":8852,"audiotag":"x")");
     add(music, 12, 17, 99,
@@ -188,7 +188,7 @@ TEST_F(DigestTest, TellsTheStatisticsOfASession) {
     EXPECT_DOUBLE_EQ(digest["residencies"][0]["states"][0]["duty_cycle"].GetDouble(), 0.5);
 }
 
-TEST_F(DigestTest, ListsEveryRowOfEveryTable) {
+TEST_F(ReportDigestTest, ListsEveryRowOfEveryTable) {
     addVolume(addSession("music", 0, 100), 50, 1, 1);
     store_.insert("analytics_event(name, payload, time)", "'event', '{\"a\":1}', 1795000001");
     store_.insert("incident(signature, report, time)", "'{\"s\":2}', 'what', 1795000002");
@@ -202,7 +202,7 @@ TEST_F(DigestTest, ListsEveryRowOfEveryTable) {
     EXPECT_EQ(tables["metrics"]["rows"].Size(), 0U);
 }
 
-TEST_F(DigestTest, ListsKeepTheNewestAndSumsAreOfAll) {
+TEST_F(ReportDigestTest, ListsKeepTheNewestAndSumsAreOfAll) {
     limits_.sessions = 3;
     limits_.glitches = 2;
     limits_.stretches = 4;
@@ -229,14 +229,14 @@ TEST_F(DigestTest, ListsKeepTheNewestAndSumsAreOfAll) {
     EXPECT_EQ(digest["applications"][0]["sessions"].GetInt(), 8);
 }
 
-TEST_F(DigestTest, NamesAreCutBetweenLetters) {
+TEST_F(ReportDigestTest, NamesAreCutBetweenLetters) {
     EXPECT_EQ(shortName("short"), "short");
     EXPECT_EQ(shortName(std::string(120, 'a')), std::string(120, 'a'));
     EXPECT_EQ(shortName(std::string(119, 'a') + "ü"), std::string(119, 'a') + "…");
     EXPECT_EQ(shortName(std::string(118, 'a') + "üb"), std::string(118, 'a') + "ü…");
 }
 
-TEST_F(DigestTest, AHugeNameAndHugeEvidenceMakeNoHugeDigest) {
+TEST_F(ReportDigestTest, AHugeNameAndHugeEvidenceMakeNoHugeDigest) {
     const std::string huge(100'000, 'x');
     const auto session = addSession(huge, 0, 100);
     addVolume(session, 1, 1, 1);
@@ -250,7 +250,7 @@ TEST_F(DigestTest, AHugeNameAndHugeEvidenceMakeNoHugeDigest) {
     EXPECT_NE(digest.glitches.entries()[0].find("\"evidence\":null"), std::string::npos);
 }
 
-TEST_F(DigestTest, NoTextOfTheStoreEndsItsPlaceInThePage) {
+TEST_F(ReportDigestTest, NoTextOfTheStoreEndsItsPlaceInThePage) {
     const auto session = addSession("</script><img src=x onerror=alert(1)><!--", 0, 100);
     addGlitch(session, 2, 0.1, "<script>", ",\"node\":\"]]></ScRiPt>\"");
 
@@ -266,7 +266,7 @@ TEST_F(DigestTest, NoTextOfTheStoreEndsItsPlaceInThePage) {
     EXPECT_STREQ(document["glitches"][0]["node"].GetString(), "]]></ScRiPt>");
 }
 
-TEST_F(DigestTest, AnEmptyStoreMakesAPage) {
+TEST_F(ReportDigestTest, AnEmptyStoreMakesAPage) {
     const std::string text = page();
 
     EXPECT_TRUE(text.starts_with("<!DOCTYPE html>"));
