@@ -11,6 +11,7 @@
 
 #include "linux/queues/BlockingSection.h"
 #include "linux/system/CollectedFiles.h"
+#include "linux/system/PrivateFiles.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {
@@ -34,6 +35,7 @@ StoreOptions storeOptions(const std::filesystem::path& directory, const Settings
     options.path = directory / kStoreFile;
     options.limits = settings.store;
     options.marks = kStoreMarks;
+    options.onOpened = [directory] { (void)keepStorePrivate(directory); };
     options.onPressure = [&pressure](bool on) { pressure.set(Pressure::Store, on); };
     return options;
 }
@@ -81,8 +83,23 @@ LinuxPlatform::LinuxPlatform(Directories directories, platform::TraceMarks& trac
     makeServices(*configuration_.configuration.settings());
 }
 
+// What an earlier daemon, a service manager or an operator left behind as well.
+void LinuxPlatform::keepFilesPrivate(const Settings& settings) {
+    const std::string& name = settings.access.readers;
+    const auto readers = name.empty() ? std::nullopt : groupNumber(name);
+    if (!name.empty() && !readers) {
+        HY_LOG_ERROR(HYReportingPlatformCategory, "access.readers: there is no group {}", name);
+    }
+    setReaders(readers);
+    if (const auto kept = keepCollectedPrivate(directories_.state, directories_.logs); !kept.ok()) {
+        HY_LOG_ERROR(HYReportingPlatformCategory, "cannot set who may read: {}",
+                     kept.failure().message());
+    }
+}
+
 // What depends on the settings.
 void LinuxPlatform::makeServices(const Settings& settings) {
+    keepFilesPrivate(settings);
     queues_ = std::make_unique<Queues>(context_, pressure_);
     platform_.queues = queues_.get();
     store_ = std::make_unique<StoreServices>(storeOptions(directories_.state, settings, pressure_),
@@ -176,8 +193,12 @@ void LinuxPlatform::watchReloadSignal() {
 }
 
 void LinuxPlatform::observeConfiguration() {
-    configuration_.configuration.observe(
-        [this](const Settings&, const Settings& after) { applySettings(after); });
+    configuration_.configuration.observe([this](const Settings& before, const Settings& after) {
+        applySettings(after);
+        if (before.access.readers != after.access.readers) {
+            keepFilesPrivate(after);
+        }
+    });
     configuration_.announceChanges();
 }
 

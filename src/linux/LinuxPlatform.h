@@ -54,6 +54,7 @@ private:
     void purgeStore(const PurgeReply& reply, const Result<void>& incidents);
     void makeServices(const Settings& settings);
     LinuxHWReport::Options driverOptions();
+    void keepFilesPrivate(const Settings& settings);
     void applySettings(const Settings& settings);
     void watchStopSignals();
     void watchReloadSignal();

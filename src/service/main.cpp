@@ -4,6 +4,7 @@
 #include "halyard/halyard.h"
 #include "linux/LinuxPlatform.h"
 #include "linux/system/Directories.h"
+#include "linux/system/PrivateFiles.h"
 #include "platform/Log.h"
 #include "service/HYReportingServiceDelegate.h"
 
@@ -32,6 +33,7 @@ int main(int argc, char** /*argv*/) {
     if (argc > 1) {
         return fail("takes no arguments; see docs/configuration.md");
     }
+    linux_::makeNewFilesPrivate();
     const auto directories = linux_::resolveDirectories(linux_::processEnvironment, ::getuid());
     if (!directories.ok()) {
         return fail(directories.failure().message());

@@ -80,8 +80,14 @@ private:
         static constexpr Key kKeys[] = {
             {"users", &SettingsReader::readAccessList<&Access::users>},
             {"groups", &SettingsReader::readAccessList<&Access::groups>},
-            {"admin_users", &SettingsReader::readAccessList<&Access::adminUsers>}};
+            {"admin_users", &SettingsReader::readAccessList<&Access::adminUsers>},
+            {"readers", &SettingsReader::readReaders}};
         readSection(node, name, kKeys);
+    }
+    void readReaders(const toml::node& node, const std::string& name) {
+        if (auto group = text(node, name)) {
+            settings().access.readers = std::move(*group);
+        }
     }
     template <std::vector<std::string> Access::*list>
     void readAccessList(const toml::node& node, const std::string& name) {

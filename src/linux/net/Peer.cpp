@@ -92,6 +92,10 @@ Peer peerOfSocket(int socket) {
     return peer;
 }
 
+std::optional<std::uint32_t> groupNumber(const std::string& name) {
+    return gidOf(name);
+}
+
 Peer peerOfUser(std::uint32_t uid) {
     Peer peer;
     peer.uid = uid;

@@ -2,6 +2,7 @@
 #pragma once
 
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -13,6 +14,7 @@ struct Access {
     std::vector<std::string> users;
     std::vector<std::string> groups;
     std::vector<std::string> adminUsers;
+    std::string readers{}; // The group that may read what is kept; empty: none.
 
     bool operator==(const Access&) const = default;
 };
@@ -35,6 +37,9 @@ enum class PeerRights {
 
 // The kernel's record of who connected `socket`.
 Peer peerOfSocket(int socket);
+
+// By name, or by number in decimal.
+std::optional<std::uint32_t> groupNumber(const std::string& name);
 
 // The user with their groups, as the user database has them; may ask other machines.
 Peer peerOfUser(std::uint32_t uid);

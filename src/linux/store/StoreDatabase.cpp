@@ -12,6 +12,8 @@
 namespace halyard::linux_ {
 namespace {
 
+namespace fs = std::filesystem;
+
 std::string creationOfAll() {
     std::string sql;
     for (const StoreTableSchema& table : kStoreSchema) {
@@ -76,6 +78,13 @@ StoreDatabase::~StoreDatabase() {
 }
 
 StoreResult StoreDatabase::open() {
+    // The directory is the daemon's own: who planted a link there meant another file.
+    for (const char* companion : {"", "-wal", "-shm"}) {
+        std::error_code ignored;
+        if (fs::is_symlink(settings_.path.string() + companion, ignored)) {
+            return refusal(SQLITE_CANTOPEN_SYMLINK, "it is a symbolic link");
+        }
+    }
     if (versionInHeader(settings_.path) > kStoreSchemaVersion) {
         return newerSchema();
     }

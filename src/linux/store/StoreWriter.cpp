@@ -96,9 +96,17 @@ bool StoreWriter::open() {
 }
 
 StoreResult StoreWriter::openDatabase() {
-    StoreResult opened = database_.open();
+    StoreResult opened = openFile();
     if (!opened.ok() && opened.failure().isDamage()) {
         return replaceDamaged(opened.failure());
+    }
+    return opened;
+}
+
+StoreResult StoreWriter::openFile() {
+    StoreResult opened = database_.open();
+    if (opened.ok() && options_.onOpened) {
+        options_.onOpened();
     }
     return opened;
 }
@@ -114,7 +122,7 @@ StoreResult StoreWriter::replaceDamaged(const StoreFailure& damage) {
     }
     HY_LOG_ERROR(HYReportingPlatformCategory, "{} is damaged, set aside as {}: {}",
                  options_.path.string(), aside.value().filename().string(), damage.text);
-    StoreResult opened = database_.open();
+    StoreResult opened = openFile();
     if (opened.ok()) {
         carryOver(aside.value());
     }

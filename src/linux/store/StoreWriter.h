@@ -28,6 +28,8 @@ struct StoreOptions {
     StoreQueue::Marks marks;
     // Called from any thread that uses the store, never twice with the same value.
     StoreQueue::PressureHandler onPressure;
+    // Called on the thread that opens the file, each time that it was opened or made.
+    std::function<void()> onOpened;
 
     // A group is committed when it has this many rows, or this long after the
     // first of fewer came.
@@ -87,6 +89,7 @@ private:
     };
 
     StoreResult openDatabase();
+    StoreResult openFile();
     StoreResult replaceDamaged(const StoreFailure& damage);
     void carryOver(const std::filesystem::path& aside);
     void closeDatabase();

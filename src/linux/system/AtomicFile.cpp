@@ -6,6 +6,8 @@
 #include <unistd.h>
 #include <utility>
 
+#include "linux/system/PrivateFiles.h"
+
 namespace halyard::linux_ {
 namespace {
 
@@ -76,6 +78,9 @@ Result<void> AtomicFile::commit() {
     }
     if (std::ferror(stream_) != 0 && result_.ok()) {
         result_ = Failure{std::errc::io_error};
+    }
+    if (const auto shared = shareWithReaders(::fileno(stream_)); !shared.ok()) {
+        result_ = result_.ok() ? shared : result_;
     }
     if (std::fflush(stream_) != 0 || ::fsync(::fileno(stream_)) != 0) {
         failed();

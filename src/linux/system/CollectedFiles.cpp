@@ -5,6 +5,8 @@
 #include <system_error>
 #include <vector>
 
+#include "linux/system/PrivateFiles.h"
+
 namespace halyard::linux_ {
 namespace {
 
@@ -23,6 +25,19 @@ Result<void> removeWhole(const fs::path& path) {
     return {};
 }
 
+// The first failure, but for what has gone meanwhile or never was.
+void add(Result<void>& result, const Result<void>& next) {
+    const bool absent = !next.ok() && next.failure().code == std::errc::no_such_file_or_directory;
+    result = result.ok() && !absent ? next : result;
+}
+
+// A directory may be reached by a link of the operator's; what is in it may not.
+fs::path realPath(const fs::path& directory) {
+    std::error_code error;
+    fs::path real = fs::canonical(directory, error);
+    return error ? directory : real;
+}
+
 Result<void> removeAll(const std::vector<fs::path>& paths) {
     Result<void> result;
     for (const fs::path& path : paths) {
@@ -33,6 +48,30 @@ Result<void> removeAll(const std::vector<fs::path>& paths) {
 }
 
 } // namespace
+
+Result<void> keepStorePrivate(const fs::path& state) {
+    Result<void> result;
+    std::error_code error;
+    for (const fs::directory_entry& entry : fs::directory_iterator(state, error)) {
+        if (entry.path().filename().native().starts_with(kStoreFile)) {
+            add(result, keepPrivate(entry.path()));
+        }
+    }
+    return result;
+}
+
+Result<void> keepCollectedPrivate(const fs::path& state, const fs::path& logs) {
+    Result<void> result;
+    for (const fs::path& directory : {state, logs}) {
+        add(result, keepPrivate(realPath(directory)));
+    }
+    add(result, keepStorePrivate(state));
+    for (const fs::path& tree :
+         {state / kIncidentsFolder, logs / kSummariesFolder, logs / kTracesFolder}) {
+        add(result, keepTreePrivate(tree));
+    }
+    return result;
+}
 
 Result<void> removeCollectedState(const fs::path& state) {
     std::vector<fs::path> paths = {state / kIncidentsFolder};

@@ -13,6 +13,13 @@ namespace halyard::linux_ {
 inline constexpr const char* kStoreFile = "telemetry.db";
 inline constexpr const char* kIncidentsFolder = "incidents";
 
+// The store's file with what SQLite and repairs put beside it.
+Result<void> keepStorePrivate(const std::filesystem::path& state);
+// All that was collected in both directories, and the directories themselves, see
+// PrivateFiles.h. What else lies in them stays as it is.
+Result<void> keepCollectedPrivate(const std::filesystem::path& state,
+                                  const std::filesystem::path& logs);
+
 // Removes incidents and files of the store that were set aside. Links are removed and
 // not followed. Goes on after a failure, and tells of the first.
 Result<void> removeCollectedState(const std::filesystem::path& state);

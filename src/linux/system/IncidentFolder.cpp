@@ -11,6 +11,7 @@
 
 #include "common/Description.h"
 #include "common/Json.h"
+#include "linux/system/PrivateFiles.h"
 #include "linux/system/ProcessFacts.h"
 #include "platform/Log.h"
 
@@ -42,10 +43,7 @@ std::string safePart(std::string_view text) {
 }
 
 Result<void> makeFolder(const fs::path& folder) {
-    if (::mkdir(folder.c_str(), S_IRWXU) != 0) {
-        return Failure::ofErrno(folder.string());
-    }
-    return {};
+    return makePrivateDirectory(folder);
 }
 
 Result<void> writeFile(const fs::path& path, std::string_view text) {
@@ -189,7 +187,10 @@ void IncidentFolder::take(const Snapshot& snapshot) {
 // What the standard library throws ends here.
 Result<fs::path> IncidentFolder::write(const Snapshot& snapshot) const try {
     const fs::path& directory = options_.directory;
-    fs::create_directories(directory);
+    fs::create_directories(directory.parent_path());
+    if (const auto made = makePrivateDirectory(directory); !made.ok()) {
+        return made.failure();
+    }
     const fs::path unfinished = directory / kUnfinished;
     fs::remove_all(unfinished); // Of a daemon that was killed meanwhile.
     Result<void> filled = makeFolder(unfinished);
@@ -202,6 +203,9 @@ Result<fs::path> IncidentFolder::write(const Snapshot& snapshot) const try {
     const std::uint64_t number = folders.empty() ? 1 : folders.rbegin()->first + 1;
     const fs::path finished =
         directory / incidentFolderName(number, snapshot.time, snapshot.signature);
+    if (const auto kept = keepTreePrivate(unfinished); !kept.ok()) {
+        return kept.failure();
+    }
     fs::rename(unfinished, finished);
     removeOldest(directory, kKept);
     return finished;

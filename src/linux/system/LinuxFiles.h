@@ -21,6 +21,8 @@ public:
     MaybeError writeFileAtomically(std::string_view path, std::string_view contents) override;
 
 private:
+    bool isOwn(const std::filesystem::path& path) const;
+
     const Directories directories_;
 };
 

@@ -10,6 +10,7 @@
 #include "common/Description.h"
 #include "common/Utf8.h"
 #include "linux/system/AtomicFile.h"
+#include "linux/system/PrivateFiles.h"
 #include "linux/trace/TimelineFile.h"
 #include "platform/Log.h"
 
@@ -122,6 +123,9 @@ private:
 std::unique_ptr<platform::ResultsWriter>
 BenchmarkResultsFiles::open(std::string_view path, std::string_view name, std::uint32_t version) {
     const fs::path values = directories_.mapped(path);
+    if (!refuseLink(values.parent_path()).ok()) {
+        return nullptr;
+    }
     auto file = std::make_unique<AtomicFile>(values);
     auto timeline = std::make_unique<AtomicFile>(fs::path(values).replace_extension(".trace.json"));
     if (file->stream() == nullptr || timeline->stream() == nullptr) {

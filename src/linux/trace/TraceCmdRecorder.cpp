@@ -10,6 +10,7 @@
 #include "common/Mutex.h"
 #include "linux/system/ChildProcess.h"
 #include "linux/system/LinuxFiles.h"
+#include "linux/system/PrivateFiles.h"
 
 namespace halyard::linux_ {
 namespace {
@@ -57,7 +58,7 @@ private:
         return delegate_.lock();
     }
     std::vector<std::string> arguments() const;
-    void makeRoom() const;
+    Result<void> makeRoom() const;
     MaybeError record(ChildProcess& child);
     void removeInstance() const;
     void removeFiles() const;
@@ -93,9 +94,12 @@ std::vector<std::string> Recording::arguments() const {
 }
 
 // Removes the oldest traces; this one will be one more.
-void Recording::makeRoom() const {
+Result<void> Recording::makeRoom() const {
     std::error_code error;
-    fs::create_directories(options_.directory, error);
+    fs::create_directories(options_.directory.parent_path(), error);
+    if (const auto made = makePrivateDirectory(options_.directory); !made.ok()) {
+        return made;
+    }
     std::vector<std::pair<fs::file_time_type, fs::path>> traces;
     for (const auto& entry : fs::directory_iterator(options_.directory, error)) {
         if (entry.path().extension() == kExtension) {
@@ -106,6 +110,7 @@ void Recording::makeRoom() const {
     for (std::size_t i = 0; i + TraceCmdRecorder::kKept <= traces.size(); ++i) {
         fs::remove(traces[i].second, error);
     }
+    return {};
 }
 
 void Recording::fail(const Error& error) {
@@ -116,7 +121,10 @@ void Recording::fail(const Error& error) {
 }
 
 void Recording::run() {
-    makeRoom();
+    if (const auto room = makeRoom(); !room.ok()) {
+        fail(systemError(room.failure()));
+        return;
+    }
     ChildProcess child;
     if (const auto started = child.start(arguments()); !started.ok()) {
         fail(systemError({started.failure().code, options_.program}));
@@ -129,6 +137,8 @@ void Recording::run() {
     removeInstance();
     if (error) {
         removeFiles();
+    } else {
+        (void)keepPrivate(file_); // Readers or not: it is told where it lies.
     }
     if (const auto told = delegate()) {
         told->performanceTraceDidStop(error);
