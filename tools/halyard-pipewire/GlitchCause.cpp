@@ -66,7 +66,9 @@ double blockedSeconds(const CauseFacts& facts) {
 }
 
 bool isOverloaded(const CauseFacts& facts) {
-    const double own = facts.ownCycles * runningShare(facts.thread);
+    // What held it up may have been the work of several cycles, one after the other.
+    const double each = middle(facts.thread.cpu) / std::max(facts.missingSeconds, 1e-9);
+    const double own = std::min(facts.ownCycles * runningShare(facts.thread), each);
     return own + facts.othersCycles > 1 && own < 1 && facts.largestOther < 0.9 &&
            blockedSeconds(facts) < kMostOf * facts.heldSeconds &&
            facts.othersCpuSeconds.value_or(facts.missingSeconds) > 0.3 * facts.missingSeconds;

@@ -61,6 +61,22 @@ TEST(GlitchCauseTest, NodesThatTogetherTakeLongerThanACycleOverloadTheGraph) {
     EXPECT_EQ(causeName(facts), "unknown");
 }
 
+TEST(GlitchCauseTest, WorkOfSeveralCyclesInARowIsNotThatOfOne) {
+    CauseFacts facts = held();
+    facts.missingSeconds = 0.1; // five cycles, of each of which it worked 12 ms
+    facts.heldSeconds = 0.16;
+    facts.thread.cpu = Range{0.06, 0.06};
+    facts.thread.delay = Range{0.09, 0.09};
+    facts.ownCycles = 2.8;
+    facts.othersCycles = 0.8;
+    facts.largestOther = 0.5;
+    facts.othersCpuSeconds = 0.1;
+    EXPECT_EQ(causeName(facts), "graph_overloaded");
+    facts.thread.cpu = Range{0.11, 0.11}; // more than a cycle in each: too slow by itself
+    facts.thread.delay = Range{};
+    EXPECT_EQ(causeName(facts), "client_slow");
+}
+
 TEST(GlitchCauseTest, OthersThatWereOnlyPreemptedDoNotOverloadTheGraph) {
     CauseFacts facts = held();
     facts.thread.delay = Range{0.045, 0.05};
