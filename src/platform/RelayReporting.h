@@ -32,6 +32,21 @@ inline constexpr std::string_view kRelayReportingUserInfoClientName =
 inline constexpr std::string_view kRelayReportingUserInfoServiceName =
     "kRelayReportingUserInfoServiceName";
 
+// Messages of one kind that were dropped because they said again what the last one
+// that was accepted had said. Times in seconds since 1970.
+struct Repeats {
+    std::uint32_t category = 0;
+    std::uint32_t type = 0;
+    std::uint64_t count = 0;
+    double first = 0;
+    double last = 0;
+};
+
+enum class UploadEnding : std::uint8_t {
+    Stopped,      // By the client that owned it.
+    Disconnected, // The client was lost, or the daemon was told to end.
+};
+
 // One upload session. Dropping the last reference closes it.
 class RelayReporting {
 public:
@@ -45,6 +60,10 @@ public:
     // Must not block: what cannot be taken at once is an error.
     [[nodiscard]] virtual MaybeError
     sendMessageWithCategory(std::uint16_t category, std::uint32_t type, Dictionary payload) = 0;
+    // Repeats that are over: before the message that ended them, or at the end.
+    virtual void noteRepeats(const Repeats& repeats) = 0;
+    // How it is about to end; Stopped where nobody says.
+    virtual void noteEnding(UploadEnding ending) = 0;
     virtual void flushMessages() = 0;
     virtual std::string description() const = 0;
 };

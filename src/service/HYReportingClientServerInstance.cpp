@@ -261,6 +261,7 @@ void HYReportingClientServerInstance::destroy(Delegate& delegate, std::int64_t r
 // on another thread and any time later.
 void HYReportingClientServerInstance::retire(Delegate& delegate, HYReportingSession& session) {
     session.exchangeTransactionCompleteBlock(nullptr);
+    session.relayRepeats(); // Of one that was replaced while it ran.
     delegate.sessionRetired(session);
 }
 
@@ -314,7 +315,7 @@ void HYReportingClientServerInstance::leave(Delegate& delegate) {
     }
     for (const auto& [reporterID, session] : sessions) {
         if (session->started()) {
-            session->stop();
+            session->stop(platform::UploadEnding::Disconnected);
         }
         retire(delegate, *session);
     }

@@ -122,7 +122,7 @@ void HYReportingSession::start() {
     trace_->start();
 }
 
-void HYReportingSession::stop() {
+void HYReportingSession::stop(platform::UploadEnding ending) {
     onServiceQueue_.check();
     HY_LOG_DEBUG(HYReportingSessionCategory, "ending session {}", reporterID_);
     if (!started()) {
@@ -134,8 +134,9 @@ void HYReportingSession::stop() {
     sendVolumeEvents();
     writeSummaryJson();
     sendSummaryEvent();
+    relayRepeats();
     if (relayReportingEnabled()) {
-        upload_.stop(shared_from_this());
+        upload_.stop(shared_from_this(), ending);
     }
     trace_->stop();
     batch_.stop();
@@ -188,6 +189,14 @@ void HYReportingSession::sendSummaryEvent() {
     }
 }
 
+void HYReportingSession::relayRepeats() {
+    if (relayReportingEnabled()) {
+        for (const platform::Repeats& repeats : batch_.takeAllRepeats()) {
+            upload_.relay(shared_from_this(), repeats);
+        }
+    }
+}
+
 void HYReportingSession::sendMessage(Dictionary message, AudioEventCategory category,
                                      AudioEventType type, bool /*sync*/, const SendReply& reply) {
     onServiceQueue_.check();
@@ -198,11 +207,14 @@ void HYReportingSession::sendMessage(Dictionary message, AudioEventCategory cate
         HYReportingUtilityAddAudioMessageTag(
             HYReportingUtilityRemoveWhiteSpaceFromKeys(std::move(message)), category, type),
         category, type};
-    const bool redundant =
+    const auto [redundant, repeats] =
         batch_.createMessageIdentifierWithCategory(category, type, tagged.payload);
     mark(kMessageMark);
     const bool wasStarted = started();
     if (relayReportingEnabled()) {
+        if (repeats) {
+            upload_.relay(shared_from_this(), *repeats);
+        }
         upload_.relay(shared_from_this(),
                       {std::move(tagged), std::move(original), wasStarted, redundant});
     }

@@ -51,8 +51,10 @@ public:
     // Starting a started session and stopping one that is not are no-ops. A stop
     // blocks until the trace, if there is one, is complete.
     void start();
-    void stop();
+    void stop(platform::UploadEnding ending = platform::UploadEnding::Stopped);
     bool started() const { return batch_.started(); }
+    // Tells the upload what was repeated so far, for a session that nobody will stop.
+    void relayRepeats();
 
     void setServiceType(AudioServiceType type);
     // Merges; null is ignored. Never removes a key.

@@ -77,6 +77,36 @@ bool MessageBatch::addUnlessRedundant(AudioEventCategory category, AudioEventTyp
     return false;
 }
 
+std::optional<platform::Repeats> MessageBatch::noteRepeat(AudioEventCategory category,
+                                                          AudioEventType type, double time) {
+    platform::Repeats& repeats = lastKind_->second.repeats;
+    std::optional<platform::Repeats> others;
+    if (repeats.count > 0 && (repeats.category != category || repeats.type != type)) {
+        others = takeRepeats();
+    }
+    if (repeats.count == 0) {
+        repeats = {category, type, 0, time, time};
+    }
+    ++repeats.count;
+    repeats.last = time;
+    return others;
+}
+
+std::optional<platform::Repeats> MessageBatch::takeRepeats() {
+    platform::Repeats& repeats = lastKind_->second.repeats;
+    return repeats.count > 0 ? std::optional(std::exchange(repeats, {})) : std::nullopt;
+}
+
+std::vector<platform::Repeats> MessageBatch::takeAllRepeats() {
+    std::vector<platform::Repeats> all;
+    for (auto& [base, kind] : kinds_) {
+        if (kind.repeats.count > 0) {
+            all.push_back(std::exchange(kind.repeats, {}));
+        }
+    }
+    return all;
+}
+
 std::uint32_t MessageBatch::countFor(std::string_view base) const {
     const auto kind = kinds_.find(base);
     return kind != kinds_.end() ? kind->second.count : 0;

@@ -24,6 +24,7 @@
 
 #include "common/HYReportingUtility.h"
 #include "common/Value.h"
+#include "platform/RelayReporting.h"
 #include "session/SessionEvents.h"
 
 namespace halyard {
@@ -53,6 +54,15 @@ public:
     [[nodiscard]] bool addUnlessRedundant(AudioEventCategory category, AudioEventType type,
                                           const Dictionary& message);
 
+    // Requires that the message added last was redundant. Counts it among the repeats
+    // of its kind; what these were before, when they bore other numbers of one name.
+    std::optional<platform::Repeats> noteRepeat(AudioEventCategory category, AudioEventType type,
+                                                double time);
+    // The repeats of the last added message's kind, which are over if it was accepted.
+    std::optional<platform::Repeats> takeRepeats();
+    // Those of all kinds.
+    std::vector<platform::Repeats> takeAllRepeats();
+
     bool empty() const { return summary_.empty(); }
     // 0 for a base identifier that has not been seen.
     std::uint32_t countFor(std::string_view base) const;
@@ -69,6 +79,7 @@ private:
     struct Kind {
         std::uint32_t count = 0;
         Dictionary last; // the newest accepted message
+        platform::Repeats repeats;
     };
 
     using Kinds = std::map<std::string, Kind, std::less<>>;

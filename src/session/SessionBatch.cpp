@@ -3,7 +3,9 @@
 #include <utility>
 
 #include "common/Json.h"
+#include "platform/Clock.h"
 #include "platform/Log.h"
+#include "platform/Platform.h"
 #include "session/SummaryFile.h"
 
 namespace halyard {
@@ -21,16 +23,25 @@ void SessionBatch::stop() {
     started_.store(false);
 }
 
-bool SessionBatch::createMessageIdentifierWithCategory(AudioEventCategory category,
-                                                       AudioEventType type,
-                                                       const Dictionary& message) {
+SessionBatch::Verdict SessionBatch::createMessageIdentifierWithCategory(AudioEventCategory category,
+                                                                        AudioEventType type,
+                                                                        const Dictionary& message) {
     const MutexLock lock(mutex_);
-    if (batch_ == nullptr || !batch_->addUnlessRedundant(category, type, message)) {
-        return false;
+    if (batch_ == nullptr) {
+        return {};
+    }
+    if (!batch_->addUnlessRedundant(category, type, message)) {
+        return {false, batch_->takeRepeats()};
     }
     redundantMessages_.fetch_add(1, std::memory_order_relaxed);
     HY_LOG_DEBUG(HYReportingSessionCategory, "dropping redundant event");
-    return true;
+    const double now = platform::secondsSince1970(platform::current().clock->wallTime());
+    return {true, batch_->noteRepeat(category, type, now)};
+}
+
+std::vector<platform::Repeats> SessionBatch::takeAllRepeats() {
+    const MutexLock lock(mutex_);
+    return batch_ != nullptr ? batch_->takeAllRepeats() : std::vector<platform::Repeats>();
 }
 
 std::vector<Dictionary> SessionBatch::volumeMessages() const {

@@ -25,17 +25,25 @@ public:
         Dictionary message;
     };
 
+    struct Verdict {
+        bool redundant = false;
+        // Repeats that this message put an end to.
+        std::optional<platform::Repeats> repeats;
+    };
+
     bool started() const { return started_.load(); }
     // With an empty batch, whatever there was before.
     void start(const MessageBatch::Options& options) HY_EXCLUDES(mutex_);
     void stop() HY_EXCLUDES(mutex_);
 
-    // Records the message unless it is redundant; true when it was. Without a
-    // batch nothing is recorded, and nothing is redundant.
-    [[nodiscard]] bool createMessageIdentifierWithCategory(AudioEventCategory category,
-                                                           AudioEventType type,
-                                                           const Dictionary& message)
+    // Records the message unless it is redundant. Without a batch nothing is recorded,
+    // and nothing is redundant.
+    [[nodiscard]] Verdict createMessageIdentifierWithCategory(AudioEventCategory category,
+                                                              AudioEventType type,
+                                                              const Dictionary& message)
         HY_EXCLUDES(mutex_);
+    // Those that nothing has put an end to.
+    std::vector<platform::Repeats> takeAllRepeats() HY_EXCLUDES(mutex_);
     // Redundant messages of all batches.
     std::uint64_t redundantMessages() const { return redundantMessages_.load(); }
 

@@ -13,8 +13,10 @@ using ::testing::SizeIs;
 class SessionBatchTest : public ::testing::Test {
 protected:
     bool add(const Dictionary& message) {
-        return batch_.createMessageIdentifierWithCategory(kAudioEventCategoryPlayback,
-                                                          kAudioEventTypeStart, message);
+        return batch_
+            .createMessageIdentifierWithCategory(kAudioEventCategoryPlayback, kAudioEventTypeStart,
+                                                 message)
+            .redundant;
     }
 
     testing::TestPlatform platform_;

@@ -137,18 +137,22 @@ bool Upload::hasSession() const {
     return relayReportingSession_ != nullptr;
 }
 
-void Upload::stop(Session session) {
+void Upload::stop(Session session, UploadEnding ending) {
     relayReportingQueue()->async(
-        [self = kept(std::move(session))] { self->closeRelayReporting(); });
+        [self = kept(std::move(session)), ending] { self->closeRelayReporting(ending); });
 }
 
-void Upload::closeRelayReporting() {
+void Upload::closeRelayReporting(UploadEnding ending) {
     HY_LOG_DEBUG(HYReportingSessionRelayReportingCategory, "entering relayreporting {}", __func__);
+    const auto upload = relayReportingSession();
+    if (upload != nullptr) {
+        upload->noteEnding(ending); // Whoever closes it.
+    }
     if (!HYReportingUtilityAllowSessionTransactions() ||
         session_.serviceType() == kAudioServiceTypeTest) {
         return;
     }
-    if (const auto upload = relayReportingSession()) {
+    if (upload != nullptr) {
         upload->flushMessages();
     }
     dropRelayReportingSession();
@@ -161,6 +165,15 @@ void Upload::relay(Session session, Delivery delivery) {
         [self = kept(std::move(session)), delivery = std::move(delivery)]() mutable {
             self->deliver(std::move(delivery));
         });
+}
+
+void Upload::relay(Session session, const Repeats& repeats) {
+    relayReportingQueue()->async([self = kept(std::move(session)), repeats] {
+        const auto upload = self->relayReportingSession();
+        if (upload != nullptr && self->relayReportingSessionStarted_.load()) {
+            upload->noteRepeats(repeats);
+        }
+    });
 }
 
 void Upload::deliver(Delivery delivery) {

@@ -50,11 +50,12 @@ public:
     bool enabled() const { return enabled_.load(); }
     void setEnabled(bool enabled) { enabled_.store(enabled); }
 
-    // Queue an opening, a delivery and a closing. All are handed the session that
+    // Queue an opening, a delivery, word of repeats and a closing. All are handed the session that
     // owns this. The upload session is told what its session is now.
     void start(Session session) HY_EXCLUDES(mutex_);
     void relay(Session session, Delivery delivery) HY_EXCLUDES(mutex_);
-    void stop(Session session) HY_EXCLUDES(mutex_);
+    void relay(Session session, const platform::Repeats& repeats) HY_EXCLUDES(mutex_);
+    void stop(Session session, platform::UploadEnding ending) HY_EXCLUDES(mutex_);
 
     // Whether back ends were found; the flag itself, not a copy.
     const std::atomic<bool>& startedState() const { return relayReportingSessionStarted_; }
@@ -72,7 +73,7 @@ private:
     void openRelayReporting(const std::shared_ptr<Upload>& self, const Opening& opening);
     void finishOpening(bool signalled);
     void deliver(Delivery delivery);
-    void closeRelayReporting();
+    void closeRelayReporting(platform::UploadEnding ending);
     void dropRelayReportingSession() HY_EXCLUDES(mutex_);
 
     // On a thread of the upload framework.

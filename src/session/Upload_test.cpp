@@ -42,7 +42,7 @@ protected:
 TEST_F(UploadTest, OpensDeliversAndClosesInTheOrderOfTheCalls) {
     owner_->upload.start(owner_);
     relay(1);
-    owner_->upload.stop(owner_);
+    owner_->upload.stop(owner_, platform::UploadEnding::Stopped);
     relay(2);
     run();
     ASSERT_THAT(uploads(), SizeIs(1));

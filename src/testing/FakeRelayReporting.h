@@ -24,6 +24,8 @@ public:
         Dictionary userInfo;
         platform::RelayReporting::BackendHandler answer;
         std::vector<Message> messages;
+        std::vector<platform::Repeats> repeats;
+        platform::UploadEnding ending = platform::UploadEnding::Stopped;
         int flushes = 0;
         bool closed = false;
     };
@@ -91,6 +93,10 @@ private:
             upload_->messages.push_back({category, type, std::move(payload)});
             return std::nullopt;
         }
+        void noteRepeats(const platform::Repeats& repeats) override {
+            upload_->repeats.push_back(repeats);
+        }
+        void noteEnding(platform::UploadEnding ending) override { upload_->ending = ending; }
         void flushMessages() override { ++upload_->flushes; }
         std::string description() const override { return "upload"; }
 

@@ -15,7 +15,7 @@
 namespace halyard::linux_ {
 
 // `PRAGMA user_version`.
-inline constexpr std::int64_t kStoreSchemaVersion = 1;
+inline constexpr std::int64_t kStoreSchemaVersion = 2;
 
 struct StoreColumn {
     // What every row that the daemon wrote has there.
@@ -34,12 +34,15 @@ enum class StoreTable : std::uint8_t {
     EnergyEvent,
     Metric,
     Incident,
+    Repeat,
 };
 
 struct StoreTableSchema {
     std::string_view name;
     // Without the first, which is `id INTEGER PRIMARY KEY` in every table.
     std::span<const StoreColumn> columns;
+    // The schema version that brought it.
+    std::int64_t since = 1;
 };
 
 namespace store_columns {
@@ -50,7 +53,8 @@ inline constexpr StoreColumn kUploadSession[] = {{"session_id", "INTEGER"},
                                                  {"session_info", "TEXT", Holds::Json},
                                                  {"user_info", "TEXT", Holds::Json},
                                                  {"opened", "REAL"},
-                                                 {"closed", "REAL"}};
+                                                 {"closed", "REAL"},
+                                                 {"ended", "TEXT"}};
 inline constexpr StoreColumn kUploadMessage[] = {{"upload_session", "INTEGER"},
                                                  {"session_info", "TEXT", Holds::JsonOrNull},
                                                  {"user_info", "TEXT", Holds::JsonOrNull},
@@ -66,17 +70,29 @@ inline constexpr StoreColumn kMetric[] = {
     {"metric_id", "INTEGER", Holds::Integer}, {"message", "BLOB"}, {"time", "REAL"}};
 inline constexpr StoreColumn kIncident[] = {
     {"signature", "TEXT", Holds::Json}, {"report", "TEXT"}, {"time", "REAL"}};
+inline constexpr StoreColumn kRepeat[] = {{"upload_session", "INTEGER", Holds::Integer},
+                                          {"category", "INTEGER", Holds::Integer},
+                                          {"type", "INTEGER", Holds::Integer},
+                                          {"count", "INTEGER", Holds::Integer},
+                                          {"first", "REAL"},
+                                          {"last", "REAL"}};
 
 } // namespace store_columns
 
-inline constexpr std::size_t kStoreTables = 6;
+inline constexpr std::size_t kStoreTables = 7;
 inline constexpr std::array<StoreTableSchema, kStoreTables> kStoreSchema = {
     {{"upload_session", store_columns::kUploadSession},
      {"upload_message", store_columns::kUploadMessage},
      {"analytics_event", store_columns::kAnalyticsEvent},
      {"energy_event", store_columns::kEnergyEvent},
      {"metric", store_columns::kMetric},
-     {"incident", store_columns::kIncident}}};
+     {"incident", store_columns::kIncident},
+     {"repeat", store_columns::kRepeat, 2}}};
+
+// The values of upload_session.ended; NULL while it is open.
+inline constexpr std::string_view kEndedStopped = "stopped";
+inline constexpr std::string_view kEndedDisconnected = "disconnected";
+inline constexpr std::string_view kEndedInterrupted = "interrupted";
 
 constexpr const StoreTableSchema& storeSchema(StoreTable table) {
     return kStoreSchema[static_cast<std::size_t>(table)];

@@ -159,13 +159,13 @@ StoreUploadPtr Store::openUpload(std::int64_t sessionID, const Dictionary& sessi
     return upload;
 }
 
-void Store::closeUpload(const StoreUploadPtr& upload) {
+void Store::closeUpload(const StoreUploadPtr& upload, platform::UploadEnding ending) {
     // One that got no row so far gets it now, or is counted as lost.
     if (!upload->accepted) {
         upload->accepted = queue_->push(StoreOpenRow{upload});
     }
     if (upload->accepted) {
-        queue_->pushAlways(StoreCloseRow{upload, now()});
+        queue_->pushAlways(StoreCloseRow{upload, ending, now()});
     }
 }
 
@@ -174,6 +174,14 @@ bool Store::addMessage(const StoreUploadPtr& upload, std::uint16_t category, std
     const bool taken =
         queue_->push(StoreMessageRow{upload, std::move(payload), type, category, now()});
     if (taken && !upload->accepted.load(std::memory_order_relaxed)) {
+        upload->accepted = true;
+    }
+    return taken;
+}
+
+bool Store::addRepeats(const StoreUploadPtr& upload, const platform::Repeats& repeats) {
+    const bool taken = queue_->push(StoreRepeatRow{upload, repeats});
+    if (taken) {
         upload->accepted = true;
     }
     return taken;

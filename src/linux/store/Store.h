@@ -43,12 +43,14 @@ public:
     StoreUploadPtr openUpload(std::int64_t sessionID, const Dictionary& sessionInfo,
                               const Dictionary& userInfo);
     // Requires that nothing more is added to it.
-    void closeUpload(const StoreUploadPtr& upload);
+    void closeUpload(const StoreUploadPtr& upload,
+                     platform::UploadEnding ending = platform::UploadEnding::Stopped);
 
     // False when the row was dropped, which happens only while nothing can be
     // written.
     [[nodiscard]] bool addMessage(const StoreUploadPtr& upload, std::uint16_t category,
                                   std::uint32_t type, Dictionary payload);
+    bool addRepeats(const StoreUploadPtr& upload, const platform::Repeats& repeats);
     [[nodiscard]] bool addSingleMessage(const Dictionary& sessionInfo, const Dictionary& userInfo,
                                         std::uint16_t category, std::uint32_t type,
                                         const Dictionary& payload);

@@ -23,7 +23,24 @@ std::string creationOfAll() {
 }
 
 // What takes a file of schema N + 1 to N + 2; a new file gets the last at once.
-constexpr std::array<const char*, kStoreSchemaVersion - 1> kMigrations = {};
+// Each says itself what it makes: the schema that is written down is the last one's.
+constexpr std::array<const char*, kStoreSchemaVersion - 1> kMigrations = {
+    "ALTER TABLE upload_session ADD COLUMN ended TEXT;"
+    "UPDATE upload_session SET ended = 'stopped' WHERE closed IS NOT NULL;"
+    "CREATE TABLE repeat(id INTEGER PRIMARY KEY, upload_session INTEGER, category INTEGER, "
+    "type INTEGER, count INTEGER, first REAL, last REAL);"};
+
+// Sessions that no run closed. One pass over the messages, and only where there are any;
+// of the columns beside max(id) SQLite takes that row's.
+constexpr const char* kCloseInterrupted =
+    "WITH last AS (SELECT upload_session, max(id), time FROM upload_message WHERE upload_session "
+    "IN (SELECT id FROM upload_session WHERE closed IS NULL) GROUP BY upload_session) "
+    "UPDATE upload_session SET ended = 'interrupted', closed = coalesce((SELECT time FROM last "
+    "WHERE upload_session = upload_session.id), opened) WHERE closed IS NULL";
+
+std::string_view nameOf(platform::UploadEnding ending) {
+    return ending == platform::UploadEnding::Disconnected ? kEndedDisconnected : kEndedStopped;
+}
 
 // The size of pages counts for new files only. Twice SQLite's saves a good part of
 // the writes to log and file, and the least commit is still small.
@@ -122,8 +139,7 @@ StoreResult StoreDatabase::openFile() {
         result = result.ok() ? (this->*step)() : result;
     }
     ++generation_;
-    firstUpload_ = firstUpload_ == 0 ? nextID_[0] : firstUpload_;
-    return result;
+    return result.ok() && firstUpload_ == 0 ? takeOver() : result;
 }
 
 StoreResult StoreDatabase::configure() {
@@ -174,10 +190,16 @@ StoreResult StoreDatabase::migrate() {
     if (version == 0) {
         sql += creationOfAll();
     }
-    for (auto step = std::max<std::int64_t>(version, 1); step < kStoreSchemaVersion; ++step) {
+    for (auto step = version; step > 0 && step < kStoreSchemaVersion; ++step) {
         sql += kMigrations.at(static_cast<std::size_t>(step - 1));
     }
-    return execute(fmt::format("{}PRAGMA user_version = {}; COMMIT", sql, kStoreSchemaVersion));
+    StoreResult done =
+        execute(fmt::format("{}PRAGMA user_version = {}; COMMIT", sql, kStoreSchemaVersion));
+    // Tables of another shape than that version's are as good as damaged.
+    if (!done.ok() && done.failure().primary() == SQLITE_ERROR) {
+        return refusal(SQLITE_CORRUPT, done.failure().text);
+    }
+    return done;
 }
 
 StoreResult StoreDatabase::prepare() {
@@ -190,7 +212,7 @@ StoreResult StoreDatabase::prepare() {
     for (std::size_t i = 0; i < kStoreTables; ++i) {
         add(inserts_[i], storeInsert(kStoreSchema[i], "INSERT"));
     }
-    add(closeUpload_, "UPDATE upload_session SET closed = ? WHERE id = ?");
+    add(closeUpload_, "UPDATE upload_session SET closed = ?, ended = ? WHERE id = ?");
     add(findUpload_, "SELECT 1 FROM upload_session WHERE id = ? AND session_id IS ?");
     add(begin_, "BEGIN IMMEDIATE");
     add(commit_, "COMMIT");
@@ -211,6 +233,23 @@ StoreResult StoreDatabase::refreshIds() {
         nextID_[i] = std::max(nextID_[i], newest.value() + 1);
     }
     return {};
+}
+
+StoreResult StoreDatabase::takeOver() {
+    StoreResult refreshed = refreshIds();
+    if (!refreshed.ok() || wroteUpload_) {
+        return refreshed;
+    }
+    firstUpload_ = nextID_[0];
+    return closeInterrupted();
+}
+
+StoreResult StoreDatabase::closeInterrupted() {
+    const auto open = query("SELECT count(*) FROM upload_session WHERE closed IS NULL");
+    if (!open.ok()) {
+        return open.failure();
+    }
+    return open.value() == 0 ? StoreResult() : execute(kCloseInterrupted);
 }
 
 StoreResult StoreDatabase::readPageCounts() {
@@ -381,12 +420,13 @@ StoreResult StoreDatabase::ensureUpload(const StoreUploadPtr& upload) {
     if (upload->row != 0) {
         return {};
     }
-    StoreResult inserted = insertInto(StoreTable::UploadSession, upload->sessionID,
-                                      sessionInfo_.write(upload->sessionInfo),
-                                      userInfo_.write(upload->userInfo), upload->opened, nullptr);
+    StoreResult inserted = insertInto(
+        StoreTable::UploadSession, upload->sessionID, sessionInfo_.write(upload->sessionInfo),
+        userInfo_.write(upload->userInfo), upload->opened, nullptr, nullptr);
     if (!inserted.ok()) {
         return inserted;
     }
+    wroteUpload_ = true;
     upload->row = nextID_[static_cast<std::size_t>(StoreTable::UploadSession)] - 1;
     upload->generation = generation_;
     groupUploads_.push_back(upload);
@@ -401,7 +441,7 @@ StoreResult StoreDatabase::insert(const StoreCloseRow& row) {
     if (StoreResult done = ensureUpload(row.upload); !done.ok()) {
         return done;
     }
-    closeUpload_.bindFrom(1, row.time, row.upload->row);
+    closeUpload_.bindFrom(1, row.time, nameOf(row.ending), row.upload->row);
     return resultOf(closeUpload_.run());
 }
 
@@ -439,6 +479,16 @@ StoreResult StoreDatabase::insert(const StoreIncidentRow& row) {
     const std::string report = replaceInvalidUtf8(row.report.text());
     return insertInto(StoreTable::Incident, payload_.write(row.signature), std::string_view(report),
                       row.time);
+}
+
+StoreResult StoreDatabase::insert(const StoreRepeatRow& row) {
+    if (StoreResult done = ensureUpload(row.upload); !done.ok()) {
+        return done;
+    }
+    const platform::Repeats& repeats = row.repeats;
+    return insertInto(StoreTable::Repeat, row.upload->row, std::int64_t{repeats.category},
+                      std::int64_t{repeats.type}, static_cast<std::int64_t>(repeats.count),
+                      repeats.first, repeats.last);
 }
 
 } // namespace halyard::linux_

@@ -64,6 +64,7 @@ public:
     StoreResult insert(const StoreEnergyRow& row);
     StoreResult insert(const StoreMetricRow& row);
     StoreResult insert(const StoreIncidentRow& row);
+    StoreResult insert(const StoreRepeatRow& row);
     // Rolls back when it fails.
     StoreResult commit();
     void rollback();
@@ -87,8 +88,9 @@ public:
     StoreResult resultOf(int code) const;
     // The first upload session of this run, to tell those that nobody will close.
     std::int64_t firstUploadOfRun() const { return firstUpload_; }
-    // After rows were brought in from elsewhere.
-    StoreResult refreshIds();
+    // After rows were brought in from elsewhere, of an earlier run unless this one has
+    // written a session already.
+    StoreResult takeOver();
 
 private:
     StoreResult openFile();
@@ -96,6 +98,8 @@ private:
     StoreResult migrate();
     StoreResult check();
     StoreResult prepare();
+    StoreResult refreshIds();
+    StoreResult closeInterrupted();
     StoreResult execute(const std::string& sql);
     Result<std::int64_t, StoreFailure> query(std::string_view sql);
     StoreResult readPageCounts();
@@ -119,6 +123,7 @@ private:
     RowCounts committedRows_{};
     std::vector<StoreUploadPtr> groupUploads_;
     std::int64_t firstUpload_ = 0;
+    bool wroteUpload_ = false;
     std::uint64_t generation_ = 0;
     std::uint64_t pageSize_ = 0;
     std::uint64_t pageCount_ = 0;

@@ -200,7 +200,7 @@ TEST_F(StoreFailureTest, WhyAFileInItsPlaceIsNotTakenIsTold) {
     for (const char* end : {"", "-wal", "-shm"}) {
         std::filesystem::remove(options_.path.string() + end);
     }
-    reader().rows("PRAGMA user_version = 2");
+    reader().rows("PRAGMA user_version = 3");
     addSingles(1, {});
     store_->flush([] {});
     EXPECT_NE(log_.waitFor("cannot write").find("its schema is newer than this program"),

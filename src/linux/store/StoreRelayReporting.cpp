@@ -31,7 +31,7 @@ public:
     Session(Store& store, StoreUploadPtr upload) : store_(store), upload_(std::move(upload)) {}
     ~Session() override {
         if (upload_ != nullptr) {
-            store_.closeUpload(upload_);
+            store_.closeUpload(upload_, ending_);
         }
     }
 
@@ -48,6 +48,12 @@ public:
             upload_ != nullptr && store_.addMessage(upload_, category, type, std::move(payload));
         return taken ? MaybeError() : notTaken(store_);
     }
+    void noteRepeats(const Repeats& repeats) override {
+        if (upload_ != nullptr) {
+            (void)store_.addRepeats(upload_, repeats); // What is lost of these is counted there.
+        }
+    }
+    void noteEnding(UploadEnding ending) override { ending_ = ending; }
     // Every row is committed within moments anyway; a commit of its own for each
     // session that stops would only cost the others.
     void flushMessages() override {}
@@ -59,6 +65,7 @@ public:
 private:
     Store& store_;
     const StoreUploadPtr upload_;
+    UploadEnding ending_ = UploadEnding::Stopped;
 };
 
 } // namespace

@@ -46,6 +46,9 @@ constexpr std::int64_t kSlackShare = 16;
 // old as its end, and has none while it is open; one that an earlier run left open
 // (its id is below ?2) ended when this run began (?3).
 std::string_view ageOf(std::size_t table) {
+    if (table == static_cast<std::size_t>(StoreTable::Repeat)) {
+        return "last";
+    }
     return table == static_cast<std::size_t>(StoreTable::UploadSession)
                ? "coalesce(closed, CASE WHEN id < ?2 THEN ?3 END)"
                : "time";

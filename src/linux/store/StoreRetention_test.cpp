@@ -104,6 +104,21 @@ TEST_F(StoreRetentionTest, AnOpenSessionStaysAndAClosedOneGoesWithItsMessages) {
               "1");
 }
 
+TEST_F(StoreRetentionTest, RepeatsGoWithTheirAge) {
+    open();
+    const auto upload = store_->openUpload(4, {}, {});
+    const double now = platform::secondsSince1970(clock_.wallTime());
+    EXPECT_TRUE(store_->addRepeats(upload, {1, 1, 5, now, now}));
+    flush();
+    clock_.advance(options_.limits.maxAge - 60s);
+    EXPECT_TRUE(store_->addRepeats(upload, {1, 1, 7, now, now + 1000}));
+    commitOne();
+    EXPECT_EQ(reader().number("SELECT count(*) FROM repeat"), 2);
+    clock_.advance(2 * 60s);
+    commitOne();
+    EXPECT_EQ(reader().one("SELECT count FROM repeat"), "7");
+}
+
 TEST_F(StoreRetentionTest, ASessionThatACrashLeftOpenGoesToo) {
     {
         open();
@@ -112,7 +127,7 @@ TEST_F(StoreRetentionTest, ASessionThatACrashLeftOpenGoesToo) {
     }
     clock_.advance(1s);
     open();
-    EXPECT_EQ(reader().number("SELECT count(*) FROM upload_session WHERE closed IS NULL"), 1);
+    EXPECT_EQ(reader().one("SELECT ended FROM upload_session"), "interrupted");
     clock_.advance(options_.limits.maxAge + 60s);
     commitOne();
     EXPECT_EQ(reader().number("SELECT count(*) FROM upload_session"), 0);

@@ -39,6 +39,7 @@ struct Bytes {
     std::size_t operator()(const StoreIncidentRow& row) const {
         return storeBytes(row.signature) + bytesBeyond(row.report);
     }
+    std::size_t operator()(const StoreRepeatRow&) const { return 0; }
 };
 
 } // namespace

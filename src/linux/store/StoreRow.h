@@ -12,6 +12,7 @@
 #include <variant>
 
 #include "common/Value.h"
+#include "platform/RelayReporting.h"
 
 namespace halyard::linux_ {
 
@@ -39,6 +40,7 @@ struct StoreOpenRow {
 };
 struct StoreCloseRow {
     StoreUploadPtr upload;
+    platform::UploadEnding ending;
     double time;
 };
 struct StoreMessageRow {
@@ -78,9 +80,14 @@ struct StoreIncidentRow {
     Value report;
     double time;
 };
+struct StoreRepeatRow {
+    StoreUploadPtr upload;
+    platform::Repeats repeats;
+};
 
-using StoreRow = std::variant<StoreOpenRow, StoreCloseRow, StoreMessageRow, StoreSingleRow,
-                              StoreAnalyticsRow, StoreEnergyRow, StoreMetricRow, StoreIncidentRow>;
+using StoreRow =
+    std::variant<StoreOpenRow, StoreCloseRow, StoreMessageRow, StoreSingleRow, StoreAnalyticsRow,
+                 StoreEnergyRow, StoreMetricRow, StoreIncidentRow, StoreRepeatRow>;
 
 // A row on its way, with the memory it is charged with.
 struct StoreItem {

@@ -43,12 +43,44 @@ constexpr std::uint64_t kRowsPerCommit = 4096;
 // so on: the first step is less than a page's worth of rows.
 constexpr std::int64_t kFirstStep = 4;
 constexpr std::int64_t kLargestStep = std::int64_t{1} << 40;
+// Of a file in which sessions did not say it.
+constexpr const char* kSayHowEnded = "UPDATE upload_session SET ended = 'stopped' "
+                                     "WHERE closed IS NOT NULL AND ended IS NULL";
+
+// The columns that the table has in this file, which an older schema, or somebody else,
+// may have made.
+std::vector<std::string> columnsOf(sqlite3* database, std::string_view table) {
+    std::vector<std::string> names;
+    StoreStatement info;
+    if (info.prepare(database, fmt::format("SELECT name FROM pragma_table_info('{}')", table)) ==
+        SQLITE_OK) {
+        while (info.step() == SQLITE_ROW) {
+            names.emplace_back(info.text(0));
+        }
+    }
+    return names;
+}
+
+// `name`, or NULL where the file has no such column.
+std::string_view readable(std::string_view name, const std::vector<std::string>& present) {
+    return std::find(present.begin(), present.end(), name) != present.end() ? name : "NULL";
+}
+
+std::string readableColumns(const StoreTableSchema& table,
+                            const std::vector<std::string>& present) {
+    std::string names = "id";
+    for (const StoreColumn& column : table.columns) {
+        names.append(", ").append(readable(column.name, present));
+    }
+    return names;
+}
 
 // What is true of every row that the daemon wrote, and seldom of what damage left.
-std::string validity(const StoreTableSchema& table) {
+std::string validity(const StoreTableSchema& table, const std::vector<std::string>& present) {
     std::string sql = "1";
-    for (const auto& [name, type, holds] : table.columns) {
-        switch (holds) {
+    for (const auto& column : table.columns) {
+        const std::string_view name = readable(column.name, present);
+        switch (column.holds) {
         case StoreColumn::Holds::Anything:
             break;
         case StoreColumn::Holds::Integer:
@@ -104,9 +136,13 @@ class TableCarrier {
 public:
     TableCarrier(const StoreTableSchema& table, sqlite3* from, sqlite3* to, StoreSalvage& result)
         : columns_(static_cast<int>(table.columns.size()) + 1), to_(to), result_(result) {
+        const auto present = columnsOf(from, table.name);
+        // A table of a later schema than the file's is no loss.
+        absent_ = present.empty() && table.since > 1;
         readable_ =
             read_.prepare(from, fmt::format("SELECT {}, {} FROM {} WHERE id > ? ORDER BY id",
-                                            storeColumnNames(table), validity(table), table.name));
+                                            readableColumns(table, present),
+                                            validity(table, present), table.name));
         code_ = insert_.prepare(to, storeInsert(table, "INSERT OR REPLACE"));
     }
 
@@ -114,7 +150,7 @@ public:
     [[nodiscard]] int run() {
         if (readable_ == SQLITE_OK) {
             carryAll();
-        } else {
+        } else if (!absent_) {
             ++result_.holes;
         }
         return code_;
@@ -166,6 +202,7 @@ private:
     StoreStatement read_;
     StoreStatement insert_;
     int readable_ = SQLITE_OK;
+    bool absent_ = false;
     int code_ = SQLITE_OK;
     std::int64_t last_ = 0;
 };
@@ -204,6 +241,8 @@ StoreSalvage storeCarryOver(const fs::path& damaged, sqlite3* fresh) {
         for (const StoreTableSchema& table : kStoreSchema) {
             code = code == SQLITE_OK ? TableCarrier(table, from, fresh, result).run() : code;
         }
+        code =
+            code == SQLITE_OK ? sqlite3_exec(fresh, kSayHowEnded, nullptr, nullptr, nullptr) : code;
         if (sqlite3_get_autocommit(fresh) == 0) {
             const int committed = sqlite3_exec(fresh, "COMMIT", nullptr, nullptr, nullptr);
             code = code == SQLITE_OK ? committed : code;

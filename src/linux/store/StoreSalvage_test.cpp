@@ -147,7 +147,7 @@ TEST_F(StoreSalvageTest, OnlyTheNewestDamagedFilesAreKept) {
 
 TEST_F(StoreSalvageTest, ANewerSchemaIsLeftUntouched) {
     makeStore(10);
-    { reader().rows("PRAGMA user_version = 2"); }
+    { reader().rows("PRAGMA user_version = 3"); }
     const std::string before = contents(options_.path);
     open();
     EXPECT_FALSE(store_->isOpen());
@@ -168,7 +168,7 @@ TEST_F(StoreSalvageTest, AnOlderSchemaMigrates) {
     store_->addMetric(1, "y");
     flush();
     EXPECT_EQ(reader().rows("SELECT id FROM metric"), (std::vector<std::string>{"5", "6"}));
-    EXPECT_EQ(reader().number("PRAGMA user_version"), 1);
+    EXPECT_EQ(reader().number("PRAGMA user_version"), 2);
 }
 
 TEST_F(StoreSalvageTest, TablesOfAnotherShapeCountAsDamaged) {

@@ -138,7 +138,7 @@ void StoreWriter::carryOver(const std::filesystem::path& aside) {
         HY_LOG_ERROR(HYReportingPlatformCategory, "not all rows could be carried over: {}",
                      salvage.whole.failure().text);
     }
-    (void)database_.refreshIds(); // Falls back on the ids' own conflicts.
+    (void)database_.takeOver(); // Falls back on the ids' own conflicts.
 }
 
 void StoreWriter::closeDatabase() {

@@ -21,10 +21,10 @@ protected:
 TEST_F(StoreTest, CreatesTheSchema) {
     open();
     EXPECT_TRUE(store_->isOpen());
-    EXPECT_EQ(reader().number("PRAGMA user_version"), 1);
+    EXPECT_EQ(reader().number("PRAGMA user_version"), 2);
     EXPECT_EQ(reader().rows("SELECT name FROM sqlite_schema WHERE type = 'table' ORDER BY rowid"),
               (std::vector<std::string>{"upload_session", "upload_message", "analytics_event",
-                                        "energy_event", "metric", "incident"}));
+                                        "energy_event", "metric", "incident", "repeat"}));
     EXPECT_EQ(reader().one("SELECT count(*) FROM sqlite_schema WHERE type = 'index'"), "0");
     EXPECT_EQ(reader().one("PRAGMA journal_mode"), "wal");
 }
@@ -37,23 +37,25 @@ TEST_F(StoreTest, TablesHaveTheColumnsThatReadersRelyOn) {
                       "JOIN pragma_table_info(t.name) c GROUP BY t.name ORDER BY t.rowid, c.cid"),
         (std::vector<std::string>{
             "upload_session(id INTEGER KEY, session_id INTEGER, session_info TEXT, user_info "
-            "TEXT, opened REAL, closed REAL)",
+            "TEXT, opened REAL, closed REAL, ended TEXT)",
             "upload_message(id INTEGER KEY, upload_session INTEGER, session_info TEXT, "
             "user_info TEXT, category INTEGER, type INTEGER, payload TEXT, time REAL)",
             "analytics_event(id INTEGER KEY, name TEXT, payload TEXT, time REAL)",
             "energy_event(id INTEGER KEY, client INTEGER, name TEXT, payload TEXT, time REAL)",
             "metric(id INTEGER KEY, metric_id INTEGER, message BLOB, time REAL)",
-            "incident(id INTEGER KEY, signature TEXT, report TEXT, time REAL)"}));
+            "incident(id INTEGER KEY, signature TEXT, report TEXT, time REAL)",
+            "repeat(id INTEGER KEY, upload_session INTEGER, category INTEGER, type INTEGER, "
+            "count INTEGER, first REAL, last REAL)"}));
 }
 
 TEST_F(StoreTest, StatusNamesTablesAndLosses) {
     StoreStatus status;
-    status.rows = {1, 2, 3, 4, 5, 6};
+    status.rows = {1, 2, 3, 4, 5, 6, 7};
     status.lost = {1, 2, 3, 4, 5, 6, 7};
     const Dictionary told = describe(status);
     EXPECT_EQ(toJson(told["rows"]), "{\"upload_session\":1,\"upload_message\":2,"
                                     "\"analytics_event\":3,\"energy_event\":4,"
-                                    "\"metric\":5,\"incident\":6}");
+                                    "\"metric\":5,\"incident\":6,\"repeat\":7}");
     EXPECT_EQ(toJson(told["lost"]), "{\"no_store\":1,\"disk_full\":2,\"read_only\":3,"
                                     "\"locked\":4,\"io_error\":5,\"stuck\":6,\"rejected\":7}");
 }
@@ -69,10 +71,30 @@ TEST_F(StoreTest, WritesSessionsAndTheirMessages) {
     EXPECT_EQ(reader().one("SELECT * FROM upload_session"),
               "1|42|{\"kRelayReportingSessionInfoSessionID\":42}|"
               "{\"kRelayReportingUserInfoServiceName\":\"alarms_session\"}|"
-              "1700000000.0|1700000002.5");
+              "1700000000.0|1700000002.5|stopped");
     EXPECT_EQ(reader().one("SELECT * FROM upload_message"),
               "1|1|NULL|NULL|4|1|{\"audiotag\":\"Playback_Start\",\"sample_rate\":48000,"
               "\"channels\":2}|1700000002.0");
+}
+
+TEST_F(StoreTest, ASessionSaysHowItEnded) {
+    open();
+    store_->closeUpload(openUpload(1), platform::UploadEnding::Stopped);
+    store_->closeUpload(openUpload(2), platform::UploadEnding::Disconnected);
+    const auto running = openUpload(3);
+    flush();
+    EXPECT_EQ(reader().rows("SELECT session_id, ended FROM upload_session ORDER BY id"),
+              (std::vector<std::string>{"1|stopped", "2|disconnected", "3|NULL"}));
+}
+
+TEST_F(StoreTest, RepeatsHaveRowsOfTheirSession) {
+    open();
+    const auto upload = openUpload(42);
+    EXPECT_TRUE(store_->addRepeats(upload, {0xFFFFFFFF, 0xFFFF, 12, 1700000001.5, 1700000002}));
+    flush();
+    EXPECT_EQ(reader().one("SELECT * FROM repeat"),
+              "1|1|4294967295|65535|12|1700000001.5|1700000002.0");
+    EXPECT_EQ(store_->status().rows[static_cast<std::size_t>(StoreTable::Repeat)], 1U);
 }
 
 TEST_F(StoreTest, MessagesReferToTheirOwnSession) {
@@ -190,7 +212,7 @@ TEST_F(StoreTest, CountsWhatItStores) {
     const StoreStatus status = store_->status();
     EXPECT_TRUE(status.open);
     EXPECT_FALSE(status.failing);
-    EXPECT_EQ(status.rows, (StoreDatabase::RowCounts{0, 2, 0, 0, 1, 0}));
+    EXPECT_EQ(status.rows, (StoreDatabase::RowCounts{0, 2, 0, 0, 1, 0, 0}));
     EXPECT_EQ(status.queuedRows, 0U);
     EXPECT_EQ(status.queuedBytes, 0U);
     EXPECT_EQ(total(status.lost), 0U);

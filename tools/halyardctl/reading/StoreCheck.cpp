@@ -151,6 +151,9 @@ Outcome<StoreCheck> checkStore(const fs::path& path, const std::function<void(do
     check.schema = reader.schema();
     check.integrity = integrityOf(reader);
     for (const auto& table : linux_::kStoreSchema) {
+        if (table.since > check.schema) {
+            continue;
+        }
         const std::string name(table.name);
         check.rows.emplace_back(name, count(reader, name, check.integrity));
     }
