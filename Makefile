@@ -10,9 +10,11 @@ BUILD_PACKAGES := g++ cmake ninja-build ccache pkg-config python3 \
 # What the demonstration plays with.
 RUN_PACKAGES := pipewire pipewire-bin pipewire-pulse libspa-0.2-modules wireplumber \
 	sox espeak-ng sqlite3 procps
+# What pictures of the report's page are made with.
+PICTURE_PACKAGES := chromium chromium-driver python3-selenium
 TEST_PACKAGES := libmsgpack-cxx-dev libgtest-dev libgmock-dev libbenchmark-dev libsndfile1-dev \
 	clang-format python3-msgpack \
-	neovim pipewire-jack jackd2 systemd chromium chromium-driver python3-selenium
+	neovim pipewire-jack jackd2 systemd $(PICTURE_PACKAGES)
 CHECK_PACKAGES := clang clang-tidy libclang-rt-14-dev
 BENCH_PACKAGES := libmsgpack-cxx-dev libbenchmark-dev sqlite3
 
@@ -36,7 +38,7 @@ CTEST_FLAGS := --output-on-failure --no-label-summary --parallel $(TEST_JOBS)
 FIXED_ADDRESSES := setarch $(shell uname -m) -R
 
 .DEFAULT_GOAL := build
-.PHONY: deps build install run test check fuzz tidy bench format clean
+.PHONY: deps build install run pictures test check fuzz tidy bench format clean
 
 deps:
 	@scripts/install-deps.sh $(BUILD_PACKAGES) $(RUN_PACKAGES) $(TEST_PACKAGES)
@@ -57,6 +59,10 @@ run:
 	@scripts/install-deps.sh $(BUILD_PACKAGES) $(RUN_PACKAGES)
 	@$(MAKE) --no-print-directory build
 	tools/demo/run-demo build/release $(if $(KEEP),KEEP=$(KEEP))
+
+pictures: run
+	@scripts/install-deps.sh $(PICTURE_PACKAGES)
+	scripts/make-pictures build/release/report.html docs/pictures
 
 test: deps
 	cmake --preset test

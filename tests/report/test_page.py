@@ -87,7 +87,7 @@ class Page(unittest.TestCase):
 
         answer = self.text("#answer").replace("\u00a0", " ")
         self.assertIn("In 1 session, 49 s were played. All of it came from music.", answer)
-        self.assertIn("Sound was missing 2 times, at a rate of 147 an hour, for 360 ms in all", answer)
+        self.assertIn("Sound was missing twice, at a rate of 147 an hour, for 360 ms in all", answer)
         self.assertEqual(self.count("#timeline .mark"), 2)
         self.assertEqual(self.count("#timeline path.route"), 1)
         self.assertEqual(self.count("#sessions figure"), 3)

@@ -57,7 +57,7 @@ function glitchSentence(digest) {
     return [soundInWords(digest) ? "No glitch was reported." : "There are no glitches."];
   }
   const [application, cause] = [leading(digest.by_application), leading(digest.by_cause)];
-  const said = [`Sound was missing ${glitches === 1 ? "once" : `${whole(glitches)} times`}` +
+  const said = [`Sound was missing ${glitches === 1 ? "once" : glitches === 2 ? "twice" : `${whole(glitches)} times`}` +
     `${rateInWords(digest.totals)}, for ${lengthOf(silent)} in all` +
     (glitches > 1 ? ` and ${lengthOf(longest)} at the longest.` : ".")];
   return [...said, ...leaderInWords(application, digest), ...causeOfMost(cause, digest)];
@@ -101,9 +101,10 @@ function showAnswer(digest) {
     element("p", {}, ...soundSentence(digest)), element("p", {}, ...glitchSentence(digest)));
   if (totals.sessions + totals.messages + totals.glitches === 0) return;
   const rate = totals.glitches_per_hour;
+  const { played_seconds: played, captured_seconds: captured } = totals;
   document.getElementById("figures").append(
-    figure(lengthOf(totals.played_seconds), "played"),
-    figure(lengthOf(totals.captured_seconds), "captured"),
+    ...(played > 0 || captured === 0 ? [figure(lengthOf(played), "played")] : []),
+    ...(captured > 0 ? [figure(lengthOf(captured), "captured")] : []),
     figure(whole(totals.sessions), totals.sessions === 1 ? "session" : "sessions"),
     figure(whole(totals.glitches), totals.glitches === 1 ? "glitch" : "glitches"),
     figure(rate === null ? "–" : rate < 10 ? rate.toFixed(1) : whole(Math.round(rate)), "glitches an hour"),

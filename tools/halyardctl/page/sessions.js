@@ -30,7 +30,7 @@ function statisticsOf(session, digest, place) {
   };
   add("Cycle times", histograms.map((of) => histogramPanel(of, width)));
   add("Driver residencies", residencies.map((of) => residencyPanel(of, width)));
-  if (counters.length > 0) add("Counters", [counterTable(counters)]);
+  if (counters.length > 0) place.append(element("h3", {}, "Counters"), counterTable(counters));
   if (histograms.length + residencies.length + counters.length === 0) {
     place.append(element("p", { class: "note" }, "The daemon told of no driver statistics in this session."));
   }
@@ -58,8 +58,9 @@ function showSessions(digest) {
   more.addEventListener("click", add);
   place.append(list, more);
   add();
-  // The first that has something to show shows it.
+  // The first that has something to show shows it, one with glitches rather.
   const told = new Set(digest.histograms.map((of) => of.session));
-  const index = newest.slice(0, SESSIONS_AT_ONCE).findIndex((session) => told.has(session.id));
-  if (index >= 0) list.children[index].open = true;
+  const telling = newest.slice(0, SESSIONS_AT_ONCE).filter((session) => told.has(session.id));
+  const first = telling.find((session) => session.glitches > 0) ?? telling[0];
+  if (first) list.children[newest.indexOf(first)].open = true;
 }

@@ -1,9 +1,23 @@
 // Driver statistics of a session: histograms, and how long devices were in which state.
 
+// Whole powers of ten, so that histograms of few buckets look like those of many.
 function spanOfBuckets(buckets) {
-  const least = d3.min(buckets, ([lower]) => lower);
-  return [least > 0 ? least : d3.min(buckets.filter(([, upper]) => upper > 0), ([, upper]) => upper) / 2,
-    d3.max(buckets, ([, upper]) => upper)];
+  const bounds = buckets.flatMap(([lower, upper]) => [lower, upper]).filter((bound) => bound > 0);
+  const [least, most] = [d3.min(bounds) ?? 1, d3.max(bounds) ?? 10];
+  const first = Math.floor(Math.log10(least) + 1e-9);
+  return [10 ** first, 10 ** Math.max(first + 1, Math.ceil(Math.log10(most) - 1e-9))];
+}
+
+// The daemon's keys have no blanks.
+const CHANNELS = { Cycletime: "Cycle time", Missedcycles: "Missed cycles", cpusome: "Somebody waited for a processor",
+  cpufull: "All waited for a processor", iosome: "Somebody waited for a disk", iofull: "All waited for a disk",
+  memorysome: "Somebody waited for memory", memoryfull: "All waited for memory" };
+function channelName(of) {
+  return Object.hasOwn(CHANNELS, of.channel) ? CHANNELS[of.channel] : plain(of.channel);
+}
+// Of counters the daemon tells no unit; time lost to pressure is in microseconds.
+function counterValue(counter) {
+  return counter.driver === "Pressure" ? lengthOf(counter.value / 1e6) : whole(counter.value);
 }
 
 // The bucket in which the share lies, as "30 µs to 50 µs".
@@ -21,11 +35,11 @@ function histogramDrawing(histogram, width) {
   const { buckets, unit } = histogram;
   const [height, top, bottom] = [132, 8, 26];
   const all = d3.sum(buckets, ([, , hits]) => hits);
-  const label = `${plain(histogram.channel)} of ${plain(histogram.driver)}: ${whole(all)} in all, ` +
+  const label = `${channelName(histogram)} of ${plain(histogram.driver)}: ${whole(all)} in all, ` +
     `half of them below ${bucketAt(histogram, 0.5).split(" to ")[1]}, the longest up to ${inUnit(histogram.max, unit)}`;
   const svg = drawing(width, height, label);
   const [first, last] = spanOfBuckets(buckets);
-  const x = d3.scaleLog().domain([first, Math.max(last, first * 1.01)]).range([18, width - 22]).clamp(true);
+  const x = d3.scaleLog().domain([first, last]).range([18, width - 22]).clamp(true);
   // Square roots keep the rare ones, which are what matters, in sight.
   const y = d3.scaleSqrt().domain([0, d3.max(buckets, ([, , hits]) => hits)]).range([height - bottom, top]);
   svg.append("g").selectAll("rect").data(buckets).join("rect").attr("class", "bar")
@@ -35,8 +49,7 @@ function histogramDrawing(histogram, width) {
     .attr("height", ([, , hits]) => Math.max(1.5, height - bottom - y(hits)))
     .append("title").text(([lower, upper, hits]) =>
       `${inUnit(lower, unit)} to ${inUnit(upper, unit)}: ${whole(hits)} (${d3.format(".2~%")(hits / all)})`);
-  const decades = x.ticks().filter((value) => Math.abs(Math.log10(value) % 1) < 1e-9 || Math.abs(Math.log10(value) % 1) > 1 - 1e-9);
-  const values = decades.length > 1 ? decades : [first, last];
+  const values = d3.range(Math.round(Math.log10(first)), Math.round(Math.log10(last)) + 1).map((power) => 10 ** power);
   svg.append("g").attr("class", "axis").attr("transform", `translate(0,${height - bottom})`)
     .call(d3.axisBottom(x).tickValues(values).tickSizeOuter(0).tickFormat((value) => inUnit(value, unit)));
   return svg.node();
@@ -45,7 +58,7 @@ function histogramDrawing(histogram, width) {
 function histogramPanel(histogram, width) {
   const all = d3.sum(histogram.buckets, ([, , hits]) => hits);
   return element("figure", { class: "panel" },
-    element("figcaption", {}, element("strong", {}, plain(histogram.channel).replace("Cycletime", "Cycle time")),
+    element("figcaption", {}, element("strong", {}, channelName(histogram)),
       " · ", name(plain(histogram.driver)),
       element("span", { class: "note" }, `${whole(all)} · half below ${bucketAt(histogram, 0.5).split(" to ")[1]} · at most ${inUnit(histogram.max, histogram.unit)}`)),
     histogramDrawing(histogram, width));
@@ -83,10 +96,10 @@ function residencyPanel(residency, width) {
 }
 
 function counterTable(counters) {
-  return element("table", { class: "plain" }, headerRow([["Counter"], ["Of"], ["Change", "number"]]),
+  return element("table", { class: "plain counters" }, headerRow([["Counter"], ["Of"], ["Change", "number"]]),
     element("tbody", {}, ...counters.map((counter) => element("tr", {},
-      element("td", {}, name(plain(counter.channel))), element("td", {}, name(nameOr(counter.driver, plain(counter.group)))),
-      element("td", { class: "number" }, whole(counter.value))))));
+      element("td", {}, name(channelName(counter))), element("td", {}, name(nameOr(counter.driver, plain(counter.group)))),
+      element("td", { class: "number" }, counterValue(counter))))));
 }
 
 // Idle and power states that were never left say nothing.

@@ -139,7 +139,7 @@ class Timeline {
       .attr("aria-label", (mark) => this.markInWords(mark));
     marks.append("circle").attr("class", "reach").attr("r", 12);
     const single = marks.filter((mark) => mark.glitches.length === 1);
-    single.append("path").attr("class", "sign").attr("d", d3.symbol(d3.symbolDiamond, 110));
+    single.append("path").attr("class", "sign").attr("d", d3.symbol().type(d3.symbolDiamond).size(95));
     const several = marks.filter((mark) => mark.glitches.length > 1);
     several.append("circle").attr("class", "sign").attr("r", 8.5);
     several.append("text").attr("dy", "0.35em").text((mark) => mark.glitches.length > 99 ? "…" : mark.glitches.length);
