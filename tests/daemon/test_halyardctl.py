@@ -363,6 +363,23 @@ class Watching(CtlTest):
         watching.stdout.close()
         self.assertEqual(watching.wait(PATIENCE), 0)
 
+    def test_a_restart_of_the_daemon_is_followed(self):
+        self.flush()
+        watching = self.watch("--json")
+        for number in range(2):
+            client = self.connect()
+            client.session(1, 4, "clock")
+            def told():
+                client.result("sendMessage", {"n": number, "at": time.time()}, 4, 1, [1])
+                client.result("admin.flush")
+                return select.select([watching.stdout], [], [], 0.2)[0]
+            self.daemon.wait_for(told)
+            shown = json.loads(watching.stdout.readline())
+            while shown["payload"].get("n") != number:
+                shown = json.loads(watching.stdout.readline())
+            self.assertEqual(self.daemon.terminate(), 0)
+            self.daemon.run()
+
 
 class Sending(CtlTest):
     def test_lines_become_messages_and_bad_ones_are_told(self):
@@ -498,6 +515,18 @@ class Caring(CtlTest):
         self.assertEqual(ctl("sessions", "--json", state=copy).stdout, "[\n]\n")
         self.assertEqual(len(self.listed("sessions")), 2)
 
+    def test_a_store_that_another_daemon_has_open_is_not_purged(self):
+        self.collect()
+        other = Daemon()
+        self.addCleanup(other.remove)
+        other.run()
+        done = subprocess.run([HALYARDCTL, "--state", os.path.dirname(self.daemon.store_path),
+                               "--socket", other.socket_path, "purge"],
+                              timeout=PATIENCE, check=False, capture_output=True, text=True)
+        self.assertEqual(done.returncode, 1, done.stderr)
+        self.assertIn(f"process {self.daemon.process.pid} has", done.stderr)
+        self.assertEqual(len(self.listed("sessions")), 2)
+
     def test_a_purge_is_for_administrators(self):
         if os.geteuid() != 0:
             self.skipTest("only root becomes somebody else")
@@ -625,6 +654,61 @@ class Overview(CtlTest):
                          [(1000000000, 0.5), (1002000000, 0)])
         self.assertEqual(self.ctl("timeline", "--output", "/nonexistent/x").returncode, 1)
         self.assertEqual(self.ctl("timeline").returncode, 2)
+
+
+class LeftBehind(unittest.TestCase):
+    """What a daemon that was killed leaves: its last rows are in the write-ahead log."""
+
+    def setUp(self):
+        self.daemon = Daemon()
+        self.addCleanup(self.daemon.remove)
+        self.state = os.path.dirname(self.daemon.store_path)
+        self.daemon.run()
+        client = self.daemon.client()
+        client.session(1, 4, "clock")
+        for number in range(500):
+            client.notify("sendMessage", {"n": number, "text": "x" * 300}, 4, 1, [1])
+        client.result("admin.flush")
+        self.daemon.kill()
+        client.close()
+
+    def messages(self, **options):
+        done = ctl("messages", "--json", state=self.state, **options)
+        self.assertEqual((done.returncode, done.stderr), (0, ""))
+        return json.loads(done.stdout)
+
+    def test_its_rows_are_read_and_its_files_stay_as_they_are(self):
+        def contents():
+            found = {}
+            for name in ("telemetry.db", "telemetry.db-wal"):
+                with open(os.path.join(self.state, name), "rb") as file:
+                    found[name] = file.read()
+            return found
+
+        before = contents()
+        self.assertEqual(len(self.messages()), 500)
+        self.assertEqual(contents(), before)
+
+    def test_they_are_read_where_nothing_may_be_written(self):
+        for name in os.listdir(self.state):
+            os.chmod(os.path.join(self.state, name), 0o444)
+        os.chmod(self.state, 0o555)
+        os.chmod(self.daemon.root, 0o755)
+        self.addCleanup(os.chmod, self.state, 0o755)
+        self.assertEqual(len(self.messages(**as_nobody())), 500)
+
+    def test_damage_on_the_way_ends_a_list_that_is_one(self):
+        store = sqlite3.connect(self.daemon.store_path)
+        store.execute("PRAGMA wal_checkpoint(TRUNCATE)")
+        store.close()
+        with open(self.daemon.store_path, "r+b") as file:
+            message = re.search(rb'"n":300,"text":"x+","audiotag"', file.read())
+            file.seek(message.start() // 8192 * 8192)
+            file.write(b"Z" * 8192)
+        done = ctl("messages", "--json", state=self.state)
+        self.assertEqual(done.returncode, 1)
+        self.assertIn("damaged", done.stderr)
+        self.assertGreater(len(json.loads(done.stdout)), 50)
 
 
 class NotThere(unittest.TestCase):
