@@ -69,7 +69,7 @@ endfunction()
 # grown for the first time, which clang's sanitizer tells of. Every source of a
 # program counts that uses it, since the linker takes any one's copy.
 function(halyard_uses_rapidjson)
-  if(HALYARD_SANITIZE MATCHES undefined AND CMAKE_CXX_COMPILER_ID MATCHES Clang)
+  if((HALYARD_SANITIZE MATCHES undefined OR HALYARD_FUZZERS) AND CMAKE_CXX_COMPILER_ID MATCHES Clang)
     set_source_files_properties(${ARGN} PROPERTIES COMPILE_OPTIONS -fno-sanitize=pointer-overflow)
   endif()
 endfunction()

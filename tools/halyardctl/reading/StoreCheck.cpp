@@ -29,12 +29,13 @@ std::uint64_t sizeOf(const fs::path& path) {
     return error ? 0 : size;
 }
 
-// A check reads every page about once, so pages that were read tell how far it is.
+// A check reads every page twice, as a part of its tree and for its rows, so pages that
+// were read tell how far it is.
 class PagesRead {
 public:
     PagesRead(StoreReader& reader, const std::function<void(double)>& tell)
         : database_(reader.handle()), tell_(tell) {
-        pages_ = static_cast<double>(pageCount(reader));
+        pages_ = 2 * static_cast<double>(pageCount(reader));
         sqlite3_progress_handler(
             database_, kStepsALook,
             [](void* self) {
