@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
+#include <charconv>
 #include <cmath>
 #include <cstring>
 #include <fmt/format.h>
@@ -37,11 +38,12 @@ public:
     }
 
     bool Default() { return true; } // Null and Bool
-    bool Int(int value) { return number(value); }
-    bool Uint(unsigned value) { return number(value); }
-    bool Int64(std::int64_t value) { return number(static_cast<double>(value)); }
-    bool Uint64(std::uint64_t value) { return number(static_cast<double>(value)); }
-    bool Double(double value) { return number(value); }
+    // The library's own exact way of reading zeroes shifts by no defined number of bits.
+    bool RawNumber(const char* digits, rapidjson::SizeType length, bool) {
+        double value = 0;
+        const bool fits = std::from_chars(digits, digits + length, value).ec == std::errc();
+        return !fits || number(value);
+    }
     bool String(const char* text, rapidjson::SizeType length, bool) {
         if (inEntry()) {
             if (key_ == "name") {
@@ -152,7 +154,8 @@ std::optional<std::vector<TraceDurations>> readTraceResults(std::FILE* file) {
     rapidjson::FileReadStream stream(file, buffer.data(), buffer.size());
     rapidjson::Reader reader;
     Collector collector;
-    constexpr unsigned kFlags = rapidjson::kParseIterativeFlag | rapidjson::kParseFullPrecisionFlag;
+    constexpr unsigned kFlags =
+        rapidjson::kParseIterativeFlag | rapidjson::kParseNumbersAsStringsFlag;
     if (reader.Parse<kFlags>(stream, collector).IsError() || !collector.foundList()) {
         return std::nullopt;
     }
