@@ -41,6 +41,16 @@ std::optional<std::uint64_t> parseByteSize(std::string_view text) {
     return parseAmount(text, kByteUnits, std::numeric_limits<std::int64_t>::max());
 }
 
+std::optional<std::chrono::milliseconds> parseInterval(std::string_view text) {
+    static constexpr Unit kMilliseconds[] = {{"ms", 1}};
+    if (const auto fine =
+            parseAmount(text, kMilliseconds, static_cast<std::uint64_t>(kMaxDuration.count()))) {
+        return std::chrono::milliseconds(*fine);
+    }
+    const auto coarse = parseDuration(text);
+    return coarse ? std::optional<std::chrono::milliseconds>(*coarse) : std::nullopt;
+}
+
 std::optional<std::chrono::seconds> parseDuration(std::string_view text) {
     const auto seconds =
         parseAmount(text, kTimeUnits, static_cast<std::uint64_t>(kMaxDuration.count()));

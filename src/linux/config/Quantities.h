@@ -23,4 +23,7 @@ inline constexpr std::chrono::seconds kMaxDuration = std::chrono::hours(24) * 36
 // such text or longer than kMaxDuration.
 [[nodiscard]] std::optional<std::chrono::seconds> parseDuration(std::string_view text);
 
+// The same in milliseconds, which may be the unit as well: "50ms".
+[[nodiscard]] std::optional<std::chrono::milliseconds> parseInterval(std::string_view text);
+
 } // namespace halyard::linux_

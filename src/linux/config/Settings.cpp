@@ -61,6 +61,7 @@ private:
     void readFeatureFlags(const toml::node& node, const std::string& name);
     void readMaxBytes(const toml::node& node, const std::string& name);
     void readMaxAge(const toml::node& node, const std::string& name);
+    void readSyncInterval(const toml::node& node, const std::string& name);
     void readChannels(const toml::node& node, const std::string& name);
     void readChannel(const toml::node& node, const std::string& name);
     void checkChannel(const toml::node& node, const std::string& name);
@@ -95,7 +96,8 @@ private:
     }
     void readStore(const toml::node& node, const std::string& name) {
         static constexpr Key kKeys[] = {{"max_bytes", &SettingsReader::readMaxBytes},
-                                        {"max_age", &SettingsReader::readMaxAge}};
+                                        {"max_age", &SettingsReader::readMaxAge},
+                                        {"sync_interval", &SettingsReader::readSyncInterval}};
         readSection(node, name, kKeys);
     }
     void readLog(const toml::node& node, const std::string& name) {
@@ -344,6 +346,16 @@ void SettingsReader::readMaxAge(const toml::node& node, const std::string& name)
         fail(node, fmt::format("{} must be at least \"1s\"", name));
     } else {
         settings().store.maxAge = *age;
+    }
+}
+
+void SettingsReader::readSyncInterval(const toml::node& node, const std::string& name) {
+    const auto interval = parseInterval(node.value_exact<std::string>().value_or(""));
+    if (!interval || *interval < StoreLimits::kLeastSyncInterval ||
+        *interval > StoreLimits::kLargestSyncInterval) {
+        fail(node, fmt::format("{} must be a duration from \"50ms\" to \"10m\"", name));
+    } else {
+        settings().store.syncInterval = *interval;
     }
 }
 

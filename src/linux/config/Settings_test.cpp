@@ -331,5 +331,16 @@ TEST(SettingsWarningTest, WarningsAreBoundedAndTheRestIsCounted) {
     EXPECT_EQ(result.warningsLeftOut, 3u);
 }
 
+TEST(SettingsTest, TheSyncIntervalIsBetween50MillisecondsAnd10Minutes) {
+    EXPECT_EQ(settings("").store.syncInterval, 50ms);
+    EXPECT_EQ(settings("[store]\nsync_interval = \"50ms\"").store.syncInterval, 50ms);
+    EXPECT_EQ(settings("[store]\nsync_interval = \"5s\"").store.syncInterval, 5s);
+    EXPECT_EQ(settings("[store]\nsync_interval = \"10m\"").store.syncInterval, 10min);
+    for (const char* wrong : {"\"49ms\"", "\"11m\"", "5", "\"\""}) {
+        EXPECT_EQ(mistake(std::string("[store]\nsync_interval = ") + wrong),
+                  "2:17: store.sync_interval must be a duration from \"50ms\" to \"10m\"");
+    }
+}
+
 } // namespace
 } // namespace halyard::linux_

@@ -6,6 +6,7 @@
 #include <pthread.h>
 #include <utility>
 
+#include "common/HYReportingUtility.h"
 #include "common/Mutex.h"
 
 namespace halyard::linux_ {
@@ -52,7 +53,7 @@ std::thread startThread(const char* name, std::function<void()> body) {
 
 std::shared_ptr<StoreQueue> makeQueue(const StoreOptions& options,
                                       const std::shared_ptr<StoreEnding>& ending) {
-    return std::make_shared<StoreQueue>(options.marks, options.groupRows,
+    return std::make_shared<StoreQueue>(options.marks, storeWindow(options, options.limits),
                                         [ending, told = options.onPressure](bool on) {
                                             ending->press(on);
                                             if (told) {
@@ -82,6 +83,7 @@ Dictionary describe(const StoreStatus& store) {
                       {"commits", store.commits},
                       {"queued_rows", store.queuedRows},
                       {"queued_bytes", store.queuedBytes},
+                      {"oldest_waiting_sec", store.oldestWaiting},
                       {"file_bytes", store.fileBytes},
                       {"log_bytes", store.logBytes}};
 }
@@ -173,6 +175,7 @@ bool Store::addMessage(const StoreUploadPtr& upload, std::uint16_t category, std
                        Dictionary payload) {
     const bool taken =
         queue_->push(StoreMessageRow{upload, std::move(payload), type, category, now()});
+    hurryFor(category);
     if (taken && !upload->accepted.load(std::memory_order_relaxed)) {
         upload->accepted = true;
     }
@@ -190,7 +193,18 @@ bool Store::addRepeats(const StoreUploadPtr& upload, const platform::Repeats& re
 bool Store::addSingleMessage(const Dictionary& sessionInfo, const Dictionary& userInfo,
                              std::uint16_t category, std::uint32_t type,
                              const Dictionary& payload) {
-    return queue_->push(StoreSingleRow{sessionInfo, userInfo, payload, type, category, now()});
+    const bool taken =
+        queue_->push(StoreSingleRow{sessionInfo, userInfo, payload, type, category, now()});
+    hurryFor(category);
+    return taken;
+}
+
+// Who asks for a long interval trades what a kill costs for wear, but not the reports
+// of what went wrong.
+void Store::hurryFor(std::uint16_t category) {
+    if (category == kAudioEventCategoryError) {
+        queue_->hurry();
+    }
 }
 
 bool Store::addAnalyticsEvent(const Value& name, std::function<Dictionary()> builder) {

@@ -80,6 +80,7 @@ public:
     [[nodiscard]] bool close();
 
 private:
+    void hurryFor(std::uint16_t category);
     double now() const { return platform::secondsSince1970(clock_.wallTime()); }
 
     const platform::Clock& clock_;

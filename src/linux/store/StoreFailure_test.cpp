@@ -299,7 +299,7 @@ TEST_F(StoreFailureTest, AReaderThatNeverEndsCannotGrowTheLogWithoutBound) {
 // Writes at full speed and tells the other end of the pipe how many rows were
 // acknowledged.
 [[noreturn]] void writeUntilKilled(StoreOptions options, const platform::Clock& clock, int pipe) {
-    options.groupDelay = 1ms;
+    options.limits.syncInterval = 1ms;
     Store store(std::move(options), clock);
     for (std::int64_t rows = 100;; rows += 100) {
         for (int i = 0; i < 100; ++i) {

@@ -14,8 +14,8 @@ constexpr std::size_t kForgetShare = 64;
 
 } // namespace
 
-StoreQueue::StoreQueue(Marks marks, std::size_t groupRows, PressureHandler onPressure)
-    : marks_(marks), groupRows_(groupRows), onPressure_(std::move(onPressure)) {}
+StoreQueue::StoreQueue(Marks marks, Window window, PressureHandler onPressure)
+    : marks_(marks), onPressure_(std::move(onPressure)), window_(window) {}
 
 bool StoreQueue::push(StoreRow row, std::size_t hiddenBytes, OnDrop onDrop) {
     const std::size_t bytes = storeBytes(row) + hiddenBytes;
@@ -49,15 +49,38 @@ void StoreQueue::pushAlways(StoreRow row) {
 void StoreQueue::appendLocked(StoreRow&& row, std::size_t bytes) {
     if (items_.empty()) {
         firstCame_ = std::chrono::steady_clock::now();
+        due_ = firstCame_ + window_.delay;
     }
+    const bool wasFull = isFullLocked();
     items_.push_back({std::move(row), bytes});
+    queuedBytes_ += bytes;
     ++pushed_;
     ++heldRows_;
     heldBytes_ += bytes;
     noteTightLocked();
     // The writer sleeps through what lies between the first row and a full group.
-    if (items_.size() == 1 || items_.size() == groupRows_) {
+    if (items_.size() == 1 || (!wasFull && isFullLocked())) {
         wakeUp_.notify_one();
+    }
+}
+
+bool StoreQueue::isFullLocked() const {
+    return items_.size() >= window_.rows || queuedBytes_ >= window_.bytes;
+}
+
+void StoreQueue::setWindow(Window window) {
+    const MutexLock lock(mutex_);
+    window_ = window;
+    due_ = firstCame_ + window.delay;
+    wakeUp_.notify_all();
+}
+
+void StoreQueue::hurry() {
+    const MutexLock lock(mutex_);
+    const Instant soon = std::chrono::steady_clock::now() + kUrgentDelay;
+    if (!items_.empty() && soon < due_) {
+        due_ = soon;
+        wakeUp_.notify_all();
     }
 }
 
@@ -113,7 +136,11 @@ void StoreQueue::notePayloadBytes(std::size_t bytes) {
 
 StoreQueue::Levels StoreQueue::levels() const {
     const MutexLock lock(mutex_);
-    return {heldRows_, heldBytes_, lost_};
+    const bool taken = heldRows_ > items_.size();
+    const auto oldest = heldRows_ == 0
+                            ? std::chrono::nanoseconds(0)
+                            : std::chrono::steady_clock::now() - (taken ? takenCame_ : firstCame_);
+    return {heldRows_, heldBytes_, lost_, oldest};
 }
 
 void StoreQueue::countLost(StoreLoss reason, std::uint64_t rows) {
@@ -125,13 +152,11 @@ void StoreQueue::noteTightLocked() {
     tight_.store(failing_.has_value() || crowdedLocked(), std::memory_order_relaxed);
 }
 
-bool StoreQueue::groupReadyLocked(std::chrono::nanoseconds groupDelay) {
-    return items_.size() >= groupRows_ || takeAll_ ||
-           std::chrono::steady_clock::now() - firstCame_ >= groupDelay;
+bool StoreQueue::groupReadyLocked() const {
+    return isFullLocked() || takeAll_ || std::chrono::steady_clock::now() >= due_;
 }
 
-StoreQueue::Wake StoreQueue::waitForGroup(std::chrono::nanoseconds groupDelay,
-                                          std::chrono::nanoseconds idleDelay) {
+StoreQueue::Wake StoreQueue::waitForGroup(std::chrono::nanoseconds idleDelay) {
     const MutexLock lock(mutex_);
     while (items_.empty()) {
         if (stopping_) {
@@ -143,28 +168,34 @@ StoreQueue::Wake StoreQueue::waitForGroup(std::chrono::nanoseconds groupDelay,
             return Wake::Idle;
         }
     }
-    while (!groupReadyLocked(groupDelay)) {
-        wakeUp_.wait_until(mutex_, firstCame_ + groupDelay);
+    while (!groupReadyLocked()) {
+        wakeUp_.wait_until(mutex_, due_);
     }
     return Wake::Rows;
 }
 
-void StoreQueue::take(std::vector<StoreItem>& items, std::chrono::nanoseconds groupDelay) {
+void StoreQueue::take(std::vector<StoreItem>& items) {
     items.clear();
     if (items.capacity() > kKeptCapacity) {
         std::vector<StoreItem>().swap(items);
     }
     const MutexLock lock(mutex_);
     const Instant now = std::chrono::steady_clock::now();
-    const bool all = takeAll_ || now - firstCame_ >= groupDelay;
-    const std::size_t rest = all ? 0 : items_.size() % groupRows_;
+    const bool all = takeAll_ || now >= due_ || queuedBytes_ >= window_.bytes;
+    const std::size_t rest = all ? 0 : items_.size() % window_.rows;
     items.swap(items_);
     takeAll_ = false;
+    takenCame_ = firstCame_;
+    queuedBytes_ = 0;
     if (rest != 0) {
         const auto cut = std::prev(items.end(), static_cast<std::ptrdiff_t>(rest));
+        for (auto item = cut; item != items.end(); ++item) {
+            queuedBytes_ += item->bytes;
+        }
         std::move(cut, items.end(), std::back_inserter(items_));
         items.erase(cut, items.end());
         firstCame_ = now;
+        due_ = now + window_.delay;
     }
 }
 

@@ -14,6 +14,7 @@
 #include <chrono>
 #include <condition_variable>
 #include <functional>
+#include <limits>
 #include <optional>
 #include <string_view>
 #include <vector>
@@ -57,15 +58,24 @@ public:
         std::size_t highBytes = 32 * 1024 * 1024;
         std::size_t lowBytes = 16 * 1024 * 1024;
     };
+    // A group is ready when one of these is reached.
+    struct Window {
+        std::chrono::nanoseconds delay = std::chrono::milliseconds(50); // since its first row
+        std::size_t rows = 1024;
+        std::size_t bytes = std::numeric_limits<std::size_t>::max();
+    };
+    // What is urgent waits no longer than this, however long the window is.
+    static constexpr std::chrono::milliseconds kUrgentDelay{50};
     struct Levels {
         std::size_t rows = 0;
         std::size_t bytes = 0;
         StoreLosses lost{};
+        std::chrono::nanoseconds oldest{}; // How long the first of them has waited.
     };
     enum class Wake { Rows, Idle, Stopped };
     using PressureHandler = std::function<void(bool)>;
 
-    StoreQueue(Marks marks, std::size_t groupRows, PressureHandler onPressure);
+    StoreQueue(Marks marks, Window window, PressureHandler onPressure);
 
     enum class OnDrop { Count, KeepQuiet };
 
@@ -78,6 +88,10 @@ public:
     // Calls `done` once every row pushed before is settled, at once when none is
     // waiting.
     void flush(std::function<void()> done) HY_EXCLUDES(mutex_);
+    // Holds at once, for the rows that wait as well.
+    void setWindow(Window window) HY_EXCLUDES(mutex_);
+    // What waits is due soon, however long the window is.
+    void hurry() HY_EXCLUDES(mutex_);
     // Makes the writer look after the store even without rows.
     void wake() HY_EXCLUDES(mutex_);
     // What is queued is still handed out; what comes later is dropped as NoStore.
@@ -97,15 +111,13 @@ public:
     Levels levels() const HY_EXCLUDES(mutex_);
     void countLost(StoreLoss reason, std::uint64_t rows) HY_EXCLUDES(mutex_);
 
-    // Writer's thread: waits until there is a group of rows, or `groupDelay` has
-    // passed since the first of fewer rows came, or they are wanted at once. Idle
-    // when there is nothing for `idleDelay`, or on wake().
-    Wake waitForGroup(std::chrono::nanoseconds groupDelay, std::chrono::nanoseconds idleDelay)
-        HY_EXCLUDES(mutex_);
+    // Writer's thread: waits until there is a group of rows, or its window has passed
+    // since the first of fewer rows came, or they are wanted at once. Idle when there is
+    // nothing for `idleDelay`, or on wake().
+    Wake waitForGroup(std::chrono::nanoseconds idleDelay) HY_EXCLUDES(mutex_);
     // Writer's thread: whole groups, or all there is when it is time for the
     // rest.
-    void take(std::vector<StoreItem>& items, std::chrono::nanoseconds groupDelay)
-        HY_EXCLUDES(mutex_);
+    void take(std::vector<StoreItem>& items) HY_EXCLUDES(mutex_);
     // Writer's thread: waits, but not for longer than until stop().
     void pause(std::chrono::nanoseconds delay) HY_EXCLUDES(mutex_);
     // Writer's thread: the oldest `rows` that were taken are done with.
@@ -121,18 +133,23 @@ private:
     void appendLocked(StoreRow&& row, std::size_t bytes) HY_REQUIRES(mutex_);
     bool crowdedLocked() const HY_REQUIRES(mutex_);
     void noteTightLocked() HY_REQUIRES(mutex_);
-    bool groupReadyLocked(std::chrono::nanoseconds groupDelay) HY_REQUIRES(mutex_);
+    bool groupReadyLocked() const HY_REQUIRES(mutex_);
+    bool isFullLocked() const HY_REQUIRES(mutex_);
     void tellPressure() HY_EXCLUDES(pressureMutex_);
     bool wantsPressure() HY_EXCLUDES(mutex_);
 
     const Marks marks_;
-    const std::size_t groupRows_;
     const PressureHandler onPressure_;
 
     mutable Mutex mutex_;
     std::condition_variable_any wakeUp_;
     std::vector<StoreItem> items_ HY_GUARDED_BY(mutex_);
+    std::size_t queuedBytes_ HY_GUARDED_BY(mutex_) = 0; // of items_
+    Window window_ HY_GUARDED_BY(mutex_);
     Instant firstCame_ HY_GUARDED_BY(mutex_);
+    Instant due_ HY_GUARDED_BY(mutex_);
+    // When the first of the rows came that are taken and not settled.
+    Instant takenCame_ HY_GUARDED_BY(mutex_);
     std::size_t heldRows_ HY_GUARDED_BY(mutex_) = 0; // queued and taken
     std::size_t heldBytes_ HY_GUARDED_BY(mutex_) = 0;
     std::uint64_t pushed_ HY_GUARDED_BY(mutex_) = 0;

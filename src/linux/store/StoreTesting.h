@@ -59,7 +59,8 @@ protected:
     StoreFixture() {
         options_.path = directory_.path() / "telemetry.db";
         // Only a full group or a flush commits.
-        options_.groupDelay = std::chrono::hours(1);
+        options_.limits.syncInterval = std::chrono::hours(1);
+        options_.patientRows = 0;
         options_.busyTimeout = std::chrono::milliseconds(0);
         options_.firstRetry = std::chrono::milliseconds(1);
         options_.lastRetry = std::chrono::milliseconds(1);

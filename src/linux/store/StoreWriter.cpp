@@ -40,6 +40,8 @@ namespace {
 // small store.
 constexpr std::uint64_t kCheckpointBytes = 4 * 1024 * 1024;
 constexpr std::uint64_t kLeastCheckpointBytes = 64 * 1024;
+// A commit that takes longer makes groups larger.
+constexpr std::chrono::milliseconds kSlowCommit{20};
 // What a reader that stays in one transaction may make the log grow to, beside
 // the size of the store.
 constexpr std::uint64_t kLogAllowance = 16 * 1024 * 1024;
@@ -72,6 +74,16 @@ StoreLoss lossOf(const StoreFailure& failure) {
 }
 
 } // namespace
+
+// While rows wait as long as the operator asks, they must not hold anybody back: a group
+// is ready below the low mark.
+StoreQueue::Window storeWindow(const StoreOptions& options, const StoreLimits& limits) {
+    if (limits.syncInterval <= kPromptInterval) {
+        return {limits.syncInterval, options.groupRows, options.marks.lowBytes};
+    }
+    return {limits.syncInterval, std::max(options.groupRows, options.patientRows),
+            options.marks.lowBytes};
+}
 
 StoreWriter::StoreWriter(const StoreOptions& options, const platform::Clock& clock,
                          std::shared_ptr<StoreQueue> queue)
@@ -157,17 +169,10 @@ void StoreWriter::closeDatabase() {
 void StoreWriter::run() {
     for (;;) {
         purgeIfAsked();
-        const auto idle = trimMore_            ? std::chrono::nanoseconds(0)
-                          : database_.isOpen() ? options_.agePeriod
-                                               : options_.lastRetry;
-        switch (queue_->waitForGroup(options_.groupDelay, idle)) {
+        switch (queue_->waitForGroup(idleDelay())) {
         case StoreQueue::Wake::Rows:
-            queue_->take(taken_, options_.groupDelay);
-            for (std::size_t from = 0; from < taken_.size(); from += options_.groupRows) {
-                writeGroup(std::span(taken_).subspan(
-                    from, std::min(taken_.size() - from, options_.groupRows)));
-            }
-            taken_.clear();
+            queue_->take(taken_);
+            writeTaken();
             break;
         case StoreQueue::Wake::Idle:
             maintain();
@@ -176,6 +181,29 @@ void StoreWriter::run() {
             return closeDatabase();
         }
     }
+}
+
+// Without rows there is nothing to do but to let old ones go, and that may wait: a
+// machine that sleeps is not woken for it.
+std::chrono::nanoseconds StoreWriter::idleDelay() const {
+    if (trimMore_ || !database_.isOpen()) {
+        return trimMore_ ? std::chrono::nanoseconds(0) : options_.lastRetry;
+    }
+    return std::clamp<std::chrono::nanoseconds>(limits().maxAge / 10, options_.agePeriod,
+                                                std::max(options_.agePeriod, options_.idlePeriod));
+}
+
+// A disk that takes long for each commit gets fewer and larger ones, so that what has
+// been taken is through in about the time of two.
+void StoreWriter::writeTaken() {
+    for (std::size_t from = 0; from < taken_.size();) {
+        std::size_t rows = storeWindow(options_, limits()).rows;
+        rows = commitTime_ > kSlowCommit ? taken_.size() : rows;
+        rows = std::min(rows, taken_.size() - from);
+        writeGroup(std::span(taken_).subspan(from, rows));
+        from += rows;
+    }
+    taken_.clear();
 }
 
 void StoreWriter::watch() {
@@ -304,7 +332,9 @@ StoreResult StoreWriter::writeRows(std::span<StoreItem> group) {
         database_.rollback();
         return result;
     }
+    const platform::SteadyTime began = clock_.steadyTime();
     result = database_.commit();
+    commitTime_ = clock_.steadyTime() - began;
     if (result.ok()) {
         trimMore_ = more;
         if (ageDue) {
@@ -433,6 +463,7 @@ void StoreWriter::setLimits(StoreLimits limits) {
         const MutexLock lock(mutex_);
         limits_ = limits;
     }
+    queue_->setWindow(storeWindow(options_, limits));
     limitsChanged_ = true;
     queue_->wake();
 }
@@ -449,6 +480,7 @@ StoreStatus StoreWriter::status() const {
     status.queuedRows = levels.rows;
     status.queuedBytes = levels.bytes;
     status.lost = levels.lost;
+    status.oldestWaiting = std::chrono::duration<double>(levels.oldest).count();
     return status;
 }
 

@@ -31,22 +31,29 @@ struct StoreOptions {
     // Called on the thread that opens the file, each time that it was opened or made.
     std::function<void()> onOpened;
 
-    // A group is committed when it has this many rows, or this long after the
-    // first of fewer came.
+    // A group is committed when it has this many rows, or limits.syncInterval after the
+    // first of fewer came. A slow disk gets larger ones, and so does one that is to be
+    // written to more seldom than kPromptInterval.
     std::size_t groupRows = 1024;
-    std::chrono::nanoseconds groupDelay = std::chrono::milliseconds(50);
+    std::size_t patientRows = 6144;
     std::chrono::milliseconds busyTimeout{1000};
     std::chrono::nanoseconds firstRetry = std::chrono::milliseconds(100);
     std::chrono::nanoseconds lastRetry = std::chrono::seconds(5);
     // When one operation counts as hanging, by the clock, and how often to look.
     std::chrono::nanoseconds stuckAfter = std::chrono::seconds(10);
     std::chrono::nanoseconds watchPeriod = std::chrono::seconds(1);
-    // How often the age of rows is looked at.
+    // How often the age of rows is looked at, and how often at most when none come: a
+    // tenth of the age in between.
     std::chrono::nanoseconds agePeriod = std::chrono::minutes(1);
+    std::chrono::nanoseconds idlePeriod = std::chrono::minutes(10);
     // How long the end of the store may take.
     std::chrono::nanoseconds closeLimit = std::chrono::seconds(10);
     const char* vfs = nullptr; // SQLite's default
 };
+
+// Where the operator has asked for more than this, groups grow rather than be many.
+inline constexpr std::chrono::milliseconds kPromptInterval{500};
+StoreQueue::Window storeWindow(const StoreOptions& options, const StoreLimits& limits);
 
 struct StoreStatus {
     bool open = false;
@@ -55,6 +62,7 @@ struct StoreStatus {
     std::uint64_t commits = 0;
     std::size_t queuedRows = 0;
     std::size_t queuedBytes = 0;
+    double oldestWaiting = 0; // seconds
     StoreLosses lost{};
     std::uint64_t fileBytes = 0;
     std::uint64_t logBytes = 0;
@@ -94,6 +102,8 @@ private:
     void carryOver(const std::filesystem::path& aside);
     void closeDatabase();
     StoreResult reopenIfNeeded();
+    void writeTaken();
+    std::chrono::nanoseconds idleDelay() const HY_EXCLUDES(mutex_);
     void writeGroup(std::span<StoreItem> group);
     void maintain();
     void purgeIfAsked() HY_EXCLUDES(mutex_);
@@ -121,6 +131,7 @@ private:
     std::uint64_t rejected_ = 0; // rows of the running attempt
     std::string rejection_;      // why the last of them was
     bool trimMore_ = false;
+    std::chrono::nanoseconds commitTime_{}; // what the last one took
     // Set once stop() has found that rows cannot be written: no more attempts.
     std::optional<StoreLoss> surrendered_;
     platform::SteadyTime agedAt_{};

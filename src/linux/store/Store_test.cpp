@@ -2,6 +2,7 @@
 
 #include "linux/store/Store.h"
 
+#include "common/HYReportingUtility.h"
 #include "common/Json.h"
 #include "linux/store/StoreTesting.h"
 
@@ -187,7 +188,7 @@ TEST_F(StoreTest, CommitsAtTheGroupsSizeAndNotBefore) {
 }
 
 TEST_F(StoreTest, CommitsAfterTheDelayToo) {
-    options_.groupDelay = 1ms;
+    options_.limits.syncInterval = 1ms;
     open();
     std::promise<void> written;
     store_->addAnalyticsEvent("lonely", [&written] {
@@ -195,6 +196,66 @@ TEST_F(StoreTest, CommitsAfterTheDelayToo) {
         return Dictionary();
     });
     written.get_future().wait();
+}
+
+TEST_F(StoreTest, ALongIntervalMakesLargerGroups) {
+    std::promise<void> full;
+    options_.groupRows = 4;
+    options_.patientRows = 8;
+    open();
+    addSingles(7, {});
+    EXPECT_EQ(store_->status().commits, 0U);
+    EXPECT_EQ(store_->status().queuedRows, 7U);
+    store_->addAnalyticsEvent("eighth", [&full] {
+        full.set_value();
+        return Dictionary();
+    });
+    full.get_future().wait();
+    flush();
+    EXPECT_EQ(store_->status().commits, 1U);
+}
+
+TEST_F(StoreTest, BytesMakeAGroupToo) {
+    options_.marks.lowBytes = 4096;
+    open();
+    addSingles(1, {{"text", std::string(8192, 'x')}});
+    while (store_->status().commits == 0) { // without a flush, an hour ahead of its time
+        std::this_thread::yield();
+    }
+    EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 1);
+}
+
+TEST_F(StoreTest, AnErrorDoesNotWaitForALongInterval) {
+    open();
+    addSingles(1, {});
+    EXPECT_EQ(store_->status().commits, 0U);
+    const auto upload = store_->openUpload(1, {}, {});
+    EXPECT_TRUE(store_->addMessage(upload, kAudioEventCategoryError, 1, {}));
+    while (store_->status().commits == 0) { // an hour ahead of its time
+        std::this_thread::yield();
+    }
+    EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 2);
+}
+
+TEST_F(StoreTest, AnIntervalThatIsSetHoldsForWhatWaits) {
+    open();
+    addSingles(1, {});
+    StoreLimits limits = options_.limits;
+    limits.syncInterval = StoreLimits::kLeastSyncInterval;
+    store_->setLimits(limits);
+    while (store_->status().commits == 0) {
+        std::this_thread::yield();
+    }
+    EXPECT_EQ(store_->status().queuedRows, 0U);
+}
+
+TEST_F(StoreTest, StatusTellsHowLongTheOldestRowHasWaited) {
+    open();
+    EXPECT_EQ(store_->status().oldestWaiting, 0);
+    addSingles(1, {});
+    EXPECT_GT(store_->status().oldestWaiting, 0);
+    flush();
+    EXPECT_EQ(store_->status().oldestWaiting, 0);
 }
 
 TEST_F(StoreTest, FlushAnswersAtOnceWhenNothingWaits) {
