@@ -175,6 +175,21 @@ TEST(GlitchCauseTest, ExcessIsWhatGoesBeyondTheUsual) {
     EXPECT_EQ(excess.majorFaults->least, 2);
 }
 
+TEST(GlitchCauseTest, AWaitThatIsNotOverCountsUpToNow) {
+    ThreadSample last;
+    const auto look = [&](Nanoseconds at, char state, Nanoseconds cpu, Nanoseconds delay) {
+        ThreadSample sample{.at = at, .cpu = cpu, .delay = delay, .state = state};
+        countWaiting(sample, last);
+        return *sample.delay;
+    };
+    EXPECT_EQ(look(100, 'S', 5, 7), 7);
+    EXPECT_EQ(look(150, 'S', 5, 7), 7); // it sleeps
+    EXPECT_EQ(look(200, 'R', 6, 7), 7);
+    EXPECT_EQ(look(250, 'R', 6, 7), 57);
+    EXPECT_EQ(look(900, 'R', 6, 7), 707);
+    EXPECT_EQ(look(950, 'R', 8, 720), 720); // counted now
+}
+
 TEST(GlitchCauseTest, AnExcessOfWhatWasNotReadIsUnknown) {
     const ThreadExcess excess = excessOf({}, {.at = 0}, {.at = 1, .cpu = 1});
     EXPECT_FALSE(excess.cpu);

@@ -38,6 +38,18 @@ inline bool isStopped(const ThreadSample& sample) {
     return sample.state == 'T' || sample.state == 't';
 }
 
+// The kernel counts a wait for a processor when it is over. A thread that is ready,
+// and has neither run nor been counted since `last`, the first look at these totals,
+// has waited until now; else `last` is this look.
+inline void countWaiting(ThreadSample& sample, ThreadSample& last) {
+    const bool known = sample.cpu && sample.delay && last.at != 0;
+    if (known && sample.state == 'R' && sample.cpu == last.cpu && sample.delay == last.delay) {
+        *sample.delay += sample.at - last.at;
+    } else {
+        last = sample;
+    }
+}
+
 // How much a total grew; nothing when either is unknown, or it began anew.
 template <class Number>
 std::optional<Number> growth(const std::optional<Number>& from, const std::optional<Number>& to) {

@@ -31,7 +31,9 @@ void WatchedProgram::streamStopped(Nanoseconds now) {
 
 void WatchedProgram::sample(Nanoseconds now) {
     if (history_.latest() == nullptr || now - history_.latest()->at >= kSoon) {
-        history_.add(reader_.sample(now));
+        ThreadSample sample = reader_.sample(now);
+        countWaiting(sample, last_);
+        history_.add(sample);
     }
 }
 
@@ -45,6 +47,7 @@ void WatchedProgram::seek(Nanoseconds now, Nanoseconds cycleLength) {
     reader_.findThread(static_cast<std::uint64_t>((now - searchedSince_) / cycleLength), streams_);
     if (!taken.empty() && reader_.thread() != taken) {
         history_ = {}; // it was another's
+        last_ = {};
     }
 }
 

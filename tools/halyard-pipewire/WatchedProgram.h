@@ -37,6 +37,7 @@ public:
 private:
     ProcessReader reader_;
     History<ThreadSample> history_;
+    ThreadSample last_; // the first with the latest totals
     int streams_ = 0;
     int tries_ = 0;
     Nanoseconds searchedSince_ = 0;
