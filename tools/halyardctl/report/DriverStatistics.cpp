@@ -2,6 +2,7 @@
 
 #include <charconv>
 #include <cstddef>
+#include <fmt/format.h>
 
 namespace halyard::ctl {
 namespace {
@@ -60,7 +61,7 @@ bool takeState(std::string_view& text, StateText& state) {
 } // namespace
 
 std::optional<StatisticName> statisticName(std::string_view key, std::string_view kind) {
-    const std::string middle = "_" + std::string(kind) + "_";
+    const std::string middle = fmt::format("_{}_", kind);
     const std::size_t at = key.find(middle);
     if (at == std::string_view::npos) {
         return std::nullopt;
