@@ -42,12 +42,12 @@ class Launcher:
             file.write(text)
         os.rename(path + ".new", path)
 
-    def start(self, **options):
+    def start(self, arguments=(), **options):
         """Starts it; `options` are subprocess.Popen's."""
         environment = {name: value for name, value in os.environ.items() if name not in NOT_FOR_IT}
         environment |= {name: self.path(folder) for name, folder in FOLDERS.items()}
         with open(self.log_path, "ab") as log:
-            self.process = subprocess.Popen([self.program], env=environment, stderr=log,
+            self.process = subprocess.Popen([self.program, *arguments], env=environment, stderr=log,
                                             stdin=subprocess.DEVNULL, **options)
 
     def wait_until_it_accepts(self, seconds):

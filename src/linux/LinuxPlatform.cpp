@@ -67,6 +67,7 @@ LinuxPlatform::LinuxPlatform(Directories directories, platform::TraceMarks& trac
               return std::shared_ptr<const Access>(settings, &settings->access);
           },
           ::getuid()),
+      loop_(context_), idleExit_(system_.clock, loop_, whenIdle()),
       startTime_(system_.clock.steadyTime()) {
     std::signal(SIGPIPE, SIG_IGN);
     platform_.log = &log_;
@@ -168,6 +169,8 @@ Result<void> LinuxPlatform::open(platform::ListenerDelegate* delegate) {
         std::make_unique<SocketListener>(context_, pressure_, listening.value(),
                                          [this](const Peer& peer) { return rightsOfPeer(peer); });
     listener_->setDelegate(delegate);
+    listener_->onConnectionsChanged(
+        [this](std::size_t connections) { idleExit_.connectionsChanged(connections); });
     watchStopSignals();
     watchReloadSignal();
     observeConfiguration();
@@ -195,11 +198,21 @@ void LinuxPlatform::watchReloadSignal() {
 void LinuxPlatform::observeConfiguration() {
     configuration_.configuration.observe([this](const Settings& before, const Settings& after) {
         applySettings(after);
+        idleExit_.setLimit(after.idleExit);
         if (before.access.readers != after.access.readers) {
             keepFilesPrivate(after);
         }
     });
+    idleExit_.setLimit(configuration_.configuration.settings()->idleExit);
     configuration_.announceChanges();
+}
+
+IdleExit::Actions LinuxPlatform::whenIdle() {
+    return {[this](std::function<void()> done) { flush(std::move(done)); },
+            [this](std::function<void(bool)> done) {
+                listener_->stopAcceptingUnlessSomebodyComes(std::move(done));
+            },
+            [this] { beginShutdown(); }};
 }
 
 // The service queue answers the manager's watchdog: it is what must not hang.

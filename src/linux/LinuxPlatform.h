@@ -16,8 +16,10 @@
 #include "common/Result.h"
 #include "linux/config/ConfigurationServices.h"
 #include "linux/drivers/LinuxHWReport.h"
+#include "linux/net/IdleExit.h"
 #include "linux/net/OwnerRights.h"
 #include "linux/net/SocketListener.h"
+#include "linux/queues/ContextQueue.h"
 #include "linux/queues/Pressure.h"
 #include "linux/queues/Queues.h"
 #include "linux/store/StoreServices.h"
@@ -42,7 +44,8 @@ public:
 
     // Opens the socket, inherited or made. Requires that the platform is installed.
     Result<void> open(platform::ListenerDelegate* delegate);
-    // Serves until SIGTERM or SIGINT, then ends every connection, delivers and
+    // Serves until SIGTERM, SIGINT or the end of what the operator waits for somebody,
+    // then ends every connection, delivers and
     // commits what was accepted.
     void serve();
 
@@ -60,6 +63,7 @@ private:
     void watchReloadSignal();
     void observeConfiguration();
     void armWatchdog();
+    IdleExit::Actions whenIdle();
     void beginShutdown();
     void finishShutdown(bool inTime);
     void saveWhatWasAccepted();
@@ -83,6 +87,8 @@ private:
     std::unique_ptr<LinuxHWReport> hwReport_;
     std::unique_ptr<TraceServices> traces_;
     std::unique_ptr<Queues> queues_;
+    ContextQueue loop_;
+    IdleExit idleExit_;
     std::unique_ptr<SocketListener> listener_;
     platform::Platform platform_;
     platform::SteadyTime startTime_;

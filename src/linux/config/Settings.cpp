@@ -60,7 +60,7 @@ private:
     void readPreferences(const toml::node& node, const std::string& name);
     void readFeatureFlags(const toml::node& node, const std::string& name);
     void readMaxBytes(const toml::node& node, const std::string& name);
-    void readMaxAge(const toml::node& node, const std::string& name);
+    std::optional<std::chrono::seconds> duration(const toml::node& node, const std::string& name);
     void readSyncInterval(const toml::node& node, const std::string& name);
     void readChannels(const toml::node& node, const std::string& name);
     void readChannel(const toml::node& node, const std::string& name);
@@ -99,6 +99,16 @@ private:
                                         {"max_age", &SettingsReader::readMaxAge},
                                         {"sync_interval", &SettingsReader::readSyncInterval}};
         readSection(node, name, kKeys);
+    }
+    void readMaxAge(const toml::node& node, const std::string& name) {
+        settings().store.maxAge = duration(node, name).value_or(settings().store.maxAge);
+    }
+    void readService(const toml::node& node, const std::string& name) {
+        static constexpr Key kKeys[] = {{"idle_exit", &SettingsReader::readIdleExit}};
+        readSection(node, name, kKeys);
+    }
+    void readIdleExit(const toml::node& node, const std::string& name) {
+        settings().idleExit = duration(node, name);
     }
     void readLog(const toml::node& node, const std::string& name) {
         static constexpr Key kKeys[] = {{"level", &SettingsReader::readLevel}};
@@ -142,6 +152,7 @@ Result<ParsedSettings, SettingsFailure> SettingsReader::read(const toml::table& 
                                     {"access", &SettingsReader::readAccess},
                                     {"store", &SettingsReader::readStore},
                                     {"log", &SettingsReader::readLog},
+                                    {"service", &SettingsReader::readService},
                                     {"drivers", &SettingsReader::readDrivers}};
     readSection(root, "", kKeys);
     if (failure_) {
@@ -336,17 +347,17 @@ void SettingsReader::readMaxBytes(const toml::node& node, const std::string& nam
     }
 }
 
-void SettingsReader::readMaxAge(const toml::node& node, const std::string& name) {
-    const auto age = parseDuration(node.value_exact<std::string>().value_or(""));
-    if (!age) {
+std::optional<std::chrono::seconds> SettingsReader::duration(const toml::node& node,
+                                                             const std::string& name) {
+    const auto read = parseDuration(node.value_exact<std::string>().value_or(""));
+    if (!read) {
         fail(node, fmt::format("{} must be a duration such as \"7d\", \"12h\", \"30m\" or "
                                "\"45s\", at most \"36500d\"",
                                name));
-    } else if (*age < std::chrono::seconds(1)) {
+    } else if (*read < std::chrono::seconds(1)) {
         fail(node, fmt::format("{} must be at least \"1s\"", name));
-    } else {
-        settings().store.maxAge = *age;
     }
+    return read;
 }
 
 void SettingsReader::readSyncInterval(const toml::node& node, const std::string& name) {

@@ -32,6 +32,7 @@ struct Settings {
     Access access;
     StoreLimits store;
     LogLevel logLevel = LogLevel::Info;
+    std::optional<std::chrono::seconds> idleExit; // none: never
     std::vector<DriverChannel> driverChannels;
 
     bool operator==(const Settings&) const = default;

@@ -82,6 +82,8 @@ max_bytes = "1GiB"
 max_age = "12h"
 [log]
 level = "debug"
+[service]
+idle_exit = "10m"
 )");
     EXPECT_TRUE(all.featureFlags.at("AudioAnalytics").at("Tracing"));
     EXPECT_TRUE(all.deviceProperties.at("InternalBuild"));
@@ -92,6 +94,7 @@ level = "debug"
     EXPECT_EQ(all.store.maxBytes, 1073741824u);
     EXPECT_EQ(all.store.maxAge, 12h);
     EXPECT_EQ(all.logLevel, LogLevel::Debug);
+    EXPECT_EQ(all.idleExit, 10min);
 }
 
 TEST(SettingsTest, AnEmptyListOfWantedEventsWantsNone) {
@@ -244,6 +247,14 @@ TEST(SettingsErrorTest, TheStoreKeepsAtLeastASecond) {
                     HasSubstr("1:17: store.max_age must be a duration"))
             << value;
     }
+}
+
+TEST(SettingsErrorTest, TheDaemonIsIdleForAtLeastASecond) {
+    EXPECT_EQ(settings("").idleExit, std::nullopt);
+    EXPECT_EQ(settings("service.idle_exit = \"1s\"").idleExit, 1s);
+    EXPECT_EQ(mistake("service.idle_exit = \"0s\""),
+              "1:21: service.idle_exit must be at least \"1s\"");
+    EXPECT_THAT(mistake("service.idle_exit = 60"), HasSubstr("must be a duration such as"));
 }
 
 TEST(SettingsErrorTest, AChannelNeedsItsGroupNameAndSource) {

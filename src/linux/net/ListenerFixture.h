@@ -79,13 +79,17 @@ protected:
         }
     }
     int connect() {
+        const int fd = connectUnserved();
+        settle();
+        return fd;
+    }
+    int connectUnserved() {
         const int fd = ::socket(AF_UNIX, SOCK_STREAM, 0);
         sockaddr_un address{};
         address.sun_family = AF_UNIX;
         path_.copy(address.sun_path, sizeof address.sun_path - 1);
         EXPECT_EQ(::connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
         clients_.push_back(fd);
-        settle();
         return fd;
     }
     // As when the client's process ends.

@@ -83,6 +83,22 @@ private:
     const std::uint32_t messageID_;
 };
 
+void ListenerShared::add(const std::shared_ptr<SocketConnection>& connection, std::int32_t pid) {
+    connections.insert(connection);
+    processes.add(pid);
+    if (connectionsChanged) {
+        connectionsChanged(connections.size());
+    }
+}
+
+void ListenerShared::remove(const std::shared_ptr<SocketConnection>& connection, std::int32_t pid) {
+    connections.erase(connection);
+    processes.remove(pid);
+    if (connectionsChanged) {
+        connectionsChanged(connections.size());
+    }
+}
+
 SocketConnection::SocketConnection(asio::local::stream_protocol::socket socket, Peer peer,
                                    PeerRights rights, ListenerShared& shared)
     : socket_(std::move(socket)), peer_(std::move(peer)), rights_(rights), shared_(shared) {}
@@ -373,8 +389,7 @@ void SocketConnection::end(Ending ending) {
     stopAnswering();
     asio::error_code ignored;
     socket_.close(ignored);
-    shared_.connections.erase(self);
-    shared_.processes.remove(peer_.pid);
+    shared_.remove(self, peer_.pid);
     if (ending == Ending::Broken && interruptionHandler_) {
         interruptionHandler_();
     }

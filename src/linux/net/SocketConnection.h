@@ -55,8 +55,12 @@ struct ListenerShared {
     std::string buffer;
     protocol::CallDecoder decoder;
     std::unordered_set<std::shared_ptr<SocketConnection>> connections;
+    std::function<void(std::size_t connections)> connectionsChanged; // may be none
     ListenerCounters counters;
     ProcessList processes; // of the connections; any thread
+
+    void add(const std::shared_ptr<SocketConnection>& connection, std::int32_t pid);
+    void remove(const std::shared_ptr<SocketConnection>& connection, std::int32_t pid);
 };
 
 class SocketConnection final : public platform::Connection,

@@ -114,6 +114,7 @@ void SocketListener::accept() {
     acceptor_.async_accept(
         [this](const asio::error_code& error, asio::local::stream_protocol::socket socket) {
             if (error == asio::error::operation_aborted || !acceptor_.is_open()) {
+                answerLeaver(true);
                 return;
             }
             if (error) {
@@ -123,6 +124,7 @@ void SocketListener::accept() {
             acceptFailureLogged_ = false;
             accepted(std::move(socket));
             accept();
+            answerLeaver(false);
         });
 }
 
@@ -134,10 +136,27 @@ void SocketListener::acceptFailed(const asio::error_code& error) {
     }
     retry_.expires_after(kAcceptRetry);
     retry_.async_wait([this](const asio::error_code& aborted) {
-        if (!aborted) {
+        if (aborted) {
+            answerLeaver(true);
+        } else {
             accept();
         }
     });
+}
+
+// The one operation that waits for a connection, or for another try, says how it ended:
+// cancelled, so nobody is in hand, or with a connection that came first.
+void SocketListener::stopAcceptingUnlessSomebodyComes(std::function<void(bool)> done) {
+    leaver_ = std::move(done);
+    asio::error_code ignored;
+    acceptor_.cancel(ignored);
+    retry_.cancel();
+}
+
+void SocketListener::answerLeaver(bool stopped) {
+    if (const auto leaver = std::exchange(leaver_, nullptr)) {
+        leaver(stopped);
+    }
 }
 
 void SocketListener::accepted(asio::local::stream_protocol::socket socket) {
@@ -150,8 +169,7 @@ void SocketListener::accepted(asio::local::stream_protocol::socket socket) {
     refusedUid_.reset();
     ++shared_.counters.accepted;
     auto connection = std::make_shared<SocketConnection>(std::move(socket), peer, rights, shared_);
-    shared_.connections.insert(connection);
-    shared_.processes.add(peer.pid);
+    shared_.add(connection, peer.pid);
     if (delegate_ == nullptr || !delegate_->shouldAcceptNewConnection(connection)) {
         connection->close();
     }

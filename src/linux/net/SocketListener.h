@@ -38,6 +38,13 @@ public:
 
     // On the io_context's thread.
     void stopAccepting();
+    // Leaves who connects from now on to whoever else holds the socket, and calls back
+    // with true; or with false, and goes on, when somebody has come already. Later, never
+    // from within. Requires that no earlier call is unanswered.
+    void stopAcceptingUnlessSomebodyComes(std::function<void(bool stopped)> done);
+    void onConnectionsChanged(std::function<void(std::size_t connections)> changed) {
+        shared_.connectionsChanged = std::move(changed);
+    }
     void closeAllConnections();
 
     // Any thread.
@@ -48,6 +55,7 @@ private:
     void accept();
     void accepted(asio::local::stream_protocol::socket socket);
     void acceptFailed(const asio::error_code& error);
+    void answerLeaver(bool stopped);
     void refuse(const Peer& peer);
     void resumeReading();
 
@@ -59,6 +67,7 @@ private:
     ListenerShared shared_;
     std::optional<std::uint32_t> refusedUid_; // The episode that has been logged.
     bool acceptFailureLogged_ = false;
+    std::function<void(bool)> leaver_;
 };
 
 // A listening socket at `path` (mode 0666), replacing the leftover of a daemon

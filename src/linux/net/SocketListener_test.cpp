@@ -141,5 +141,50 @@ TEST(PeerOfSocket, TellsWhoConnected) {
     ::close(ends[1]);
 }
 
+TEST_F(SocketListenerTest, TellsHowManyAreConnected) {
+    std::vector<std::size_t> told;
+    listener_->onConnectionsChanged([&](std::size_t connections) { told.push_back(connections); });
+    const int first = connect();
+    connect();
+    leave(first);
+    rights_ = PeerRights::None;
+    connect();
+
+    EXPECT_EQ(told, (std::vector<std::size_t>{1, 2, 1}));
+    listener_->onConnectionsChanged(nullptr);
+}
+
+TEST_F(SocketListenerTest, LeavesNewcomersToOthersOnceItHasStopped) {
+    std::optional<bool> stopped;
+    listener_->stopAcceptingUnlessSomebodyComes([&](bool is) { stopped = is; });
+    settle();
+    const int client = connect();
+
+    EXPECT_EQ(stopped, true);
+    EXPECT_EQ(receive(client), "") << "it waits for whoever accepts next";
+    EXPECT_EQ(listener_->counters().accepted.load(), 0u);
+}
+
+TEST_F(SocketListenerTest, WhoWasAcceptedInThatMomentIsServed) {
+    std::optional<bool> stopped;
+    // Of two that wait, the second is in hand once the first has been told of.
+    listener_->onConnectionsChanged([&](std::size_t connections) {
+        asio::post(context_, [&, connections] {
+            if (connections == 1) {
+                listener_->stopAcceptingUnlessSomebodyComes([&](bool is) { stopped = is; });
+            }
+        });
+    });
+    connectUnserved();
+    connectUnserved();
+    settle();
+    listener_->onConnectionsChanged(nullptr);
+
+    EXPECT_EQ(stopped, false);
+    EXPECT_EQ(listener_->counters().accepted.load(), 2u);
+    connect();
+    EXPECT_EQ(listener_->counters().accepted.load(), 3u) << "it went on";
+}
+
 } // namespace
 } // namespace halyard::linux_

@@ -18,9 +18,9 @@ std::shared_ptr<void> whenReleased(std::function<void()> done) {
 } // namespace
 
 Queues::Queues(asio::io_context& timers, Pressure& pressure)
-    : timers_(timers), pressure_(pressure),
+    : timers_(timers), pressure_(pressure), later_(timers),
       timer_([this](std::chrono::nanoseconds delay, platform::Task task) {
-          after(delay, std::move(task));
+          later_.asyncAfter(delay, std::move(task));
       }),
       service_("hy-service", 1, platform::QueuePriority::UserInteractive),
       relay_("hy-relay", kRelayThreads, platform::QueuePriority::Utility),
@@ -52,18 +52,6 @@ std::shared_ptr<platform::SerialQueue> Queues::makeSerialQueue(std::string_view 
     }
     relayQueues_.push_back(queue);
     return queue;
-}
-
-void Queues::after(std::chrono::nanoseconds delay, platform::Task task) {
-    asio::post(timers_, [this, delay, task = std::move(task)] {
-        auto timer = std::make_shared<asio::steady_timer>(
-            timers_, std::chrono::duration_cast<asio::steady_timer::duration>(delay));
-        timer->async_wait([timer, task](const asio::error_code& error) {
-            if (!error) {
-                task();
-            }
-        });
-    });
 }
 
 void Queues::Background::async(platform::Task task) {

@@ -12,6 +12,7 @@
 #include <vector>
 
 #include "common/Mutex.h"
+#include "linux/queues/ContextQueue.h"
 #include "linux/queues/PooledSerialQueue.h"
 #include "linux/queues/Pressure.h"
 #include "linux/queues/Worker.h"
@@ -62,7 +63,6 @@ private:
         platform::Task task;
     };
 
-    void after(std::chrono::nanoseconds delay, platform::Task task);
     void runDelayed(std::list<Delayed>::iterator delayed);
     void addDelayed(std::chrono::nanoseconds delay, platform::Task task);
     std::shared_ptr<PooledSerialQueue> serviceQueue() HY_EXCLUDES(mutex_);
@@ -73,6 +73,7 @@ private:
 
     asio::io_context& timers_;
     Pressure& pressure_;
+    ContextQueue later_;
     const PooledSerialQueue::Timer timer_;
     Worker service_;
     Worker relay_;
