@@ -14,7 +14,7 @@ RUN_PACKAGES := pipewire pipewire-bin pipewire-pulse libspa-0.2-modules wireplum
 PICTURE_PACKAGES := chromium chromium-driver python3-selenium
 TEST_PACKAGES := libmsgpack-cxx-dev libgtest-dev libgmock-dev libbenchmark-dev libsndfile1-dev \
 	clang-format python3-msgpack \
-	neovim pipewire-jack jackd2 systemd $(PICTURE_PACKAGES)
+	neovim pipewire-jack jackd2 systemd mandoc zsh $(PICTURE_PACKAGES)
 CHECK_PACKAGES := clang clang-tidy libclang-rt-14-dev
 BENCH_PACKAGES := libmsgpack-cxx-dev libbenchmark-dev sqlite3
 

@@ -8,12 +8,14 @@ import unittest
 
 from installed import BUILD, PATIENCE, PREFIX, Root
 
+ZSH = "share/zsh/" + ("vendor-completions" if PREFIX == "/usr" else "site-functions")
 UNITS = "/lib/systemd/system" if PREFIX == "/usr" else "lib/systemd/system"
 COMPONENTS = {
     "halyard": [
         "/etc/halyard/halyard.toml", f"{UNITS}/halyardd.service", f"{UNITS}/halyardd.socket",
         "lib/sysusers.d/halyard.conf", "sbin/halyardd",
-        "share/doc/halyard/examples/event-traces.conf"],
+        "share/doc/halyard/examples/event-traces.conf",
+        "share/man/man5/halyard.toml.5", "share/man/man8/halyardd.8"],
     "libhalyard0": ["LIB/libhalyard.so.0", "LIB/libhalyard.so.0.1.0"],
     "libhalyard-dev": [
         "LIB/cmake/halyard/halyardConfig.cmake", "LIB/cmake/halyard/halyardConfigVersion.cmake",
@@ -21,9 +23,13 @@ COMPONENTS = {
         "LIB/cmake/halyard/halyardTargets.cmake", "LIB/libhalyard.so",
         "LIB/pkgconfig/halyard.pc", "include/halyard/halyard.h", "include/halyard/halyard.hpp",
         "share/doc/libhalyard-dev/examples/player.c",
-        "share/doc/libhalyard-dev/examples/recorder.cpp"],
-    "halyard-tools": ["bin/halyardctl"],
-    "halyard-pipewire": ["bin/halyard-pipewire", "lib/systemd/user/halyard-pipewire.service"],
+        "share/doc/libhalyard-dev/examples/recorder.cpp", "share/man/man3/halyard.3"],
+    "halyard-tools": [
+        "bin/halyardctl", "share/bash-completion/completions/halyardctl",
+        "share/man/man1/halyardctl.1", f"{ZSH}/_halyardctl"],
+    "halyard-pipewire": [
+        "bin/halyard-pipewire", "lib/systemd/user/halyard-pipewire.service",
+        "share/man/man1/halyard-pipewire.1"],
 }
 
 
