@@ -83,12 +83,13 @@ void GlitchFinder::forget(StreamKey key) {
 }
 
 // Node IDs are used again while records of an earlier node's time are still to come.
-GlitchFinder::Stream* GlitchFinder::running(ObjectId node, Nanoseconds at) {
+std::pair<const StreamKey, GlitchFinder::Stream>* GlitchFinder::running(ObjectId node,
+                                                                        Nanoseconds at) {
     const auto [first, last] = byNode_.equal_range(node);
     for (auto entry = first; entry != last; ++entry) {
-        Stream& stream = streams_.at(entry->second);
-        if (at >= stream.from && (!stream.until || at < *stream.until)) {
-            return &stream;
+        auto& found = *streams_.find(entry->second);
+        if (at >= found.second.from && (!found.second.until || at < *found.second.until)) {
+            return &found;
         }
     }
     return nullptr;
@@ -106,7 +107,7 @@ std::optional<GlitchFinder::Moment> GlitchFinder::momentOf(const Cycle& cycle) {
     if (device.previousSignal == device.signal || device.signal <= driver.signal) {
         return std::nullopt;
     }
-    Moment moment{.start = device.signal, .length = length, .driver = device.id};
+    Moment moment{.cycle = &cycle, .start = device.signal, .length = length, .driver = device.id};
     moment.incomplete = std::any_of(cycle.followers.begin(), cycle.followers.end(), isUnfinished);
     const Nanoseconds due = cycle.clock - (moment.incomplete ? length : 0);
     moment.lateness = device.signal - due;
@@ -142,13 +143,9 @@ void GlitchFinder::take(const Cycle& cycle) {
     if (!moment) {
         return;
     }
-    cycle_ = &cycle;
     for (const NodeCycle& node : cycle.followers) {
-        if (Stream* const stream = running(node.id, moment->start)) {
-            const auto [first, last] = byNode_.equal_range(node.id);
-            const auto entry = std::find_if(
-                first, last, [&](const auto& each) { return &streams_.at(each.second) == stream; });
-            look(entry->second, *stream, node, *moment);
+        if (auto* const found = running(node.id, moment->start)) {
+            look(found->first, found->second, node, *moment);
         }
     }
 }
@@ -184,10 +181,9 @@ bool GlitchFinder::countsMore(Stream& stream, const NodeCycle& node) {
     return before && node.missedSoFar && *node.missedSoFar > *before && !stream.episode;
 }
 
-void GlitchFinder::weighOthers(Episode& episode, const NodeCycle& node,
-                               const Moment& moment) const {
+void GlitchFinder::weighOthers(Episode& episode, const NodeCycle& node, const Moment& moment) {
     double sum = 0;
-    for (const NodeCycle& other : cycle_->followers) {
+    for (const NodeCycle& other : moment.cycle->followers) {
         if (other.id != node.id) {
             const double work = workOf(other, moment.start, moment.length);
             sum += work;

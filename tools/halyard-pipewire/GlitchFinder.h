@@ -17,6 +17,7 @@
 #include <map>
 #include <optional>
 #include <unordered_map>
+#include <utility>
 
 #include "Cycle.h"
 
@@ -123,6 +124,7 @@ private:
     };
     // What a record says of its cycle as a whole.
     struct Moment {
+        const Cycle* cycle = nullptr; // the record
         Nanoseconds start = 0;
         Nanoseconds length = 0;
         Nanoseconds lateness = 0;
@@ -133,9 +135,9 @@ private:
     };
 
     std::optional<Moment> momentOf(const Cycle& cycle);
-    Stream* running(ObjectId node, Nanoseconds at);
+    std::pair<const StreamKey, Stream>* running(ObjectId node, Nanoseconds at);
     static bool countsMore(Stream& stream, const NodeCycle& node);
-    void weighOthers(Episode& episode, const NodeCycle& node, const Moment& moment) const;
+    static void weighOthers(Episode& episode, const NodeCycle& node, const Moment& moment);
     void look(StreamKey key, Stream& stream, const NodeCycle& node, const Moment& moment);
     void miss(StreamKey key, Stream& stream, const NodeCycle& node, const Moment& moment);
     static void recover(Stream& stream, const NodeCycle& node, const Moment& moment);
@@ -146,7 +148,6 @@ private:
     bool isOver(const Stream& stream, Nanoseconds now) const;
     static bool isEnding(const Stream& stream);
 
-    const Cycle* cycle_ = nullptr; // under way
     std::map<StreamKey, Stream> streams_;
     std::unordered_multimap<ObjectId, StreamKey> byNode_;
     std::unordered_map<ObjectId, Driver> drivers_;
