@@ -312,6 +312,7 @@ void LinuxPlatform::purgeStore(const PurgeReply& reply, const Result<void>& inci
 
 Dictionary LinuxPlatform::status() const {
     const std::chrono::duration<double> uptime = system_.clock.steadyTime() - startTime_;
+    const StoreStatus store = store_->store.status();
     return Dictionary{{"version", HALYARD_VERSION},
                       {"pid", ownProcess_.pid()},
                       {"uptime_sec", uptime.count()},
@@ -321,7 +322,8 @@ Dictionary LinuxPlatform::status() const {
                       {"listener", describe(listener_->counters())},
                       {"incidents", Dictionary{{"refused", incidents_->refusedSnapshots()},
                                                {"failed", incidents_->failedSnapshots()}}},
-                      {"store", describe(store_->store.status())}};
+                      {"messages", platform_.messageAccounts.describe(settledMessages(store))},
+                      {"store", describe(store)}};
 }
 
 } // namespace halyard::linux_

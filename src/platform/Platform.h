@@ -7,6 +7,8 @@
 
 #include <mutex>
 
+#include "platform/MessageAccounts.h"
+
 namespace halyard::platform {
 
 class AnalyticsService;
@@ -72,6 +74,8 @@ struct Platform {
     HWReport* hwReport = nullptr;
     // Not borrowed, and why a platform cannot be copied.
     BuildKind buildKind = {};
+    // Nor is this.
+    MessageAccounts messageAccounts = {};
 };
 
 // Replaces what was installed before; null uninstalls. Requires that no other
@@ -80,5 +84,9 @@ void install(const Platform* platform);
 
 // Requires an installed platform.
 const Platform& current();
+
+inline void count(MessageCount what) {
+    current().messageAccounts.add(what);
+}
 
 } // namespace halyard::platform

@@ -47,6 +47,10 @@ enum class UploadEnding : std::uint8_t {
     Disconnected, // The client was lost, or the daemon was told to end.
 };
 
+// The code of an error for want of any back end. With another one a back end was given
+// the message, and accounts for it.
+inline constexpr std::int64_t kRelayReportingNoBackend = 2;
+
 // One upload session. Dropping the last reference closes it.
 class RelayReporting {
 public:

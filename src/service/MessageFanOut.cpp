@@ -9,6 +9,8 @@
 namespace halyard {
 namespace {
 
+using platform::MessageCount;
+
 constexpr std::uint32_t kSendMark = 0x21044824;
 constexpr std::int64_t kReportingDisabled = 1;
 constexpr std::int64_t kStandaloneReporterID = 1;
@@ -37,8 +39,10 @@ MaybeError MessageFanOut::route(const std::optional<std::vector<std::int64_t>>& 
                  describeIDs(reporterIDs));
     platform::current().traceMarks->mark(kSendMark, 0, 0, 0, 0);
     if (!delegate_.isReportingEnabled()) {
+        platform::count(MessageCount::Refused);
         return Error{std::string(kReportingErrorDomain), kReportingDisabled, {}};
     }
+    platform::count(MessageCount::Requests);
     if (reporterIDs) {
         sendToAddressed(*reporterIDs, findAcrossAllClients);
     } else {
@@ -49,18 +53,23 @@ MaybeError MessageFanOut::route(const std::optional<std::vector<std::int64_t>>& 
 
 void MessageFanOut::sendToAddressed(const std::vector<std::int64_t>& reporterIDs,
                                     const Lookup& findAcrossAllClients) {
+    bool reachedOne = false;
     // Kept: an ID that stands twice is offered the message twice.
     for (const std::int64_t& reporterID : reporterIDs) {
         if (reporterID == 0) {
             continue;
         }
         if (const Session session = findAcrossAllClients(reporterID)) {
+            reachedOne = true;
             offerToSinks(session);
             // The last takes it over, and may change what nobody else holds.
             const bool last = &reporterID == &reporterIDs.back();
-            session->sendMessage(last ? std::move(message_.payload) : message_.payload,
-                                 message_.category, message_.type, nullptr);
+            session->offer(last ? std::move(message_.payload) : message_.payload, message_.category,
+                           message_.type);
         }
+    }
+    if (!reachedOne) {
+        platform::count(MessageCount::Unaddressed);
     }
 }
 
@@ -71,7 +80,7 @@ void MessageFanOut::broadcast() const {
     for (const Session& session : sessions) {
         // Kept: the session first here, last when it is addressed. Readers of the
         // store rely on either order.
-        session->sendMessage(message_.payload, message_.category, message_.type, nullptr);
+        session->offer(message_.payload, message_.category, message_.type);
         offerToSinks(session);
     }
     if (sessions.empty()) {
@@ -89,6 +98,7 @@ void MessageFanOut::sendStandalone() const {
     offerToSinks(standalone);
     HY_LOG_DEFAULT(HYReportingClientCategory,
                    "no active reporting sessions found, sending as standalone");
+    platform::count(MessageCount::Offered);
     HYReportingSession::sendSingleMessage(message_.payload, message_.category, message_.type,
                                           kAudioServiceTypeStandalone, delegate_.getDefaults(),
                                           nullptr);

@@ -15,6 +15,8 @@
 namespace halyard {
 namespace {
 
+using platform::MessageCount;
+
 constexpr std::uint32_t kCreatedMark = 0x21044828;
 constexpr std::uint32_t kStartMark = 0x2104482C;
 constexpr std::uint32_t kStopMark = 0x21044830;
@@ -197,8 +199,23 @@ void HYReportingSession::relayRepeats() {
     }
 }
 
+void HYReportingSession::offer(Dictionary message, AudioEventCategory category,
+                               AudioEventType type) {
+    platform::count(MessageCount::Offered);
+    take(std::move(message), category, type);
+}
+
 void HYReportingSession::sendMessage(Dictionary message, AudioEventCategory category,
                                      AudioEventType type, bool /*sync*/, const SendReply& reply) {
+    platform::count(MessageCount::Own);
+    take(std::move(message), category, type);
+    if (reply) {
+        reply(std::nullopt);
+    }
+}
+
+void HYReportingSession::take(Dictionary message, AudioEventCategory category,
+                              AudioEventType type) {
     onServiceQueue_.check();
     HY_LOG_DEBUG(HYReportingSessionCategory, "sending message for session owned by {}",
                  reporterID_);
@@ -211,15 +228,17 @@ void HYReportingSession::sendMessage(Dictionary message, AudioEventCategory cate
         batch_.createMessageIdentifierWithCategory(category, type, tagged.payload);
     mark(kMessageMark);
     const bool wasStarted = started();
+    if (redundant) {
+        platform::count(MessageCount::Repeats);
+    } else if (!relayReportingEnabled()) {
+        platform::count(MessageCount::Limit);
+    }
     if (relayReportingEnabled()) {
         if (repeats) {
             upload_.relay(shared_from_this(), *repeats);
         }
         upload_.relay(shared_from_this(),
                       {std::move(tagged), std::move(original), wasStarted, redundant});
-    }
-    if (reply) {
-        reply(std::nullopt);
     }
 }
 

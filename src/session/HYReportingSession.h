@@ -64,6 +64,9 @@ public:
     void updateConfigurationWithContentsOfConfiguration(const Dictionary& update)
         HY_EXCLUDES(mutex_);
 
+    // A client's message, which sendMessage takes for one of the daemon's own.
+    void offer(Dictionary message, AudioEventCategory category, AudioEventType type);
+
     // Batches the message unless it repeats its predecessor and, with relay
     // reporting enabled, hands it on to the relay queue. `sync` is ignored: every
     // delivery is asynchronous. The reply may be null; it is called at once and
@@ -129,6 +132,7 @@ public:
 private:
     HYReportingSession(std::int64_t reporterID, std::vector<std::int32_t> processIdentifiers);
 
+    void take(Dictionary message, AudioEventCategory category, AudioEventType type);
     void sendVolumeEvents();
     void sendSummaryEvent();
 

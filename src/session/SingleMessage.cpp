@@ -32,6 +32,7 @@ MaybeError upload(const Message& message, AudioServiceType serviceType) {
          Value(HYReportingUtilityGenerateServiceNameFromServiceType(serviceType))}};
     const Dictionary payload = HYReportingUtilityRemoveWhiteSpaceFromKeys(message.payload);
     if (!HYReportingUtilityShouldSendMessage()) {
+        count(MessageCount::Sampled);
         HY_LOG_INFO(HYReportingSessionCategory, "event sampled {}", Value(message.payload));
         return std::nullopt;
     }
@@ -40,6 +41,9 @@ MaybeError upload(const Message& message, AudioServiceType serviceType) {
         HYReportingUtilityRetrieveRelayReportingCategoryFromCategory(message.category),
         message.type, payload);
     if (error) {
+        if (error->code == kRelayReportingNoBackend) {
+            count(MessageCount::NoBackend);
+        }
         HY_LOG_ERROR(HYReportingSessionCategory, "sendOneMessageWithSessionInfo {}",
                      error->message);
     } else {

@@ -176,6 +176,19 @@ void Upload::relay(Session session, const Repeats& repeats) {
     });
 }
 
+std::optional<MessageCount> Upload::ruleAgainst(const RelayReporting* upload) const {
+    if (!HYReportingUtilityAllowSessionTransactions()) {
+        return MessageCount::Transactions;
+    }
+    if (session_.serviceType() == kAudioServiceTypeTest) {
+        return MessageCount::Test;
+    }
+    if (upload == nullptr || !relayReportingSessionStarted_.load()) {
+        return MessageCount::NoBackend;
+    }
+    return std::nullopt;
+}
+
 void Upload::deliver(Delivery delivery) {
     HY_LOG_DEBUG(HYReportingSessionRelayReportingCategory, "entering relayreporting {}", __func__);
     if (!delivery.wasStarted) {
@@ -184,14 +197,12 @@ void Upload::deliver(Delivery delivery) {
         sendSingleMessage(std::move(delivery.tagged), session_.serviceType(), nullptr);
         return;
     }
-    if (!HYReportingUtilityAllowSessionTransactions() ||
-        session_.serviceType() == kAudioServiceTypeTest || delivery.redundant ||
-        !relayReportingSessionStarted_.load()) {
+    if (delivery.redundant) {
         return;
     }
     const auto upload = relayReportingSession();
-    if (upload == nullptr) {
-        return;
+    if (const auto rule = ruleAgainst(upload.get())) {
+        return count(*rule);
     }
     auto& [payload, category, type] = delivery.tagged;
     const MaybeError error = upload->sendMessageWithCategory(

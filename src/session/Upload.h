@@ -18,6 +18,7 @@
 
 #include "common/Message.h"
 #include "common/Mutex.h"
+#include "platform/MessageAccounts.h"
 #include "platform/RelayReporting.h"
 #include "platform/WorkQueue.h"
 #include "session/AsyncSemaphore.h"
@@ -73,6 +74,8 @@ private:
     void openRelayReporting(const std::shared_ptr<Upload>& self, const Opening& opening);
     void finishOpening(bool signalled);
     void deliver(Delivery delivery);
+    // Why messages of now are not uploaded; none when they are.
+    std::optional<platform::MessageCount> ruleAgainst(const platform::RelayReporting* upload) const;
     void closeRelayReporting(platform::UploadEnding ending);
     void dropRelayReportingSession() HY_EXCLUDES(mutex_);
 

@@ -54,6 +54,7 @@ public:
                                              std::uint32_t type,
                                              const Dictionary& payload) override {
         if (failure) {
+            ++failed;
             return failure;
         }
         singles.push_back({sessionInfo, userInfo, {category, type, payload}});
@@ -62,6 +63,7 @@ public:
 
     Backends backends = Backends::AnswerAtOnce;
     MaybeError failure; // what every send answers
+    std::uint64_t failed = 0;
     std::vector<std::shared_ptr<Upload>> uploads;
     std::vector<Single> singles;
 
@@ -88,6 +90,7 @@ private:
         MaybeError sendMessageWithCategory(std::uint16_t category, std::uint32_t type,
                                            Dictionary payload) override {
             if (owner_.failure) {
+                ++owner_.failed;
                 return owner_.failure;
             }
             upload_->messages.push_back({category, type, std::move(payload)});

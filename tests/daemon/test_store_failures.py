@@ -68,7 +68,7 @@ class OnTmpfs(unittest.TestCase):
 
     @staticmethod
     def lost(client):
-        return client.result("admin.status")["store"]["lost"]["disk_full"]
+        return client.result("admin.status")["store"]["lost"]["upload_message"]["disk_full"]
 
 
 class NotOpened(unittest.TestCase):

@@ -76,16 +76,26 @@ Dictionary named(const std::array<std::uint64_t, Size>& counts, Name nameOf) {
 Dictionary describe(const StoreStatus& store) {
     const auto table = [](std::size_t i) { return kStoreSchema[i].name; };
     const auto loss = [](std::size_t i) { return kStoreLossNames[i].inStatus; };
+    Dictionary lost;
+    for (std::size_t i = 0; i < kStoreTables; ++i) {
+        lost.set(table(i), named(store.lost[i], loss));
+    }
     return Dictionary{{"open", store.open},
                       {"failing", store.failing},
                       {"rows", named(store.rows, table)},
-                      {"lost", named(store.lost, loss)},
+                      {"lost", lost},
+                      {"removed", named(store.removed, table)},
                       {"commits", store.commits},
                       {"queued_rows", store.queuedRows},
                       {"queued_bytes", store.queuedBytes},
                       {"oldest_waiting_sec", store.oldestWaiting},
                       {"file_bytes", store.fileBytes},
                       {"log_bytes", store.logBytes}};
+}
+
+std::uint64_t settledMessages(const StoreStatus& store) {
+    const auto messages = static_cast<std::size_t>(StoreTable::UploadMessage);
+    return store.rows[messages] + sum(store.lost[messages]);
 }
 
 Store::Store(const StoreOptions& options, const platform::Clock& clock)
@@ -173,6 +183,9 @@ void Store::closeUpload(const StoreUploadPtr& upload, platform::UploadEnding end
 
 bool Store::addMessage(const StoreUploadPtr& upload, std::uint16_t category, std::uint32_t type,
                        Dictionary payload) {
+    if (!open_) {
+        return false; // No back end is none that lost it.
+    }
     const bool taken =
         queue_->push(StoreMessageRow{upload, std::move(payload), type, category, now()});
     hurryFor(category);
@@ -193,8 +206,8 @@ bool Store::addRepeats(const StoreUploadPtr& upload, const platform::Repeats& re
 bool Store::addSingleMessage(const Dictionary& sessionInfo, const Dictionary& userInfo,
                              std::uint16_t category, std::uint32_t type,
                              const Dictionary& payload) {
-    const bool taken =
-        queue_->push(StoreSingleRow{sessionInfo, userInfo, payload, type, category, now()});
+    const bool taken = open_ && queue_->push(StoreSingleRow{sessionInfo, userInfo, payload, type,
+                                                            category, now()});
     hurryFor(category);
     return taken;
 }

@@ -25,6 +25,8 @@ struct StoreEnding;
 
 // As admin.status shows it.
 Dictionary describe(const StoreStatus& store);
+// Messages that were committed or counted as lost.
+std::uint64_t settledMessages(const StoreStatus& store);
 
 class Store final {
 public:
@@ -36,7 +38,7 @@ public:
     Store& operator=(const Store&) = delete;
 
     // False when the store cannot be opened at all; it stays so. Everything that
-    // is added is counted as lost then.
+    // is added is counted as lost then, but for messages: there is no back end for them.
     bool isOpen() const { return open_; }
 
     // Writes the session's row. Never null.

@@ -25,7 +25,7 @@ bool StoreQueue::push(StoreRow row, std::size_t hiddenBytes, OnDrop onDrop) {
         const bool refused = stopping_ || (failing_ && crowdedLocked());
         if (refused) {
             if (onDrop == OnDrop::Count) {
-                ++lost_[static_cast<std::size_t>(failing_.value_or(StoreLoss::NoStore))];
+                countLostLocked(failing_.value_or(StoreLoss::NoStore), tableOf(row));
             }
             return false;
         }
@@ -143,9 +143,13 @@ StoreQueue::Levels StoreQueue::levels() const {
     return {heldRows_, heldBytes_, lost_, oldest};
 }
 
-void StoreQueue::countLost(StoreLoss reason, std::uint64_t rows) {
+void StoreQueue::countLost(StoreLoss reason, StoreTable table) {
     const MutexLock lock(mutex_);
-    lost_[static_cast<std::size_t>(reason)] += rows;
+    countLostLocked(reason, table);
+}
+
+void StoreQueue::countLostLocked(StoreLoss reason, StoreTable table) {
+    ++lost_[static_cast<std::size_t>(table)][static_cast<std::size_t>(reason)];
 }
 
 void StoreQueue::noteTightLocked() {

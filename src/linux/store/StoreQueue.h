@@ -49,6 +49,7 @@ inline constexpr std::array<StoreLossName, kStoreLosses> kStoreLossNames = {
      {"stuck", "the file system does not answer"},
      {"rejected", "rejected"}}};
 using StoreLosses = std::array<std::uint64_t, kStoreLosses>;
+using StoreLossesByTable = std::array<StoreLosses, kStoreTables>;
 
 class StoreQueue {
 public:
@@ -69,7 +70,7 @@ public:
     struct Levels {
         std::size_t rows = 0;
         std::size_t bytes = 0;
-        StoreLosses lost{};
+        StoreLossesByTable lost{};
         std::chrono::nanoseconds oldest{}; // How long the first of them has waited.
     };
     enum class Wake { Rows, Idle, Stopped };
@@ -109,7 +110,7 @@ public:
     }
     void notePayloadBytes(std::size_t bytes);
     Levels levels() const HY_EXCLUDES(mutex_);
-    void countLost(StoreLoss reason, std::uint64_t rows) HY_EXCLUDES(mutex_);
+    void countLost(StoreLoss reason, StoreTable table) HY_EXCLUDES(mutex_);
 
     // Writer's thread: waits until there is a group of rows, or its window has passed
     // since the first of fewer rows came, or they are wanted at once. Idle when there is
@@ -130,6 +131,7 @@ private:
         std::function<void()> done;
     };
 
+    void countLostLocked(StoreLoss reason, StoreTable table) HY_REQUIRES(mutex_);
     void appendLocked(StoreRow&& row, std::size_t bytes) HY_REQUIRES(mutex_);
     bool crowdedLocked() const HY_REQUIRES(mutex_);
     void noteTightLocked() HY_REQUIRES(mutex_);
@@ -155,7 +157,7 @@ private:
     std::uint64_t pushed_ HY_GUARDED_BY(mutex_) = 0;
     std::uint64_t settled_ HY_GUARDED_BY(mutex_) = 0;
     std::vector<Flush> flushes_ HY_GUARDED_BY(mutex_);
-    StoreLosses lost_ HY_GUARDED_BY(mutex_){};
+    StoreLossesByTable lost_ HY_GUARDED_BY(mutex_){};
     std::optional<StoreLoss> failing_ HY_GUARDED_BY(mutex_);
     bool pressure_ HY_GUARDED_BY(mutex_) = false;
     bool takeAll_ HY_GUARDED_BY(mutex_) = false;

@@ -14,9 +14,10 @@ constexpr int kTokenWords = 8;
 constexpr std::uint32_t kWordValues = 0x10000;
 
 MaybeError notTaken(const Store& store) {
-    return Error{
-        std::string(kStoreErrorDomain), static_cast<std::int64_t>(StoreErrorCode::NotTaken),
-        store.isOpen() ? "the store cannot write and takes no more rows" : "there is no store"};
+    const StoreErrorCode code = store.isOpen() ? StoreErrorCode::NotTaken : StoreErrorCode::NoStore;
+    return Error{std::string(kStoreErrorDomain), static_cast<std::int64_t>(code),
+                 store.isOpen() ? "the store cannot write and takes no more rows"
+                                : "there is no store"};
 }
 
 bool names(const List& frameworks, std::string_view backend) {

@@ -12,7 +12,8 @@ namespace halyard::linux_ {
 inline constexpr std::string_view kStoreErrorDomain = "com.kestrel.halyard.store";
 
 enum class StoreErrorCode : std::int64_t {
-    NotTaken = 1, // There is no store, or what waits for it fills the bounds.
+    NotTaken = 1, // What waits for the store fills the bounds.
+    NoStore = platform::kRelayReportingNoBackend,
 };
 
 class StoreRelayReporting final : public platform::RelayReportingFramework {

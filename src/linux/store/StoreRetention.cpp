@@ -103,6 +103,7 @@ int StoreRetention::prepare(sqlite3* database) {
 StoreResult StoreRetention::trim(StoreDatabase& database, std::uint64_t maxBytes,
                                  std::optional<double> oldest, bool& more) {
     more = false;
+    removed_ = {};
     int code = SQLITE_OK;
     if (database_ != database.handle()) {
         reset();
@@ -225,7 +226,9 @@ int StoreRetention::deleteSlab(double latest, std::int64_t share, std::int64_t& 
         if (const int code = tables_[i].deleteUpTo.run(); code != SQLITE_OK) {
             return code;
         }
-        deleted += sqlite3_changes64(database_);
+        const std::int64_t changes = sqlite3_changes64(database_);
+        removed_[i] += static_cast<std::uint64_t>(changes);
+        deleted += changes;
     }
     return SQLITE_OK;
 }

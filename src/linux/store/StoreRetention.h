@@ -32,6 +32,8 @@ public:
     // to delete than was deleted.
     StoreResult trim(StoreDatabase& database, std::uint64_t maxBytes, std::optional<double> oldest,
                      bool& more);
+    // What the last trim deleted, by table.
+    const StoreDatabase::RowCounts& removed() const { return removed_; }
     // To be called before the database is closed.
     void reset();
 
@@ -63,6 +65,7 @@ private:
     sqlite3* database_ = nullptr;
     std::int64_t firstUpload_ = 0;
     std::array<Table, kStoreTables> tables_;
+    StoreDatabase::RowCounts removed_{};
     StoreStatement pageCount_;
     StoreStatement freePages_;
     StoreStatement vacuum_;

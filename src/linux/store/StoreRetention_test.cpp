@@ -60,6 +60,7 @@ TEST_F(StoreRetentionTest, OldRowsGoByAgeAlone) {
     clock_.advance(2 * 60s);
     commitOne();
     EXPECT_EQ(reader().one("SELECT id FROM upload_message"), "11");
+    EXPECT_EQ(store_->status().removed[static_cast<std::size_t>(StoreTable::UploadMessage)], 10U);
 }
 
 TEST_F(StoreRetentionTest, LimitsCanBeLoweredAtRunTime) {

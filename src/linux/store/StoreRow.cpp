@@ -1,5 +1,7 @@
 #include "linux/store/StoreRow.h"
 
+#include <array>
+
 namespace halyard::linux_ {
 namespace {
 
@@ -50,6 +52,16 @@ std::size_t storeBytes(const Dictionary& dictionary) {
         sum += sizeof(entry) + entry.key.text().size() + bytesBeyond(entry.value);
     }
     return sum;
+}
+
+StoreTable tableOf(const StoreRow& row) {
+    using enum StoreTable;
+    // In the order of StoreRow.
+    constexpr std::array kTables = {UploadSession, UploadSession,  UploadMessage,
+                                    UploadMessage, AnalyticsEvent, EnergyEvent,
+                                    Metric,        Incident,       Repeat};
+    static_assert(kTables.size() == std::variant_size_v<StoreRow>);
+    return kTables[row.index()];
 }
 
 std::size_t storeBytes(const StoreRow& row) {

@@ -12,6 +12,7 @@
 #include <variant>
 
 #include "common/Value.h"
+#include "linux/store/Schema.h"
 #include "platform/RelayReporting.h"
 
 namespace halyard::linux_ {
@@ -94,6 +95,8 @@ struct StoreItem {
     StoreRow row;
     std::size_t bytes = 0;
 };
+
+StoreTable tableOf(const StoreRow& row);
 
 // About how much memory a row keeps alive, contents shared with others included.
 std::size_t storeBytes(const StoreRow& row);

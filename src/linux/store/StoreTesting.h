@@ -89,15 +89,14 @@ protected:
         }
     }
     Reader reader() { return Reader(options_.path); }
-    static std::uint64_t total(const StoreLosses& losses) {
-        std::uint64_t sum = 0;
-        for (const std::uint64_t lost : losses) {
-            sum += lost;
-        }
-        return sum;
-    }
+    static std::uint64_t total(const StoreLossesByTable& losses) { return sum(losses); }
+    // Of all tables.
     std::uint64_t lost(StoreLoss reason) {
-        return store_->status().lost[static_cast<std::size_t>(reason)];
+        std::uint64_t count = 0;
+        for (const StoreLosses& each : store_->status().lost) {
+            count += each[static_cast<std::size_t>(reason)];
+        }
+        return count;
     }
 
     testing::TempTree directory_;

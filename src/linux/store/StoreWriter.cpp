@@ -50,10 +50,6 @@ std::string_view nameOf(StoreLoss reason) {
     return kStoreLossNames[static_cast<std::size_t>(reason)].inLog;
 }
 
-std::uint64_t sum(const StoreLosses& losses) {
-    return std::accumulate(losses.begin(), losses.end(), std::uint64_t{0});
-}
-
 bool concernsOneRow(const StoreFailure& failure) {
     const int primary = failure.primary();
     return primary == SQLITE_TOOBIG || primary == SQLITE_CONSTRAINT || primary == SQLITE_MISMATCH;
@@ -83,6 +79,18 @@ StoreQueue::Window storeWindow(const StoreOptions& options, const StoreLimits& l
     }
     return {limits.syncInterval, std::max(options.groupRows, options.patientRows),
             options.marks.lowBytes};
+}
+
+std::uint64_t sum(const StoreLosses& losses) {
+    return std::accumulate(losses.begin(), losses.end(), std::uint64_t{0});
+}
+
+std::uint64_t sum(const StoreLossesByTable& losses) {
+    std::uint64_t all = 0;
+    for (const StoreLosses& each : losses) {
+        all += sum(each);
+    }
+    return all;
 }
 
 StoreWriter::StoreWriter(const StoreOptions& options, const platform::Clock& clock,
@@ -337,6 +345,7 @@ StoreResult StoreWriter::writeRows(std::span<StoreItem> group) {
     commitTime_ = clock_.steadyTime() - began;
     if (result.ok()) {
         trimMore_ = more;
+        noteRemoved();
         if (ageDue) {
             agedAt_ = more ? platform::SteadyTime() : clock_.steadyTime();
         }
@@ -345,7 +354,7 @@ StoreResult StoreWriter::writeRows(std::span<StoreItem> group) {
 }
 
 StoreResult StoreWriter::insertAll(std::span<StoreItem> group) {
-    rejected_ = 0;
+    rejected_.clear();
     for (StoreItem& item : group) {
         buildPayload(item.row);
         StoreResult inserted =
@@ -356,7 +365,7 @@ StoreResult StoreWriter::insertAll(std::span<StoreItem> group) {
         if (!concernsOneRow(inserted.failure())) {
             return inserted;
         }
-        ++rejected_;
+        rejected_.push_back(tableOf(item.row));
         rejection_ = inserted.failure().text;
     }
     return {};
@@ -387,6 +396,13 @@ void StoreWriter::noteSizes() {
     status_.logBytes = database_.logBytes();
 }
 
+void StoreWriter::noteRemoved() {
+    const MutexLock lock(mutex_);
+    for (std::size_t i = 0; i < kStoreTables; ++i) {
+        status_.removed[i] += retention_.removed()[i];
+    }
+}
+
 void StoreWriter::settle(std::span<StoreItem> group) {
     std::size_t bytes = 0;
     for (const StoreItem& item : group) {
@@ -399,22 +415,24 @@ void StoreWriter::settle(std::span<StoreItem> group) {
             status_.rows[i] += database_.committedRows()[i];
         }
     }
-    if (rejected_ > 0) {
-        queue_->countLost(StoreLoss::Rejected, rejected_);
-        HY_LOG_ERROR(HYReportingPlatformCategory, "the store rejected {} rows: {}", rejected_,
-                     rejection_);
+    for (const StoreTable table : rejected_) {
+        queue_->countLost(StoreLoss::Rejected, table);
+    }
+    if (!rejected_.empty()) {
+        HY_LOG_ERROR(HYReportingPlatformCategory, "the store rejected {} rows: {}",
+                     rejected_.size(), rejection_);
     }
     queue_->settle(group.size(), bytes);
 }
 
 void StoreWriter::giveUp(std::span<StoreItem> group, StoreLoss reason) {
     std::size_t bytes = 0;
-    std::uint64_t lost = 0;
     for (const StoreItem& item : group) {
         bytes += item.bytes;
-        lost += std::holds_alternative<StoreCloseRow>(item.row) ? 0 : 1;
+        if (!std::holds_alternative<StoreCloseRow>(item.row)) {
+            queue_->countLost(reason, tableOf(item.row));
+        }
     }
-    queue_->countLost(reason, lost);
     queue_->settle(group.size(), bytes);
 }
 
@@ -428,7 +446,7 @@ void StoreWriter::beginEpisode(StoreLoss reason, const std::string& text) {
         const MutexLock lock(mutex_);
         first = !episode_;
         if (first) {
-            episode_ = Episode{reason, clock_.steadyTime(), queue_->levels().lost};
+            episode_ = Episode{reason, clock_.steadyTime(), sum(queue_->levels().lost)};
         }
         episode_->reason = reason;
         status_.failing = true;
@@ -455,7 +473,7 @@ void StoreWriter::endEpisode() {
         std::chrono::duration_cast<std::chrono::seconds>(clock_.steadyTime() - ended->began);
     HY_LOG_DEFAULT(HYReportingPlatformCategory, "writing to {} again after {} s, {} rows lost",
                    options_.path.string(), seconds.count(),
-                   sum(queue_->levels().lost) - sum(ended->lostBefore));
+                   sum(queue_->levels().lost) - ended->lostBefore);
 }
 
 void StoreWriter::setLimits(StoreLimits limits) {

@@ -55,6 +55,9 @@ struct StoreOptions {
 inline constexpr std::chrono::milliseconds kPromptInterval{500};
 StoreQueue::Window storeWindow(const StoreOptions& options, const StoreLimits& limits);
 
+std::uint64_t sum(const StoreLosses& losses);
+std::uint64_t sum(const StoreLossesByTable& losses);
+
 struct StoreStatus {
     bool open = false;
     bool failing = false;
@@ -63,7 +66,8 @@ struct StoreStatus {
     std::size_t queuedRows = 0;
     std::size_t queuedBytes = 0;
     double oldestWaiting = 0; // seconds
-    StoreLosses lost{};
+    StoreLossesByTable lost{};
+    StoreDatabase::RowCounts removed{}; // by retention
     std::uint64_t fileBytes = 0;
     std::uint64_t logBytes = 0;
 };
@@ -93,7 +97,7 @@ private:
     struct Episode {
         StoreLoss reason;
         platform::SteadyTime began;
-        StoreLosses lostBefore;
+        std::uint64_t lostBefore;
     };
 
     StoreResult openDatabase();
@@ -113,6 +117,7 @@ private:
     StoreResult insertAll(std::span<StoreItem> group);
     StoreResult trim(const StoreLimits& bounds, bool ageDue, bool& more);
     void buildPayload(StoreRow& row);
+    void noteRemoved() HY_EXCLUDES(mutex_);
     void noteSizes() HY_EXCLUDES(mutex_);
     void settle(std::span<StoreItem> group);
     void giveUp(std::span<StoreItem> group, StoreLoss reason);
@@ -128,8 +133,8 @@ private:
     StoreDatabase database_;
     StoreRetention retention_;
     std::vector<StoreItem> taken_;
-    std::uint64_t rejected_ = 0; // rows of the running attempt
-    std::string rejection_;      // why the last of them was
+    std::vector<StoreTable> rejected_; // rows of the running attempt
+    std::string rejection_;            // why the last of them was
     bool trimMore_ = false;
     std::chrono::nanoseconds commitTime_{}; // what the last one took
     // Set once stop() has found that rows cannot be written: no more attempts.

@@ -52,13 +52,17 @@ TEST_F(StoreTest, TablesHaveTheColumnsThatReadersRelyOn) {
 TEST_F(StoreTest, StatusNamesTablesAndLosses) {
     StoreStatus status;
     status.rows = {1, 2, 3, 4, 5, 6, 7};
-    status.lost = {1, 2, 3, 4, 5, 6, 7};
+    status.lost[static_cast<std::size_t>(StoreTable::Metric)] = {1, 2, 3, 4, 5, 6, 7};
+    status.removed = {7, 6, 5, 4, 3, 2, 1};
     const Dictionary told = describe(status);
     EXPECT_EQ(toJson(told["rows"]), "{\"upload_session\":1,\"upload_message\":2,"
                                     "\"analytics_event\":3,\"energy_event\":4,"
                                     "\"metric\":5,\"incident\":6,\"repeat\":7}");
-    EXPECT_EQ(toJson(told["lost"]), "{\"no_store\":1,\"disk_full\":2,\"read_only\":3,"
-                                    "\"locked\":4,\"io_error\":5,\"stuck\":6,\"rejected\":7}");
+    EXPECT_EQ(toJson(told["lost"].dictionary()["metric"]),
+              "{\"no_store\":1,\"disk_full\":2,\"read_only\":3,"
+              "\"locked\":4,\"io_error\":5,\"stuck\":6,\"rejected\":7}");
+    EXPECT_EQ(told["lost"].dictionary().size(), kStoreTables);
+    EXPECT_EQ(told["removed"].dictionary()["upload_session"], Value(7));
 }
 
 TEST_F(StoreTest, WritesSessionsAndTheirMessages) {
