@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "protocol/Wire.h"
+#include "reading/JsonDocument.h"
 
 namespace halyard::ctl {
 namespace {
@@ -18,9 +19,6 @@ namespace {
 using reading::Exit;
 using reading::Outcome;
 using reading::Trouble;
-
-constexpr unsigned kFlags = rapidjson::kParseIterativeFlag | rapidjson::kParseFullPrecisionFlag |
-                            rapidjson::kParseValidateEncodingFlag;
 
 std::string_view textOf(const rapidjson::Value& json) {
     return {json.GetString(), json.GetStringLength()};
@@ -158,8 +156,7 @@ std::optional<std::string> Lines::next() {
 
 std::optional<Dictionary> dictionaryIn(std::string_view json) {
     rapidjson::Document document;
-    document.Parse<kFlags>(json.data(), json.size());
-    if (document.HasParseError() || !document.IsObject()) {
+    if (!parseJson(json, reading::Encoding::Checked, document) || !document.IsObject()) {
         return std::nullopt;
     }
     const auto value = valueOf(document, 0);

@@ -2,20 +2,15 @@
 
 #include <cmath>
 
+#include "reading/JsonDocument.h"
+
 namespace halyard::reading {
-namespace {
-
-// Iterative: the depth of a text that comes from outside is no depth of our stack.
-constexpr unsigned kFlags = rapidjson::kParseIterativeFlag | rapidjson::kParseFullPrecisionFlag;
-
-} // namespace
 
 bool JsonFields::parse(std::string_view text) {
     root_ = rapidjson::Value();
     allocator_.Clear();
     rapidjson::Document document(&allocator_);
-    document.Parse<kFlags>(text.data(), text.size());
-    if (!document.HasParseError() && document.IsObject()) {
+    if (parseJson(text, Encoding::Any, document) && document.IsObject()) {
         root_.Swap(document);
     }
     return root_.IsObject();
