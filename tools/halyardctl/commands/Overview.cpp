@@ -24,7 +24,8 @@ constexpr std::chrono::seconds kPatience{5};
 constexpr std::uint64_t kCheckedBytes = 64 * 1024 * 1024;
 constexpr const char* kMore =
     "\nMore: halyardctl sessions, glitches, messages, events, energy, incidents, metrics, watch,\n"
-    "status, check; each with --help. Most take --since and --until, and --json for programs.\n";
+    "status, check; report and timeline make a page and a file to look at. Each has --help; most\n"
+    "take --since and --until, and --json for programs.\n";
 
 struct DaemonFacts {
     bool runs = false;
@@ -99,7 +100,9 @@ std::string glitchesIn(const Digest& digest) {
                             digest.worstApplication->sum.glitches);
     }
     if (digest.leadingCause) {
-        text += fmt::format("; mostly {}", causeInWords(digest.leadingCause->name));
+        const bool isMost = digest.leadingCause->sum.glitches * 2 > digest.glitches.glitches;
+        text += fmt::format("; {} {}", isMost ? "mostly" : "most often",
+                            causeInWords(digest.leadingCause->name));
     }
     return text;
 }

@@ -5,13 +5,17 @@
 namespace halyard::reading {
 namespace {
 
-std::optional<Digest::Leader> leaderOf(const GlitchTally& tally) {
+std::optional<Digest::Leader> worstOf(const GlitchTally& tally) {
     for (const GlitchTally::Entry& entry : tally.entries()) {
         if (entry.name) {
             return Digest::Leader{*entry.name, entry.sum};
         }
     }
     return std::nullopt;
+}
+
+bool isTied(const std::vector<GlitchTally::Entry>& entries) {
+    return entries.size() > 1 && entries[0].sum.glitches == entries[1].sum.glitches;
 }
 
 } // namespace
@@ -40,8 +44,10 @@ Outcome<Digest> digestOf(StoreReader& reader, const TimeRange& range, double now
     if (!glitches.ok()) {
         return glitches.failure();
     }
-    digest.worstApplication = leaderOf(applications);
-    digest.leadingCause = leaderOf(causes);
+    digest.worstApplication = worstOf(applications);
+    if (!isTied(causes.entries())) {
+        digest.leadingCause = worstOf(causes);
+    }
     return digest;
 }
 

@@ -21,12 +21,14 @@ struct Digest {
     double capturedSeconds = 0;
     GlitchSum glitches;
 
-    // Those with the most glitches; none where there are none, or nobody is named.
     struct Leader {
         std::string name;
         GlitchSum sum;
     };
+    // The one with the most glitches, and of these the longest silent; none where there are
+    // none, or nobody is named.
     std::optional<Leader> worstApplication;
+    // The one of more glitches than any other; none where two share the first place.
     std::optional<Leader> leadingCause;
 };
 

@@ -24,11 +24,12 @@ protected:
                               kBegin + at);
         }
     }
-    void glitch(const std::string& application, double start) {
+    void glitch(const std::string& application, double start, const std::string& cause = "memory",
+                double seconds = 0.5) {
         store_.addMessage({}, 4, 7,
-                          "{\"rtaid_client\":\"" + application + "\",\"issue_type\":\"memory\"," +
-                              "\"any_channel_silence_seconds\":0.5,\"glitch_start\":" +
-                              std::to_string(kBegin + start) + "}",
+                          "{\"rtaid_client\":\"" + application + "\",\"issue_type\":\"" + cause +
+                              "\",\"any_channel_silence_seconds\":" + std::to_string(seconds) +
+                              ",\"glitch_start\":" + std::to_string(kBegin + start) + "}",
                           kBegin + start);
     }
 
@@ -58,6 +59,24 @@ TEST_F(DigestTest, TheWorstHasTheMostGlitches) {
     ASSERT_TRUE(found.worstApplication && found.leadingCause);
     EXPECT_EQ(found.worstApplication->name, "b");
     EXPECT_EQ(found.worstApplication->sum.glitches, 2U);
+    EXPECT_EQ(found.leadingCause->name, "memory");
+}
+
+TEST_F(DigestTest, OfTwoWithAsManyTheLongerSilentIsWorse) {
+    glitch("a", 1);
+    glitch("b", 2, "memory", 0.75);
+    const Digest found = digest({});
+    ASSERT_TRUE(found.worstApplication);
+    EXPECT_EQ(found.worstApplication->name, "b");
+}
+
+TEST_F(DigestTest, NoCauseLeadsWhereTwoAreAsFrequent) {
+    glitch("a", 1, "memory");
+    glitch("a", 2, "client_slow", 3);
+    EXPECT_FALSE(digest({}).leadingCause);
+    glitch("a", 3, "memory");
+    const Digest found = digest({});
+    ASSERT_TRUE(found.leadingCause);
     EXPECT_EQ(found.leadingCause->name, "memory");
 }
 

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cmath>
 #include <ctime>
+#include <tuple>
 
 namespace halyard::reading {
 namespace {
@@ -75,8 +76,8 @@ std::vector<GlitchTally::Entry> GlitchTally::entries() const {
         if (by_ == GlitchKey::Hour) {
             return left.hour < right.hour;
         }
-        return left.sum.glitches != right.sum.glitches ? left.sum.glitches > right.sum.glitches
-                                                       : left.name < right.name;
+        return std::tie(right.sum.glitches, right.sum.seconds, left.name) <
+               std::tie(left.sum.glitches, left.sum.seconds, right.name);
     });
     return all;
 }
