@@ -152,6 +152,7 @@ LinuxPlatform::~LinuxPlatform() {
 void LinuxPlatform::applySettings(const Settings& settings) {
     store_->analytics.setWanted(settings.wantedEvents);
     store_->store.setLimits(settings.store);
+    platform_.sessionRules.set(settings.sessions);
 }
 
 PeerRights LinuxPlatform::rightsOfPeer(const Peer& peer) const {

@@ -8,6 +8,7 @@
 #include <mutex>
 
 #include "platform/MessageAccounts.h"
+#include "platform/SessionRules.h"
 
 namespace halyard::platform {
 
@@ -76,6 +77,7 @@ struct Platform {
     BuildKind buildKind = {};
     // Nor is this.
     MessageAccounts messageAccounts = {};
+    SessionRules sessionRules = {};
 };
 
 // Replaces what was installed before; null uninstalls. Requires that no other

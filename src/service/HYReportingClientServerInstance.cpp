@@ -19,11 +19,17 @@ constexpr std::uint32_t kStartMark = 0x21044818;
 constexpr std::uint32_t kStopMark = 0x2104481C;
 constexpr std::uint32_t kDestroyMark = 0x21044820;
 
-// The sixth and later concurrent sessions are not uploaded.
-constexpr std::int64_t kMaxUploadedSessions = 5;
-
+// The sixth and later concurrent sessions are not uploaded, unless an operator says so.
 bool mayUpload(std::int64_t activeSessions) {
-    return activeSessions <= kMaxUploadedSessions;
+    return activeSessions <= platform::current().sessionRules.uploadLimit();
+}
+
+// Kept: only a stop request uncounts. A session that is destroyed, lost or replaced while
+// it runs stays counted, unless an operator says otherwise.
+void uncountLost(HYReportingServiceDelegateProtocol& delegate) {
+    if (platform::current().sessionRules.recount()) {
+        delegate.setActiveSessionCount(delegate.activeSessionCount() - 1);
+    }
 }
 
 void mark(std::uint32_t code) {
@@ -80,15 +86,19 @@ void HYReportingClientServerInstance::create(Delegate& delegate, std::int64_t re
     HY_ASSERT_ON_QUEUE(serviceQueue_);
     HY_LOG_DEBUG(HYReportingClientCategory, "creating session for reporter {}", reporterID);
     mark(kCreateMark);
-    auto session = HYReportingSession::initWithID(reporterID, {pid_});
-    session->setRelayReportingEnabled(mayUpload(delegate.activeSessionCount()));
+    const auto session = HYReportingSession::initWithID(reporterID, {pid_});
+    auto replaced = session;
     {
         const MutexLock lock(mapMutex_);
-        std::swap(sessions_[reporterID], session);
+        std::swap(sessions_[reporterID], replaced);
     }
-    if (session != nullptr) {
-        retire(delegate, *session); // Replaced.
+    if (replaced != nullptr) {
+        if (replaced->started()) {
+            uncountLost(delegate);
+        }
+        retire(delegate, *replaced);
     }
+    session->setRelayReportingEnabled(mayUpload(delegate.activeSessionCount()));
     HY_LOG_DEFAULT(HYReportingClientCategory, "session created for reporter {}", reporterID);
 }
 
@@ -219,8 +229,6 @@ void HYReportingClientServerInstance::stop(Delegate& delegate, std::int64_t repo
         delegate.sendDriverLogsForSession(session);
         session->setDriverSnapShot(delegate.getSnapShot());
         session->stop();
-        // Kept: the only place that uncounts. A session that is destroyed, lost or
-        // replaced while it runs stays counted.
         delegate.setActiveSessionCount(delegate.activeSessionCount() - 1);
         if (const auto held = session->exchangeTransactionCompleteBlock(nullptr)) {
             held(std::nullopt, true);
@@ -247,7 +255,8 @@ void HYReportingClientServerInstance::destroy(Delegate& delegate, std::int64_t r
     }
     if (const auto session = ownSession(reporterID)) {
         if (session->started()) {
-            session->stop(); // Stays counted as active: only a stop request uncounts.
+            session->stop();
+            uncountLost(delegate);
         }
         retire(delegate, *session);
         const MutexLock lock(mapMutex_);
@@ -316,6 +325,7 @@ void HYReportingClientServerInstance::leave(Delegate& delegate) {
     for (const auto& [reporterID, session] : sessions) {
         if (session->started()) {
             session->stop(platform::UploadEnding::Disconnected);
+            uncountLost(delegate);
         }
         retire(delegate, *session);
     }

@@ -201,6 +201,12 @@ HYReportingServiceDelegate::findReportingSessionForID(std::int64_t reporterID) c
 void HYReportingServiceDelegate::setActiveSessionCount(std::int64_t count) {
     HY_ASSERT_ON_QUEUE(serviceQueue_);
     activeSessionCount_.store(count);
+    const std::int64_t limit = platform::current().sessionRules.uploadLimit();
+    if (!std::exchange(withholdsUploads_, count > limit) && withholdsUploads_) {
+        HY_LOG_DEFAULT(HYReportingServiceDelegateCategory,
+                       "{} sessions count as active: those started beyond {} are not uploaded",
+                       count, limit);
+    }
 }
 
 std::vector<HYReportingServiceDelegate::Session>

@@ -78,6 +78,7 @@ private:
     const Dictionary defaults_;
     // Written on the service work queue only.
     std::atomic<std::int64_t> activeSessionCount_{0};
+    bool withholdsUploads_ = false; // On the service work queue.
     std::atomic<std::uint64_t> repeatsOfRetiredSessions_{0};
     std::vector<FeatureRecord> features_;
     std::unique_ptr<HYReportingDriverUtility> driverUtility_;

@@ -1,5 +1,5 @@
-// The configuration file that is installed: all comments, in which "#key = value" shows a
-// default and "#   key = value" an example.
+// The configuration file that is installed: "#key = value" shows a default, "#   key =
+// value" an example, and without "#" stands what the package sets on purpose.
 
 #include <gtest/gtest.h>
 
@@ -28,7 +28,8 @@ std::string uncommented(bool examples) {
     std::string result;
     for (std::string line; std::getline(lines, line);) {
         const bool shown = isDefault(line) || (examples && line.starts_with(kExample));
-        result += shown ? line.substr(1) + "\n" : "\n"; // Mistakes keep their line.
+        const bool comment = line.starts_with("#") && !shown;
+        result += comment ? "\n" : line.substr(shown ? 1 : 0) + "\n"; // Mistakes keep their line.
     }
     return result;
 }
@@ -50,25 +51,32 @@ Settings byMeaning(Settings settings) {
     return settings;
 }
 
+Settings setOnPurpose() {
+    Settings settings;
+    settings.sessions.recount = true;
+    return settings;
+}
+
 // Whether a line of the file gives `key`, "store.max_age", a value or begins its table.
 bool shows(const std::string& file, const std::string& key) {
     const std::size_t dot = key.rfind('.');
     const std::string name = dot == std::string::npos ? key : key.substr(dot + 1);
     return file.find("\n#" + name + " = ") != std::string::npos ||
            file.find("\n#   " + name + " = ") != std::string::npos ||
+           file.find("\n" + name + " = ") != std::string::npos ||
            file.find("[" + key) != std::string::npos;
 }
 
-TEST(PackagedConfiguration, ChangesNothing) {
+TEST(PackagedConfiguration, ChangesOnlyWhatItMeansTo) {
     const ParsedSettings settings = parsed(packaged());
 
-    EXPECT_EQ(settings.settings, Settings());
+    EXPECT_EQ(settings.settings, setOnPurpose());
 }
 
 TEST(PackagedConfiguration, ShowsTheDefaults) {
     const ParsedSettings settings = parsed(uncommented(false));
 
-    EXPECT_EQ(byMeaning(settings.settings), Settings());
+    EXPECT_EQ(byMeaning(settings.settings), setOnPurpose());
     EXPECT_EQ(settings.warnings, std::vector<SettingsWarning>());
 }
 

@@ -62,6 +62,7 @@ private:
     void readMaxBytes(const toml::node& node, const std::string& name);
     std::optional<std::chrono::seconds> duration(const toml::node& node, const std::string& name);
     void readSyncInterval(const toml::node& node, const std::string& name);
+    void readUploadLimit(const toml::node& node, const std::string& name);
     void readChannels(const toml::node& node, const std::string& name);
     void readChannel(const toml::node& node, const std::string& name);
     void checkChannel(const toml::node& node, const std::string& name);
@@ -99,6 +100,18 @@ private:
                                         {"max_age", &SettingsReader::readMaxAge},
                                         {"sync_interval", &SettingsReader::readSyncInterval}};
         readSection(node, name, kKeys);
+    }
+    void readSessions(const toml::node& node, const std::string& name) {
+        static constexpr Key kKeys[] = {{"upload_limit", &SettingsReader::readUploadLimit},
+                                        {"recount", &SettingsReader::readRecount}};
+        readSection(node, name, kKeys);
+    }
+    void readRecount(const toml::node& node, const std::string& name) {
+        if (const auto value = node.value_exact<bool>()) {
+            settings().sessions.recount = *value;
+        } else {
+            fail(node, fmt::format("{} must be true or false", name));
+        }
     }
     void readMaxAge(const toml::node& node, const std::string& name) {
         settings().store.maxAge = duration(node, name).value_or(settings().store.maxAge);
@@ -151,6 +164,7 @@ Result<ParsedSettings, SettingsFailure> SettingsReader::read(const toml::table& 
                                     {"analytics", &SettingsReader::readAnalytics},
                                     {"access", &SettingsReader::readAccess},
                                     {"store", &SettingsReader::readStore},
+                                    {"sessions", &SettingsReader::readSessions},
                                     {"log", &SettingsReader::readLog},
                                     {"service", &SettingsReader::readService},
                                     {"drivers", &SettingsReader::readDrivers}};
@@ -344,6 +358,15 @@ void SettingsReader::readMaxBytes(const toml::node& node, const std::string& nam
         fail(node, fmt::format("{} must be at least 256KiB", name));
     } else {
         settings().store.maxBytes = *bytes;
+    }
+}
+
+void SettingsReader::readUploadLimit(const toml::node& node, const std::string& name) {
+    const auto limit = node.value_exact<std::int64_t>();
+    if (limit && *limit >= 0) {
+        settings().sessions.uploadLimit = *limit;
+    } else {
+        fail(node, fmt::format("{} must be a number, 0 or more", name));
     }
 }
 

@@ -19,6 +19,7 @@
 #include "linux/drivers/DriverChannel.h"
 #include "linux/net/Peer.h"
 #include "linux/store/StoreLimits.h"
+#include "platform/SessionRules.h"
 
 namespace halyard::linux_ {
 
@@ -31,6 +32,7 @@ struct Settings {
     std::vector<std::string> wantedEvents{"com.kestrel.halyard.*"}; // shell patterns
     Access access;
     StoreLimits store;
+    platform::SessionRules::Values sessions;
     LogLevel logLevel = LogLevel::Info;
     std::optional<std::chrono::seconds> idleExit; // none: never
     std::vector<DriverChannel> driverChannels;

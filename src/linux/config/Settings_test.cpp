@@ -238,6 +238,16 @@ TEST(SettingsErrorTest, TheStoreHoldsAtLeast256KiB) {
     }
 }
 
+TEST(SettingsErrorTest, SessionsCountUpToALimit) {
+    EXPECT_EQ(settings("").sessions.uploadLimit, 5);
+    EXPECT_FALSE(settings("").sessions.recount);
+    EXPECT_EQ(settings("sessions.upload_limit = 0").sessions.uploadLimit, 0);
+    EXPECT_TRUE(settings("sessions.recount = true").sessions.recount);
+    EXPECT_EQ(mistake("sessions.upload_limit = -1"),
+              "1:25: sessions.upload_limit must be a number, 0 or more");
+    EXPECT_EQ(mistake("sessions.recount = 1"), "1:20: sessions.recount must be true or false");
+}
+
 TEST(SettingsErrorTest, TheStoreKeepsAtLeastASecond) {
     EXPECT_EQ(settings("store.max_age = \"1s\"").store.maxAge, 1s);
     EXPECT_EQ(mistake("store.max_age = \"0d\""), "1:17: store.max_age must be at least \"1s\"");
