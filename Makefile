@@ -16,6 +16,7 @@ TEST_PACKAGES := libmsgpack-cxx-dev libgtest-dev libgmock-dev libbenchmark-dev l
 	clang-format python3-msgpack \
 	neovim pipewire-jack jackd2 systemd mandoc zsh $(PICTURE_PACKAGES)
 CHECK_PACKAGES := clang clang-tidy libclang-rt-14-dev
+DEB_PACKAGES := build-essential debhelper git lintian
 BENCH_PACKAGES := libmsgpack-cxx-dev libbenchmark-dev sqlite3
 
 JOBS ?= $(shell nproc)
@@ -38,7 +39,7 @@ CTEST_FLAGS := --output-on-failure --no-label-summary --parallel $(TEST_JOBS)
 FIXED_ADDRESSES := setarch $(shell uname -m) -R
 
 .DEFAULT_GOAL := build
-.PHONY: deps build install run pictures test check fuzz tidy bench format clean
+.PHONY: deps build install deb run pictures test check fuzz tidy bench format clean
 
 deps:
 	@scripts/install-deps.sh $(BUILD_PACKAGES) $(RUN_PACKAGES) $(TEST_PACKAGES)
@@ -54,6 +55,12 @@ install:
 	cmake --preset release -D CMAKE_INSTALL_PREFIX=$(PREFIX)
 	cmake --build --preset release --parallel $(JOBS)
 	DESTDIR=$(abspath $(DESTDIR)) cmake --install build/release
+
+# The packages are in build/deb then. JOBS does not hold here: it is the packages' own build.
+deb:
+	@scripts/install-deps.sh $(BUILD_PACKAGES) $(DEB_PACKAGES)
+	scripts/build-deb.sh build/deb
+	lintian --allow-root --fail-on error,warning build/deb/*.changes
 
 run:
 	@scripts/install-deps.sh $(BUILD_PACKAGES) $(RUN_PACKAGES)

@@ -15,7 +15,7 @@ import re
 import sys
 import tempfile
 
-FOLDERS = ("src", "docs", "tools", "scripts", "tests", "fuzz", "benchmarks", "packaging", "cmake", ".ci")
+FOLDERS = ("src", "docs", "tools", "scripts", "tests", "fuzz", "benchmarks", "packaging", "debian", "cmake", ".ci")
 
 LINK = re.compile(r"\[[^\]]*\]\(([^)\s]+)(?:\s+\"[^\"]*\")?\)")
 CODE = re.compile(r"`([^`]+)`")

@@ -1,7 +1,7 @@
 # What an installation holds, and whether others can use it.
 
 if(NOT HALYARD_SANITIZE) # Nobody installs those, and their library wants its runtime.
-  foreach(name files library units help)
+  foreach(name files library packages units help)
     add_test(NAME install.${name}
       COMMAND ${HALYARD_PYTHON} ${CMAKE_CURRENT_SOURCE_DIR}/install/test_${name}.py)
     set_tests_properties(install.${name} PROPERTIES LABELS install TIMEOUT 600
