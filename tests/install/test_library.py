@@ -71,7 +71,8 @@ class Examples(DaemonTest):
         self.report(os.path.join(build, "recorder"))
         self.assertEqual(self.applications(), ["org.example.player", "org.example.recorder"])
 
-    def test_build_with_pkg_config(self):
+    def built_with_pkg_config(self):
+        """Both programs."""
         flags = output("pkg-config", "--cflags", "--libs", "halyard",
                        env=os.environ | {"PKG_CONFIG_PATH": self.root.lib("pkgconfig")}).split()
         self.assertIn("-I" + self.root.prefixed("include"),
@@ -81,8 +82,19 @@ class Examples(DaemonTest):
             program = os.path.join(self.work, source + ".out")
             output(*compiler, "-Wall", "-Wextra", "-Werror",
                    os.path.join(self.examples, source), *flags, "-o", program)
+            yield program
+
+    def test_build_with_pkg_config(self):
+        for program in self.built_with_pkg_config():
             self.report(program)
         self.assertEqual(self.applications(), ["org.example.player", "org.example.recorder"])
+
+    def test_say_so_where_there_is_no_daemon(self):
+        for program in self.built_with_pkg_config():
+            done = subprocess.run([program, os.path.join(self.work, "no-socket")], check=False,
+                                  env=os.environ | {"LD_LIBRARY_PATH": self.root.lib()},
+                                  timeout=PATIENCE, stderr=subprocess.DEVNULL)
+            self.assertEqual(done.returncode, 1, program)
 
 
 if __name__ == "__main__":

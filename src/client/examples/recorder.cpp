@@ -13,6 +13,8 @@
 namespace reporting = halyard::reporting;
 
 int main(int argc, char** argv) {
+    // Older than the client, which calls back until it is gone.
+    std::promise<std::string> answer;
     reporting::Client client(argc > 1 ? argv[1] : nullptr);
     reporting::Session session = client.createSession();
     reporting::Dictionary facts;
@@ -33,7 +35,6 @@ int main(int argc, char** argv) {
     // ... and record on ...
 
     // The answer comes once everything before it has been taken.
-    std::promise<std::string> answer;
     session.stop([&answer](const reporting::Failure* failure) {
         answer.set_value(failure != nullptr ? failure->message : "");
     });
