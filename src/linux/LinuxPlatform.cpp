@@ -20,6 +20,8 @@ namespace {
 constexpr const char* kSocketName = "reporting";
 constexpr const char* kSocketFile = "reporting.sock";
 constexpr const char* kCyclesFolder = "cycles";
+// What is left to read fits into the sockets' buffers, unless the disk does not keep up.
+constexpr std::chrono::seconds kReadingLimit{5};
 // Sessions may wait nine seconds for their back ends, the store ten for a disk.
 constexpr std::chrono::seconds kShutdownLimit{25};
 // The same without the store's ten, which it keeps to by itself.
@@ -57,8 +59,8 @@ Error errorOf(const Failure& failure) {
 
 LinuxPlatform::LinuxPlatform(Directories directories, platform::TraceMarks& traceMarks)
     : directories_(std::move(directories)), stopSignals_(context_, SIGTERM, SIGINT),
-      reloadSignals_(context_, SIGHUP), watchdog_(context_), shutdownLimit_(context_),
-      log_(LogWriter::defaultOutput()), system_(directories_),
+      reloadSignals_(context_, SIGHUP), watchdog_(context_), readingLimit_(context_),
+      shutdownLimit_(context_), log_(LogWriter::defaultOutput()), system_(directories_),
       configuration_(directories_.configuration), ownProcess_([this] { saveWhatWasAccepted(); }),
       ownerRights_(
           system_.clock,
@@ -143,7 +145,9 @@ LinuxPlatform::~LinuxPlatform() {
     queues_->stop();
     incidents_.reset();
     listener_.reset();
-    if (!store_->store.close()) {
+    const bool closed = store_->store.close();
+    logAccounts();
+    if (!closed) {
         log_.flush();
         std::_Exit(EXIT_SUCCESS); // A disk that hangs: nothing more can be saved.
     }
@@ -161,6 +165,7 @@ PeerRights LinuxPlatform::rightsOfPeer(const Peer& peer) const {
 
 Result<void> LinuxPlatform::open(platform::ListenerDelegate* delegate) {
     const std::optional<int> inherited = inheritedSocket(kSocketName);
+    socketInherited_ = inherited.has_value();
     const Result<int> listening =
         inherited ? *inherited : listenAt((directories_.runtime / kSocketFile).string());
     if (!listening.ok()) {
@@ -237,9 +242,10 @@ void LinuxPlatform::serve() {
     listener_->resume();
 }
 
-// The end, in the order in which work comes in: nobody new, then no connection
-// (which stops its sessions, as when it is lost, and so leaves their last
-// deliveries), then everything that is on its way, down to the disk. Only then does
+// The end, in the order in which work comes in: nobody new, then what has been written
+// to the connections and then none of these (which stops its sessions, as when it is
+// lost, and so leaves their last deliveries), then everything that is on its way, down to
+// the disk. Who waits on a socket that outlives us is served by the next. Only then does
 // the loop stop that draining needs for its timers. What a hanging disk or a
 // session's back ends may take is bounded where they are waited for; the limit here
 // is for what nobody has thought of.
@@ -248,15 +254,32 @@ void LinuxPlatform::beginShutdown() {
         return;
     }
     ::sd_notify(0, "STOPPING=1");
-    listener_->stopAccepting();
-    listener_->closeAllConnections(); // Their sessions stop as with any lost one.
-    flush([this] { asio::post(context_, [this] { finishShutdown(true); }); });
+    if (!socketInherited_) {
+        listener_->acceptTheLast();
+    }
+    listener_->finishReading([this] {
+        readingLimit_.cancel();
+        flush([this] { asio::post(context_, [this] { finishShutdown(true); }); });
+    });
+    readingLimit_.expires_after(kReadingLimit);
+    readingLimit_.async_wait([this](const asio::error_code& error) {
+        if (!error) {
+            stopReading();
+        }
+    });
     shutdownLimit_.expires_after(kShutdownLimit);
     shutdownLimit_.async_wait([this](const asio::error_code& error) {
         if (!error) {
             finishShutdown(false);
         }
     });
+}
+
+void LinuxPlatform::stopReading() {
+    HY_LOG_ERROR(HYReportingPlatformCategory,
+                 "stopping with {} bytes unread that clients have written",
+                 listener_->unreadBytes());
+    listener_->closeAllConnections();
 }
 
 void LinuxPlatform::finishShutdown(bool inTime) {
@@ -275,7 +298,16 @@ void LinuxPlatform::saveWhatWasAccepted() {
     queues_->drain([drained] { drained->set_value(); });
     (void)drained->get_future().wait_for(kSaveLimit);
     (void)store_->store.close();
+    logAccounts();
     log_.flush();
+}
+
+// The last sheet: nobody can ask for it any more.
+void LinuxPlatform::logAccounts() const {
+    const StoreStatus store = store_->store.status();
+    Dictionary sheet = platform_.messageAccounts.describe(settledMessages(store));
+    sheet.set("lost", sum(store.lost[static_cast<std::size_t>(StoreTable::UploadMessage)]));
+    HY_LOG_DEFAULT(HYReportingPlatformCategory, "messages since the start: {}", Value(sheet));
 }
 
 void LinuxPlatform::flush(std::function<void()> done) {

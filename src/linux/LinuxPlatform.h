@@ -65,6 +65,8 @@ private:
     void armWatchdog();
     IdleExit::Actions whenIdle();
     void beginShutdown();
+    void stopReading();
+    void logAccounts() const;
     void finishShutdown(bool inTime);
     void saveWhatWasAccepted();
     PeerRights rightsOfPeer(const Peer& peer) const;
@@ -74,6 +76,7 @@ private:
     asio::signal_set stopSignals_;
     asio::signal_set reloadSignals_;
     asio::steady_timer watchdog_;
+    asio::steady_timer readingLimit_;
     asio::steady_timer shutdownLimit_;
 
     LogWriter log_;
@@ -92,6 +95,7 @@ private:
     std::unique_ptr<SocketListener> listener_;
     platform::Platform platform_;
     platform::SteadyTime startTime_;
+    bool socketInherited_ = false;
     bool stopping_ = false;
 };
 

@@ -1,9 +1,37 @@
 """The sheet of messages in admin.status: it adds up, at rest and at work."""
 
+import re
+import socket
 import threading
 import unittest
 
+import msgpack
+
 from harness import DaemonTest
+
+
+class Writer(threading.Thread):
+    """Writes messages for a session as fast as the daemon takes them, until it takes none."""
+
+    def __init__(self, client, reporter_id, wants_answers=False):
+        super().__init__()
+        self.client = client
+        self.reporter_id = reporter_id
+        self.frame_type = [0, 1] if wants_answers else [2]
+        self.frames = 0  # that the kernel has taken in whole
+
+    def run(self):
+        try:
+            while True:
+                self.write(msgpack.packb([*self.frame_type, "sendMessage",
+                                          [{"n": self.frames}, 4, 1, [self.reporter_id]]]))
+                self.frames += 1
+        except (BrokenPipeError, ConnectionResetError, BlockingIOError):
+            pass
+
+    def write(self, frame):
+        while frame:
+            frame = frame[self.client.socket.send(frame):]
 
 
 class Accounting(DaemonTest):
@@ -70,6 +98,59 @@ class Accounting(DaemonTest):
         self.daemon.run()
         self.assertEqual(self.rows("SELECT closed, ended FROM upload_session"),
                          [(last, "interrupted")])
+
+
+class TheEnd(DaemonTest):
+    """What the kernel took from a client is in the store, or told."""
+
+    def stored(self, reporter_id):
+        return self.daemon.rows(
+            "SELECT count(*) FROM upload_message JOIN upload_session ON upload_session ="
+            " upload_session.id WHERE session_id = ? AND category = 4", reporter_id)[0][0]
+
+    def writer(self, reporter_id, **how):
+        client = self.connect()
+        client.session(reporter_id, service_type=7)
+        client.result("getAllReporters")
+        writer = Writer(client, reporter_id, **how)
+        writer.start()
+        return writer
+
+    def last_sheet(self):
+        [sheet] = re.findall("messages since the start: (.*)", self.daemon.log())
+        return {key: int(value) for key, value in re.findall(r"(\w+) = (\d+)", sheet)}
+
+    def test_sigterm_leaves_nothing_behind_that_writers_had_written(self):
+        writers = [self.writer(reporter_id, wants_answers=reporter_id == 4)
+                   for reporter_id in range(1, 5)]
+        admin = self.connect()
+        self.daemon.wait_for(lambda: admin.result("admin.status")["listener"]["requests"] > 20000)
+        self.assertEqual(self.daemon.terminate(), 0)
+        for writer in writers:
+            writer.join()
+            self.assertEqual(self.stored(writer.reporter_id), writer.frames)
+        sheet = self.last_sheet()
+        self.assertEqual(sheet["offered"], sum(writer.frames for writer in writers))
+        self.assertEqual(sheet["offered"] + sheet["own"], sheet["delivered"])
+        self.assertEqual((sheet["lost"], sheet["waiting"]), (0, 0))
+
+    def test_sigterm_waits_for_no_second(self):
+        client = self.connect()
+        for n in range(100):
+            client.notify("sendMessage", {"n": n}, 4, 1, None)
+        self.assertEqual(self.daemon.terminate(), 0)
+        self.assertEqual(self.daemon.rows("SELECT count(*) FROM upload_message"), [(100,)])
+
+    def test_what_was_written_before_a_close_is_taken_though_no_answer_was_read(self):
+        writer = self.writer(1, wants_answers=True)
+        self.daemon.wait_for(lambda: writer.frames > 2000)
+        writer.client.socket.shutdown(socket.SHUT_WR)
+        writer.join()
+        writer.client.close()
+        self.daemon.wait_for(
+            lambda: self.connect().result("admin.status")["sessions"] == 0)
+        self.flush()
+        self.assertEqual(self.stored(1), writer.frames)
 
 
 if __name__ == "__main__":

@@ -3,6 +3,7 @@
 #include <asio/post.hpp>
 #include <cerrno>
 #include <fmt/format.h>
+#include <sys/ioctl.h>
 #include <sys/socket.h>
 #include <utility>
 
@@ -127,8 +128,8 @@ void SocketConnection::resume() {
 
 bool SocketConnection::mayRead() const {
     return unprocessedRequests_.load() < kMaxUnprocessedRequests &&
-           unprocessedBytes_.load() < kMaxUnprocessedBytes && unsentBytes_.load() <= kUnsentPause &&
-           !shared_.pressure.isOn();
+           unprocessedBytes_.load() < kMaxUnprocessedBytes &&
+           (unsentBytes_.load() <= kUnsentPause || finishing_) && !shared_.pressure.isOn();
 }
 
 // How a connection stops reading and goes on.
@@ -355,7 +356,9 @@ void SocketConnection::stopAnswering() {
 
 void SocketConnection::closeUnlessLeft() {
     writeSome();
-    if (ending_ != Ending::Broken) {
+    if (finishing_) {
+        stopAnswering(); // What can still come is little, and is not held up by this.
+    } else if (ending_ != Ending::Broken) {
         breakOff("answers left lying");
     }
 }
@@ -379,6 +382,23 @@ void SocketConnection::breakOff(std::string_view why) {
 
 void SocketConnection::close() {
     end(Ending::Closed);
+}
+
+// The kernel draws the line: what it has taken from the peer can be read, and then comes
+// the end of it; it takes nothing more.
+void SocketConnection::finish() {
+    if (ended_) {
+        return;
+    }
+    finishing_ = true;
+    (void)::shutdown(socket_.native_handle(), SHUT_RD);
+    readIfAllowed();
+}
+
+std::size_t SocketConnection::unreadBytes() {
+    int waiting = 0;
+    (void)::ioctl(socket_.native_handle(), FIONREAD, &waiting);
+    return pending_.size() + static_cast<std::size_t>(waiting);
 }
 
 void SocketConnection::end(Ending ending) {

@@ -85,6 +85,10 @@ public:
 
     // On the io_context's thread.
     void close();
+    // Reads what the peer has written up to now, then closes; what it writes later fails.
+    void finish();
+    // What it has written and nobody has read.
+    std::size_t unreadBytes();
     void readIfAllowed();
 
     // Any thread.
@@ -128,6 +132,7 @@ private:
     bool waiting_ = false;
     bool ended_ = false;
     bool peerFinished_ = false;
+    bool finishing_ = false;
     Ending ending_ = Ending::Closed; // Once all is read that the peer sent.
 
     std::atomic<std::size_t> unprocessedRequests_{0};

@@ -204,5 +204,63 @@ TEST_F(LeavingPeerTest, OneThatOnlyTakesNoAnswersIsHeardUntilItLeaves) {
     EXPECT_EQ(delegate_.events, (std::vector<std::string>{"interrupted", "invalidated"}));
 }
 
+// The daemon's end.
+class FinishingTest : public LeavingPeerTest {
+protected:
+    void finish() {
+        listener_->finishReading([this] { finished_ = true; });
+        settle();
+    }
+    bool finished_ = false;
+};
+
+TEST_F(FinishingTest, TakesWhatWasWrittenAndNothingLater) {
+    const int client = connectAndWrite();
+    finish();
+    EXPECT_EQ(sendSome(client, notification()), 0u);
+    EXPECT_FALSE(finished_);
+    EXPECT_GT(listener_->unreadBytes(), 0u);
+
+    letGoOfCharges();
+    EXPECT_EQ(delegate_.object->requests.size(), kWritten);
+    EXPECT_TRUE(finished_);
+    EXPECT_EQ(delegate_.events, std::vector<std::string>{"invalidated"});
+}
+
+TEST_F(FinishingTest, AnswersThatNobodyTakesHoldNothingUp) {
+    connectAndWrite();
+    const auto& requests = delegate_.object->requests;
+    requests[0].reply(std::nullopt, std::string(1'000'000, 'x'));
+    settle();
+    finish();
+    requests[1].reply(std::nullopt, std::string(SocketConnection::kMaxUnsentBytes, 'x'));
+
+    letGoOfCharges();
+    EXPECT_EQ(requests.size(), kWritten);
+    EXPECT_TRUE(finished_);
+}
+
+TEST_F(FinishingTest, IsDoneAtOnceWhereNobodyIsConnected) {
+    finish();
+    EXPECT_TRUE(finished_);
+}
+
+TEST_F(FinishingTest, WhoHasComeAndWrittenIsHeardAndWhoComesLaterIsRefused) {
+    const int early = connectUnserved();
+    const std::string written = notification();
+    ASSERT_EQ(::send(early, written.data(), written.size(), 0), std::ssize(written));
+    listener_->acceptTheLast();
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    path_.copy(address.sun_path, sizeof address.sun_path - 1);
+    const int late = ::socket(AF_UNIX, SOCK_STREAM, 0);
+    EXPECT_NE(::connect(late, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+    ::close(late);
+
+    finish();
+    EXPECT_EQ(delegate_.object->requests.size(), 1u);
+    EXPECT_TRUE(finished_);
+}
+
 } // namespace
 } // namespace halyard::linux_

@@ -101,6 +101,7 @@ SocketListener::SocketListener(asio::io_context& context, Pressure& pressure, in
       retry_(context), authorizer_(std::move(authorizer)), shared_(pressure) {
     raiseDescriptorLimit();
     pressure.setReliefHandler([this] { asio::post(context_, [this] { resumeReading(); }); });
+    shared_.connectionsChanged = [this](std::size_t connections) { tellConnections(connections); };
 }
 
 SocketListener::~SocketListener() = default;
@@ -194,6 +195,45 @@ void SocketListener::stopAccepting() {
     asio::error_code ignored;
     acceptor_.close(ignored);
     retry_.cancel();
+}
+
+void SocketListener::tellConnections(std::size_t connections) {
+    if (connectionsChanged_) {
+        connectionsChanged_(connections);
+    }
+    if (connections == 0 && finished_) {
+        asio::post(context_, std::exchange(finished_, nullptr)); // Behind what an end causes.
+    }
+}
+
+void SocketListener::acceptTheLast() {
+    (void)::shutdown(acceptor_.native_handle(), SHUT_RD);
+    asio::error_code error;
+    acceptor_.non_blocking(true, error);
+    while (!error) {
+        auto socket = acceptor_.accept(error);
+        if (!error) {
+            accepted(std::move(socket));
+        }
+    }
+}
+
+void SocketListener::finishReading(std::function<void()> done) {
+    stopAccepting();
+    finished_ = std::move(done);
+    const auto connections = shared_.connections; // Reading may end some.
+    for (const auto& connection : connections) {
+        connection->finish();
+    }
+    tellConnections(shared_.connections.size());
+}
+
+std::size_t SocketListener::unreadBytes() {
+    std::size_t bytes = 0;
+    for (const auto& connection : shared_.connections) {
+        bytes += connection->unreadBytes();
+    }
+    return bytes;
 }
 
 void SocketListener::closeAllConnections() {

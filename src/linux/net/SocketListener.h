@@ -43,9 +43,17 @@ public:
     // from within. Requires that no earlier call is unanswered.
     void stopAcceptingUnlessSomebodyComes(std::function<void(bool stopped)> done);
     void onConnectionsChanged(std::function<void(std::size_t connections)> changed) {
-        shared_.connectionsChanged = std::move(changed);
+        connectionsChanged_ = std::move(changed);
     }
+    // Takes those who have come already; who comes later is refused. Requires that nobody
+    // else holds the socket.
+    void acceptTheLast();
+    // Takes what was written up to now and closes each connection then. Calls back, never
+    // from within, when there is none any more. Once, and nobody is accepted afterwards.
+    void finishReading(std::function<void()> done);
     void closeAllConnections();
+    // What was written to the connections and nobody has read.
+    std::size_t unreadBytes();
 
     // Any thread.
     std::vector<std::int32_t> connectedProcesses() const { return shared_.processes.pids(); }
@@ -58,6 +66,7 @@ private:
     void answerLeaver(bool stopped);
     void refuse(const Peer& peer);
     void resumeReading();
+    void tellConnections(std::size_t connections);
 
     asio::io_context& context_;
     asio::local::stream_protocol::acceptor acceptor_;
@@ -68,6 +77,8 @@ private:
     std::optional<std::uint32_t> refusedUid_; // The episode that has been logged.
     bool acceptFailureLogged_ = false;
     std::function<void(bool)> leaver_;
+    std::function<void(std::size_t)> connectionsChanged_; // may be none
+    std::function<void()> finished_;                      // Once no connection is left.
 };
 
 // A listening socket at `path` (mode 0666), replacing the leftover of a daemon
