@@ -115,6 +115,24 @@ TEST_P(DictionarySizeTest, MergingIntoItselfChangesNothing) {
     EXPECT_EQ(dictionary_, before);
 }
 
+TEST_P(DictionarySizeTest, MergingFindsWhatItAddedAmongWhatWasThere) {
+    Dictionary added;
+    for (int i = 0; i < 60; ++i) {
+        added.set(keyAt(GetParam() - 1 + i), -i);
+    }
+    const Dictionary shared = dictionary_;
+    dictionary_.merge(added);
+    for (const auto& entry : added) {
+        EXPECT_EQ(dictionary_[entry.key.text()], entry.value);
+    }
+    for (int i = 0; i < GetParam() - 1; ++i) {
+        EXPECT_TRUE(added.contains(keyAt(i)) || dictionary_[keyAt(i)] == Value(i));
+    }
+    EXPECT_EQ(shared.size(), static_cast<std::size_t>(GetParam())) << "who shared it keeps it";
+    dictionary_.set("another", 1);
+    EXPECT_EQ(dictionary_["another"], Value(1));
+}
+
 TEST(DictionaryTest, MergingIntoNothingSharesTheContents) {
     const Dictionary source{{"a", 1}};
     Dictionary target;

@@ -448,6 +448,44 @@ void DictionaryBlock::removeDuplicatesAndNone() {
     }
 }
 
+// Key by key, each new one would move those behind it in `order`.
+void DictionaryBlock::merge(std::span<const Dictionary::Entry> others) {
+    const std::size_t before = entries.size();
+    for (const Dictionary::Entry& other : others) {
+        const auto at = indexOf(other.key.text(), before);
+        if (at < before) {
+            entries[at].value = other.value;
+        } else {
+            entries.push_back(other);
+        }
+    }
+    if (order.empty()) {
+        rebuildOrder();
+        return;
+    }
+    for (std::size_t i = before; i < entries.size(); ++i) {
+        order.push_back(static_cast<std::uint32_t>(i));
+    }
+    const auto earlier = [this](std::uint32_t a, std::uint32_t b) {
+        return entries[a].key.text() < entries[b].key.text();
+    };
+    const auto added = order.begin() + static_cast<std::ptrdiff_t>(before);
+    std::sort(added, order.end(), earlier);
+    std::inplace_merge(order.begin(), added, order.end(), earlier);
+}
+
+std::size_t DictionaryBlock::indexOf(std::string_view key, std::size_t size) const noexcept {
+    if (order.empty()) {
+        const auto end = entries.begin() + static_cast<std::ptrdiff_t>(size);
+        const auto at = std::find_if(entries.begin(), end,
+                                     [&](const auto& entry) { return entry.key.text() == key; });
+        return static_cast<std::size_t>(at - entries.begin());
+    }
+    const std::size_t at = lowerBound(key);
+    const bool known = at < order.size() && entries[order[at]].key.text() == key;
+    return known ? order[at] : size;
+}
+
 } // namespace detail
 
 Dictionary::Dictionary(std::initializer_list<Entry> entries)
@@ -550,13 +588,12 @@ void Dictionary::erase(std::string_view key) {
 }
 
 void Dictionary::merge(const Dictionary& other) {
-    if (empty()) {
-        *this = other;
+    if (empty() || other.empty()) {
+        *this = empty() ? other : *this;
         return;
     }
-    for (const Entry& entry : other) {
-        set(entry.key, entry.value);
-    }
+    const Dictionary kept = other; // It may be this very one.
+    ownBlock().merge(kept.block()->entries);
 }
 
 bool operator==(const Dictionary& left, const Dictionary& right) noexcept {

@@ -3,6 +3,7 @@
 
 #include <atomic>
 #include <cstdint>
+#include <span>
 #include <string_view>
 #include <vector>
 
@@ -53,6 +54,10 @@ struct DictionaryBlock : Counted {
     const Dictionary::Entry* find(std::string_view key) const noexcept;
     // Where `key` stands in `order`, or where it would have to be inserted.
     std::size_t lowerBound(std::string_view key) const noexcept;
+    // Of the first `size` entries; `size` when the key is none of theirs.
+    std::size_t indexOf(std::string_view key, std::size_t size) const noexcept;
+    // Requires that no key stands twice in `others`.
+    void merge(std::span<const Dictionary::Entry> others);
     void removeDuplicatesAndNone();
     void rebuildOrder();
 };
