@@ -242,6 +242,19 @@ void appendDescription(std::string& out, const Value& value) {
     }
 }
 
+std::string shortened(std::string text, std::size_t limit) {
+    if (text.size() <= limit) {
+        return text;
+    }
+    std::size_t kept = limit;
+    while (kept > 0 && (static_cast<unsigned char>(text[kept]) & 0xC0U) == 0x80U) {
+        --kept;
+    }
+    const std::size_t left = text.size() - kept;
+    text.resize(kept);
+    return text + fmt::format("... ({} bytes more)", left);
+}
+
 std::string describe(const Value& value) {
     std::string out;
     appendDescription(out, value);

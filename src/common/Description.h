@@ -6,6 +6,7 @@
 #pragma once
 
 #include <string>
+#include <string_view>
 
 #include "common/Value.h"
 
@@ -14,6 +15,10 @@ namespace halyard {
 // An absent value reads "(null)".
 std::string describe(const Value& value);
 void appendDescription(std::string& out, const Value& value);
+
+// `text`; of a long one its first `limit` bytes, or a few less where a character would
+// be cut, and "... (N bytes more)".
+std::string shortened(std::string text, std::size_t limit);
 
 // "yyyy-MM-dd HH:mm:ss +0000"
 std::string describe(Date date);

@@ -126,5 +126,12 @@ TEST(DescriptionTest, ContainedDatesAreQuoted) {
     EXPECT_EQ(describe(List{Value(Date{0, 0})}), "(\n    \"1970-01-01 00:00:00 +0000\"\n)");
 }
 
+TEST(DescriptionTest, ALongTextIsCutBetweenCharacters) {
+    EXPECT_EQ(shortened("four", 4), "four");
+    EXPECT_EQ(shortened("fiver", 4), "five... (1 bytes more)");
+    EXPECT_EQ(shortened("abc\xC3\xA9", 4), "abc... (2 bytes more)");
+    EXPECT_EQ(shortened(std::string(3, '\x80'), 2), "... (3 bytes more)");
+}
+
 } // namespace
 } // namespace halyard

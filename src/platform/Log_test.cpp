@@ -56,6 +56,13 @@ TEST_F(LogTest, ALineTellsWhereItStands) {
     EXPECT_EQ(log_.category, HYReportingClientCategory);
 }
 
+TEST_F(LogTest, ALineIsNoLongerThanSixteenKilobytesAndSaysHowMuchIsMissing) {
+    HY_LOG_ERROR(HYReportingClientCategory, "{}", std::string(16 * 1024, 'x'));
+    HY_LOG_ERROR(HYReportingClientCategory, "{}", Value(std::string(1'000'000, 'x')));
+    EXPECT_THAT(log_.texts, ElementsAre(std::string(16 * 1024, 'x'),
+                                        std::string(16 * 1024, 'x') + "... (983616 bytes more)"));
+}
+
 TEST_F(LogTest, ALineThatNobodyReadsCostsNothing) {
     int looked = 0;
     HY_LOG_INFO(HYReportingClientCategory, "{}", ++looked);

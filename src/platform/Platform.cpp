@@ -17,6 +17,9 @@ fmt::formatter<halyard::Value>::format(const halyard::Value& value,
 namespace halyard::platform {
 namespace {
 
+// More than any line of our own has; what makes one longer came from a client.
+constexpr std::size_t kLongestText = 16 * 1024;
+
 const Platform* installed = nullptr;
 
 std::string_view baseName(std::string_view path) {
@@ -45,7 +48,7 @@ bool logEnabled(LogLevel level) {
 
 void logFormatted(LogLevel level, LogCategory category, const LogPlace& where,
                   fmt::string_view format, fmt::format_args arguments) {
-    const std::string text = fmt::vformat(format, arguments);
+    const std::string text = shortened(fmt::vformat(format, arguments), kLongestText);
     installed->log->write(
         {level, category, baseName(where.file), where.line, where.function, text});
 }

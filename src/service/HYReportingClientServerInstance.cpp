@@ -289,13 +289,13 @@ void HYReportingClientServerInstance::reporterID(std::int64_t reporterID, Dictio
 
 void HYReportingClientServerInstance::getAllReporters(ListReply reply) {
     onServiceQueue([reply = std::move(reply)](auto&, Delegate& delegate) {
-        List reporters;
+        std::vector<Value> reporters;
         for (const auto& client : delegate.getAllClients()) {
-            for (const auto& [reporterID, session] : client->clientReportingSessionMap()) {
-                reporters.append(reporterID);
-            }
+            client->forEachSession([&](std::int64_t reporterID, const auto& /*session*/) {
+                reporters.emplace_back(reporterID);
+            });
         }
-        reply(std::nullopt, reporters);
+        reply(std::nullopt, List(std::move(reporters)));
     });
 }
 

@@ -65,6 +65,14 @@ public:
     std::shared_ptr<HYReportingSession> ownSession(std::int64_t reporterID) const
         HY_EXCLUDES(mapMutex_);
     SessionMap clientReportingSessionMap() const HY_EXCLUDES(mapMutex_);
+    // Calls visit(reporterID, session) for each in the map's order, under its lock: for
+    // those who would otherwise copy the map of a client with many.
+    template <class Visit> void forEachSession(Visit visit) const HY_EXCLUDES(mapMutex_) {
+        const MutexLock lock(mapMutex_);
+        for (const auto& [reporterID, session] : sessions_) {
+            visit(reporterID, session);
+        }
+    }
 
 private:
     using Delegate = HYReportingServiceDelegateProtocol;

@@ -174,6 +174,34 @@ TEST_F(HYReportingClientServerInstanceTest, AStopTellsWhoIsLeft) {
                     "stopping 7"));
 }
 
+TEST_F(HYReportingClientServerInstanceTest, OfManySessionsALineNamesTheFirstSixteen) {
+    for (std::int64_t id = 1; id <= 20; ++id) {
+        client_.create(id);
+    }
+    client_.start(20);
+    std::string named;
+    for (std::int64_t id = 1; id <= 16; ++id) {
+        named += "    \"" + session(id)->description() + "\",\n";
+    }
+    EXPECT_TRUE(logged(LogLevel::Default,
+                       "sessions for client 100 : (\n" + named + "    \"and 4 more\"\n)"));
+    EXPECT_TRUE(loggedByClient(LogLevel::Default, "1 active reporting session(s) (\n    \"" +
+                                                      session(20)->description() + "\"\n)"));
+}
+
+TEST_F(HYReportingClientServerInstanceTest, OfManyClientsALineTellsTheNumber) {
+    for (std::int32_t pid = 1; pid <= 20; ++pid) {
+        connect(pid).create(pid);
+    }
+    client_.create(99);
+    forgetLog();
+    client_.start(99);
+    EXPECT_TRUE(logged(LogLevel::Default, "sessions for client 14 : (\n    \"" +
+                                              session(14, 15)->description() + "\"\n)"));
+    EXPECT_EQ(platform_.log.countOf("sessions for client ", LogLevel::Default), 16U);
+    EXPECT_TRUE(logged(LogLevel::Default, "sessions for 6 more clients : 6"));
+}
+
 TEST_F(HYReportingClientServerInstanceTest, AStartAnswersTheEarlierStartThatIsStillHeld) {
     client_.create(7);
     const auto earlier = client_.start(7);

@@ -212,12 +212,29 @@ void HYReportingServiceDelegate::setActiveSessionCount(std::int64_t count) {
 std::vector<HYReportingServiceDelegate::Session>
 HYReportingServiceDelegate::getAllActiveReportingSessions() const {
     std::vector<Session> active;
+    std::size_t clients = 0;
+    std::size_t sessionsLeftOut = 0;
     for (const Client& client : getAllClients()) {
-        const auto sessions = sessionsOf(*client);
+        std::vector<Session> named;
+        std::size_t sessions = 0;
+        client->forEachSession([&](std::int64_t /*reporterID*/, const Session& session) {
+            if (++sessions <= kNamedInLog) {
+                named.push_back(session);
+            }
+            if (session->started()) {
+                active.push_back(session);
+            }
+        });
+        if (++clients > kNamedInLog) {
+            sessionsLeftOut += sessions;
+            continue;
+        }
         HY_LOG_DEFAULT(HYReportingServiceDelegateCategory, "sessions for client {} : {}",
-                       client->processIdentifier(), describeSessions(sessions));
-        std::copy_if(sessions.begin(), sessions.end(), std::back_inserter(active),
-                     [](const Session& session) { return session->started(); });
+                       client->processIdentifier(), describeSessions(named, sessions));
+    }
+    if (clients > kNamedInLog) {
+        HY_LOG_DEFAULT(HYReportingServiceDelegateCategory, "sessions for {} more clients : {}",
+                       clients - kNamedInLog, sessionsLeftOut);
     }
     return active;
 }

@@ -1,5 +1,8 @@
 #include "service/MessageFanOut.h"
 
+#include <algorithm>
+#include <fmt/format.h>
+
 #include "platform/Device.h"
 #include "platform/Log.h"
 #include "platform/Platform.h"
@@ -15,21 +18,32 @@ constexpr std::uint32_t kSendMark = 0x21044824;
 constexpr std::int64_t kReportingDisabled = 1;
 constexpr std::int64_t kStandaloneReporterID = 1;
 
+void tellRest(std::vector<Value>& named, std::size_t count) {
+    if (count > named.size()) {
+        named.emplace_back(fmt::format("and {} more", count - named.size()));
+    }
+}
+
 Value describeIDs(const std::optional<std::vector<std::int64_t>>& reporterIDs) {
     if (!reporterIDs) {
         return {};
     }
-    return List(std::vector<Value>(reporterIDs->begin(), reporterIDs->end()));
+    const std::size_t named = std::min(reporterIDs->size(), kNamedInLog);
+    std::vector<Value> ids(reporterIDs->begin(),
+                           reporterIDs->begin() + static_cast<std::ptrdiff_t>(named));
+    tellRest(ids, reporterIDs->size());
+    return List(std::move(ids));
 }
 
 } // namespace
 
-Value describeSessions(const std::vector<std::shared_ptr<HYReportingSession>>& sessions) {
+Value describeSessions(const std::vector<std::shared_ptr<HYReportingSession>>& sessions,
+                       std::size_t count) {
     std::vector<Value> descriptions;
-    descriptions.reserve(sessions.size());
-    for (const auto& session : sessions) {
-        descriptions.emplace_back(session->description());
+    for (std::size_t i = 0; i < sessions.size() && i < kNamedInLog; ++i) {
+        descriptions.emplace_back(sessions[i]->description());
     }
+    tellRest(descriptions, count);
     return List(std::move(descriptions));
 }
 

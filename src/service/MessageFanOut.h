@@ -48,7 +48,15 @@ private:
     const std::optional<std::string>& processName_;
 };
 
-// A list of session descriptions, for log lines.
-Value describeSessions(const std::vector<std::shared_ptr<HYReportingSession>>& sessions);
+// What lines of the log name of a list; of the rest they have the number.
+inline constexpr std::size_t kNamedInLog = 16;
+
+// A list of session descriptions, for log lines, of `count` sessions of which these
+// come first.
+Value describeSessions(const std::vector<std::shared_ptr<HYReportingSession>>& sessions,
+                       std::size_t count);
+inline Value describeSessions(const std::vector<std::shared_ptr<HYReportingSession>>& sessions) {
+    return describeSessions(sessions, sessions.size());
+}
 
 } // namespace halyard

@@ -25,6 +25,8 @@ constexpr std::uint32_t kMessageMark = 0x21044838;
 
 constexpr std::uint32_t kLogsMode = 0777;
 constexpr AudioEventCategory kSummaryCategory = 0xFFFFFFFF;
+// Of an application's name, where lines of the log describe a session.
+constexpr std::size_t kLongestName = 256;
 constexpr const char* kHostApplicationKey = "HostApplicationDisplayID";
 constexpr const char* kClientApplicationKey = "VQHostApplicationDisplayID";
 
@@ -59,7 +61,8 @@ std::string HYReportingSession::description() const {
         "reporterID={},serviceName={},ownerPid={},HostApplicationDisplayID={},started={}",
         reporterID_, HYReportingUtilityGenerateServiceNameFromServiceType(serviceType()),
         processIdentifiers_.empty() ? 0 : processIdentifiers_.front(),
-        describe(HYReportingUtilityRetrieveAppName(configuration())), started() ? 1 : 0);
+        shortened(describe(HYReportingUtilityRetrieveAppName(configuration())), kLongestName),
+        started() ? 1 : 0);
 }
 
 std::string HYReportingSession::serviceName() const {

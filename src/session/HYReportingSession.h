@@ -46,6 +46,7 @@ public:
     initWithID(std::int64_t reporterID, std::vector<std::int32_t> processIdentifiers);
     ~HYReportingSession() override;
 
+    // For lines of the log: of a long application name only the beginning.
     std::string description() const;
 
     // Starting a started session and stopping one that is not are no-ops. A stop

@@ -66,6 +66,16 @@ TEST_F(HYReportingSessionTest, DescribesItself) {
                                       "HostApplicationDisplayID=org.example.clock,started=1");
 }
 
+TEST_F(HYReportingSessionTest, DescribesALongApplicationNameByItsBeginning) {
+    const auto session = HYReportingSession::initWithID(-9, {100});
+    session->updateConfigurationWithContentsOfConfiguration(
+        {{"HostApplicationDisplayID", std::string(1'000'000, 'n')}});
+    EXPECT_EQ(session->description(), "reporterID=-9,serviceName=unknown,ownerPid=100,"
+                                      "HostApplicationDisplayID=" +
+                                          std::string(256, 'n') +
+                                          "... (999744 bytes more),started=0");
+}
+
 TEST_F(HYReportingSessionTest, WithoutAProcessItsOwnerIsZero) {
     EXPECT_EQ(HYReportingSession::initWithID(1, {})->description(),
               "reporterID=1,serviceName=unknown,ownerPid=0,"
