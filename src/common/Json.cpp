@@ -110,11 +110,21 @@ template <class Writer> void writeValue(Writer& writer, const Value& value) {
 class CompactText {
 public:
     void clear() { size_ = 0; }
+    void shrink() {
+        if (buffer_.size() > kKeptBytes) {
+            buffer_ = std::vector<char>(kFirstBytes);
+        }
+        size_ = 0;
+    }
+    std::size_t capacity() const { return buffer_.size(); }
     std::string_view text() const { return {buffer_.data(), size_}; }
     void write(const Value& value);
     void write(std::span<const Dictionary::Entry> entries);
 
 private:
+    static constexpr std::size_t kFirstBytes = 1024;
+    static constexpr std::size_t kKeptBytes = 64 * 1024;
+
     // Makes room behind what is written. Never null.
     char* room(std::size_t bytes) {
         if (buffer_.size() - size_ < bytes) {
@@ -135,7 +145,7 @@ private:
     void write(std::span<const Value> items);
     template <class Real> void writeReal(Real value);
 
-    std::vector<char> buffer_ = std::vector<char>(1024);
+    std::vector<char> buffer_ = std::vector<char>(kFirstBytes);
     std::size_t size_ = 0;
 };
 
@@ -274,6 +284,14 @@ std::string_view JsonWriter::write(const Dictionary& value) {
     buffer_->text.clear();
     buffer_->text.write({value.begin(), value.end()});
     return buffer_->text.text();
+}
+
+void JsonWriter::shrink() {
+    buffer_->text.shrink();
+}
+
+std::size_t JsonWriter::capacity() const {
+    return buffer_->text.capacity();
 }
 
 } // namespace halyard

@@ -29,6 +29,10 @@ public:
     std::string_view write(const Value& value);
     std::string_view write(const Dictionary& value);
 
+    // Lets go of the room that an unusually long text took.
+    void shrink();
+    std::size_t capacity() const;
+
 private:
     struct Buffer;
     std::unique_ptr<Buffer> buffer_;

@@ -96,5 +96,17 @@ TEST(JsonTest, OneWriterWritesManyValues) {
     EXPECT_EQ(writer.write(Dictionary{{"b", 3}}), "{\"b\":3}");
 }
 
+TEST(JsonTest, AWriterLetsGoOfTheRoomOfALongText) {
+    JsonWriter writer;
+    (void)writer.write(Value(std::string(40'000, 'x')));
+    writer.shrink();
+    const std::size_t usual = writer.capacity();
+    EXPECT_GE(usual, 40'000U) << "room for what comes every day stays";
+    (void)writer.write(Value(std::string(1'000'000, 'x')));
+    writer.shrink();
+    EXPECT_LT(writer.capacity(), usual);
+    EXPECT_EQ(writer.write(Value("short")), "\"short\"");
+}
+
 } // namespace
 } // namespace halyard

@@ -70,6 +70,7 @@ LinuxPlatform::LinuxPlatform(Directories directories, platform::TraceMarks& trac
           },
           ::getuid()),
       loop_(context_), idleExit_(system_.clock, loop_, whenIdle()),
+      freeMemory_(loop_, {residentBytes, [this] { returnMemory(); }}),
       startTime_(system_.clock.steadyTime()) {
     std::signal(SIGPIPE, SIG_IGN);
     platform_.log = &log_;
@@ -175,8 +176,10 @@ Result<void> LinuxPlatform::open(platform::ListenerDelegate* delegate) {
         std::make_unique<SocketListener>(context_, pressure_, listening.value(),
                                          [this](const Peer& peer) { return rightsOfPeer(peer); });
     listener_->setDelegate(delegate);
-    listener_->onConnectionsChanged(
-        [this](std::size_t connections) { idleExit_.connectionsChanged(connections); });
+    listener_->onConnectionsChanged([this](std::size_t connections) {
+        idleExit_.connectionsChanged(connections);
+        freeMemory_.released(); // If somebody has left, which this need not know.
+    });
     watchStopSignals();
     watchReloadSignal();
     observeConfiguration();
@@ -219,6 +222,12 @@ IdleExit::Actions LinuxPlatform::whenIdle() {
                 listener_->stopAcceptingUnlessSomebodyComes(std::move(done));
             },
             [this] { beginShutdown(); }};
+}
+
+void LinuxPlatform::returnMemory() {
+    returnFreeMemory();
+    queues_->onEachThread([] { returnFreeMemory(); });
+    store_->store.onThread([] { returnFreeMemory(); });
 }
 
 // The service queue answers the manager's watchdog: it is what must not hang.

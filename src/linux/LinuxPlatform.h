@@ -24,6 +24,7 @@
 #include "linux/queues/Queues.h"
 #include "linux/store/StoreServices.h"
 #include "linux/system/Directories.h"
+#include "linux/system/FreeMemory.h"
 #include "linux/system/IncidentFolder.h"
 #include "linux/system/LogWriter.h"
 #include "linux/system/SystemServices.h"
@@ -64,6 +65,7 @@ private:
     void observeConfiguration();
     void armWatchdog();
     IdleExit::Actions whenIdle();
+    void returnMemory();
     void beginShutdown();
     void stopReading();
     void logAccounts() const;
@@ -92,6 +94,7 @@ private:
     std::unique_ptr<Queues> queues_;
     ContextQueue loop_;
     IdleExit idleExit_;
+    FreeMemory freeMemory_;
     std::unique_ptr<SocketListener> listener_;
     platform::Platform platform_;
     platform::SteadyTime startTime_;

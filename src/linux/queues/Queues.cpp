@@ -111,6 +111,12 @@ void Queues::onServiceQueue(platform::Task task) {
     }
 }
 
+void Queues::onEachThread(const platform::Task& task) {
+    for (Worker* const worker : {&service_, &relay_, &backgroundWorker_}) {
+        worker->onEachThread(task);
+    }
+}
+
 // Draining follows the work down the stairs that it takes: requests on the service
 // queue leave deliveries to the relay queues, these leave single messages to the
 // background queue a second later, and all three leave rows to the store, which is

@@ -45,6 +45,9 @@ public:
     // Runs a task behind what the service queue has to do now.
     void onServiceQueue(platform::Task task) HY_EXCLUDES(mutex_);
 
+    // Runs a task on each thread of these queues, soon.
+    void onEachThread(const platform::Task& task);
+
     std::size_t delayedTasks() const { return delayedCount_.load(); }
     void stop();
 

@@ -1,6 +1,10 @@
 #include "linux/queues/Worker.h"
 
+#include <chrono>
+#include <condition_variable>
 #include <csignal>
+#include <memory>
+#include <mutex>
 #include <pthread.h>
 #include <sched.h>
 #include <sys/resource.h>
@@ -10,6 +14,7 @@ namespace {
 
 constexpr int kInteractiveNice = -10;
 constexpr int kUtilityNice = 5;
+constexpr std::chrono::milliseconds kMeetingLimit{20};
 
 // Best effort: without the right to raise it, the default priority stays.
 void applyPriority(platform::QueuePriority priority) {
@@ -52,6 +57,26 @@ void Worker::run(platform::QueuePriority priority) {
     pthread_setname_np(pthread_self(), name_.substr(0, 15).c_str());
     applyPriority(priority);
     context_.run();
+}
+
+// Each waits for the others a moment, so that no thread takes two.
+void Worker::onEachThread(platform::Task task) {
+    struct Meeting {
+        std::mutex mutex;
+        std::condition_variable changed;
+        std::size_t missing;
+    };
+    const auto meeting = std::make_shared<Meeting>();
+    meeting->missing = threads_.size();
+    for (std::size_t i = 0; i < threads_.size(); ++i) {
+        post([meeting, task] {
+            task();
+            std::unique_lock lock(meeting->mutex);
+            --meeting->missing;
+            meeting->changed.notify_all();
+            meeting->changed.wait_for(lock, kMeetingLimit, [&] { return meeting->missing == 0; });
+        });
+    }
 }
 
 void Worker::stop() {

@@ -25,6 +25,8 @@ public:
     template <class Function> void post(Function&& function) {
         asio::post(context_, std::forward<Function>(function));
     }
+    // Runs a task once on each thread; one that is busy for long may be left out.
+    void onEachThread(platform::Task task);
     void stop();
 
 private:

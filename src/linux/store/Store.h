@@ -72,6 +72,9 @@ public:
     // store's thread, at once without a store.
     void purge(StoreWriter::PurgeReply reply);
 
+    // Runs a task on the store's thread, between two groups; never without a store.
+    void onThread(std::function<void()> task) { writer_->onThread(std::move(task)); }
+
     void setLimits(StoreLimits limits) { writer_->setLimits(limits); }
     StoreStatus status() const { return writer_->status(); }
 

@@ -333,6 +333,9 @@ StoreResult StoreDatabase::commit() {
     }
     committedRows_ = groupRows_;
     groupUploads_.clear();
+    for (JsonWriter* const writer : {&payload_, &sessionInfo_, &userInfo_}) {
+        writer->shrink(); // The statements have been reset.
+    }
     if (countPages_.step() == SQLITE_ROW) {
         pageCount_ = static_cast<std::uint64_t>(countPages_.integer(0));
         countPages_.reset();

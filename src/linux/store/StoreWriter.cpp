@@ -177,6 +177,7 @@ void StoreWriter::closeDatabase() {
 void StoreWriter::run() {
     for (;;) {
         purgeIfAsked();
+        runTasks();
         switch (queue_->waitForGroup(idleDelay())) {
         case StoreQueue::Wake::Rows:
             queue_->take(taken_);
@@ -263,6 +264,25 @@ void StoreWriter::purge(PurgeReply reply) {
         purges_.push_back(std::move(reply));
     }
     queue_->wake();
+}
+
+void StoreWriter::onThread(std::function<void()> task) {
+    {
+        const MutexLock lock(mutex_);
+        tasks_.push_back(std::move(task));
+    }
+    queue_->wake();
+}
+
+void StoreWriter::runTasks() {
+    std::vector<std::function<void()>> tasks;
+    {
+        const MutexLock lock(mutex_);
+        tasks.swap(tasks_);
+    }
+    for (const auto& task : tasks) {
+        task();
+    }
 }
 
 void StoreWriter::purgeIfAsked() {

@@ -90,6 +90,9 @@ public:
     using PurgeReply = std::function<void(const Result<std::uint64_t, StoreFailure>&)>;
     void purge(PurgeReply reply) HY_EXCLUDES(mutex_);
 
+    // Runs a task on the writer's thread, when it is not writing.
+    void onThread(std::function<void()> task) HY_EXCLUDES(mutex_);
+
     void setLimits(StoreLimits limits) HY_EXCLUDES(mutex_);
     StoreStatus status() const HY_EXCLUDES(mutex_);
 
@@ -111,6 +114,7 @@ private:
     void writeGroup(std::span<StoreItem> group);
     void maintain();
     void purgeIfAsked() HY_EXCLUDES(mutex_);
+    void runTasks() HY_EXCLUDES(mutex_);
     Result<std::uint64_t, StoreFailure> purgeRows();
     StoreResult attempt(std::span<StoreItem> group);
     StoreResult writeRows(std::span<StoreItem> group);
@@ -148,6 +152,7 @@ private:
     std::optional<Episode> episode_ HY_GUARDED_BY(mutex_);
     StoreStatus status_ HY_GUARDED_BY(mutex_);
     std::vector<PurgeReply> purges_ HY_GUARDED_BY(mutex_);
+    std::vector<std::function<void()>> tasks_ HY_GUARDED_BY(mutex_);
 };
 
 } // namespace halyard::linux_
