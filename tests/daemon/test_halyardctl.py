@@ -677,6 +677,12 @@ class LeftBehind(unittest.TestCase):
         self.assertEqual((done.returncode, done.stderr), (0, ""))
         return json.loads(done.stdout)
 
+    def test_its_log_is_a_part_of_its_size(self):
+        size = sum(os.path.getsize(self.daemon.store_path + end) for end in ("", "-wal"))
+        for command, key in ([], "store_bytes"), (["check"], "bytes"):
+            told = json.loads(ctl(*command, "--json", state=self.state).stdout)
+            self.assertEqual(told[key], size)
+
     def test_its_rows_are_read_and_its_files_stay_as_they_are(self):
         def contents():
             found = {}

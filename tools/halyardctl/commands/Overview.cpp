@@ -1,5 +1,4 @@
 // How the device's sound is doing today, and where to read on.
-#include <filesystem>
 #include <fmt/format.h>
 
 #include "commands/Commands.h"
@@ -73,8 +72,7 @@ StoreFacts readStore(const Context& context, const reading::TimeRange& today) {
     if (!reader.ok()) {
         return take(reader.failure());
     }
-    std::error_code ignored;
-    facts.bytes = std::filesystem::file_size(reader.value().path(), ignored);
+    facts.bytes = reading::bytesOfStore(reader.value().path());
     const auto digest = digestOf(reader.value(), today, context.now);
     if (!digest.ok()) {
         return take(digest.failure());

@@ -136,9 +136,13 @@ Outcome<void> removeWhole(const fs::path& path) {
 
 } // namespace
 
+std::uint64_t bytesOfStore(const fs::path& path) {
+    return sizeOf(path) + sizeOf(path.native() + "-wal");
+}
+
 Outcome<StoreCheck> checkStore(const fs::path& path, const std::function<void(double)>& progress) {
     StoreCheck check;
-    check.bytes = sizeOf(path) + sizeOf(path.native() + "-wal");
+    check.bytes = bytesOfStore(path);
     auto opened = StoreReader::open(path);
     if (!opened.ok()) {
         if (!opened.failure().isDamage) {

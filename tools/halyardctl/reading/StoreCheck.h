@@ -23,13 +23,16 @@ struct StoreCheck {
     // In the order of the schema; none where a table cannot be counted.
     std::vector<std::pair<std::string, std::optional<std::int64_t>>> rows;
     std::optional<std::int64_t> unclosedSessions;
-    std::uint64_t bytes = 0; // of the file and its write-ahead log
+    std::uint64_t bytes = 0; // as bytesOfStore has it
 };
 
 // `progress` is told how far it is, from 0 to 1. Damage is a result; what cannot be
 // looked at is trouble.
 Outcome<StoreCheck> checkStore(const std::filesystem::path& path,
                                const std::function<void(double)>& progress);
+
+// What a store takes on the disk: of the file and its write-ahead log.
+std::uint64_t bytesOfStore(const std::filesystem::path& path);
 
 // SQLite's quick look at every page.
 bool isSound(StoreReader& reader);
