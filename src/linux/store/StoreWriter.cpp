@@ -5,7 +5,6 @@
 #include <numeric>
 #include <utility>
 
-#include "linux/store/StoreSalvage.h"
 #include "platform/Log.h"
 
 // What happens when a group cannot be written.
@@ -97,10 +96,11 @@ StoreWriter::StoreWriter(const StoreOptions& options, const platform::Clock& clo
                          std::shared_ptr<StoreQueue> queue)
     : options_(options), clock_(clock), queue_(std::move(queue)),
       database_({options_.path, options_.busyTimeout, options_.vfs}),
-      retention_(platform::secondsSince1970(clock.wallTime())), limits_(options_.limits) {}
+      retention_(platform::secondsSince1970(clock.wallTime())),
+      keeper_(options_, clock, database_, retention_), limits_(options_.limits) {}
 
 bool StoreWriter::open() {
-    const StoreResult opened = openDatabase();
+    const StoreResult opened = keeper_.open();
     const bool usable = opened.ok() || opened.failure().mayPass();
     if (!usable) {
         HY_LOG_ERROR(HYReportingPlatformCategory, "running without a store: {}: {}",
@@ -113,52 +113,6 @@ bool StoreWriter::open() {
     const MutexLock lock(mutex_);
     status_.open = usable;
     return usable;
-}
-
-StoreResult StoreWriter::openDatabase() {
-    StoreResult opened = openFile();
-    if (!opened.ok() && opened.failure().isDamage()) {
-        return replaceDamaged(opened.failure());
-    }
-    return opened;
-}
-
-StoreResult StoreWriter::openFile() {
-    StoreResult opened = database_.open();
-    if (opened.ok() && options_.onOpened) {
-        options_.onOpened();
-    }
-    return opened;
-}
-
-StoreResult StoreWriter::replaceDamaged(const StoreFailure& damage) {
-    retention_.reset();
-    database_.abandon();
-    const auto aside = storeSetAside(options_.path, clock_.wallTime());
-    if (!aside.ok()) {
-        HY_LOG_ERROR(HYReportingPlatformCategory, "{} is damaged and cannot be set aside: {}",
-                     options_.path.string(), aside.failure().message());
-        return damage;
-    }
-    HY_LOG_ERROR(HYReportingPlatformCategory, "{} is damaged, set aside as {}: {}",
-                 options_.path.string(), aside.value().filename().string(), damage.text);
-    StoreResult opened = openFile();
-    if (opened.ok()) {
-        carryOver(aside.value());
-    }
-    return opened;
-}
-
-void StoreWriter::carryOver(const std::filesystem::path& aside) {
-    const StoreSalvage salvage = storeCarryOver(aside, database_.handle());
-    HY_LOG_DEFAULT(HYReportingPlatformCategory,
-                   "carried over {} rows of {}, failed to read in {} places", salvage.carried,
-                   aside.filename().string(), salvage.holes);
-    if (!salvage.whole.ok()) {
-        HY_LOG_ERROR(HYReportingPlatformCategory, "not all rows could be carried over: {}",
-                     salvage.whole.failure().text);
-    }
-    (void)database_.takeOver(); // Falls back on the ids' own conflicts.
 }
 
 void StoreWriter::closeDatabase() {
@@ -304,12 +258,12 @@ void StoreWriter::purgeIfAsked() {
 }
 
 Result<std::uint64_t, StoreFailure> StoreWriter::purgeRows() {
-    if (const StoreResult open = reopenIfNeeded(); !open.ok()) {
+    if (const StoreResult open = keeper_.reopenIfNeeded(); !open.ok()) {
         return open.failure();
     }
     auto purged = database_.purge();
     if (!purged.ok() && purged.failure().isDamage()) {
-        const StoreResult replaced = replaceDamaged(purged.failure());
+        const StoreResult replaced = keeper_.replaceDamaged(purged.failure());
         return replaced.ok() ? database_.purge() : replaced.failure();
     }
     return purged;
@@ -317,11 +271,11 @@ Result<std::uint64_t, StoreFailure> StoreWriter::purgeRows() {
 
 StoreResult StoreWriter::attempt(std::span<StoreItem> group) {
     busySince_.store(clock_.steadyTime().time_since_epoch().count());
-    StoreResult result = reopenIfNeeded();
+    StoreResult result = keeper_.reopenIfNeeded();
     if (result.ok()) {
         result = writeRows(group);
         if (!result.ok() && result.failure().isDamage()) {
-            result = replaceDamaged(result.failure());
+            result = keeper_.replaceDamaged(result.failure());
             result = result.ok() ? writeRows(group) : result;
         }
     }
@@ -331,16 +285,6 @@ StoreResult StoreWriter::attempt(std::span<StoreItem> group) {
         endEpisode();
     }
     return result;
-}
-
-StoreResult StoreWriter::reopenIfNeeded() {
-    if (database_.hasMoved()) {
-        HY_LOG_ERROR(HYReportingPlatformCategory, "{} was removed or replaced, opening it anew",
-                     options_.path.string());
-        retention_.reset();
-        database_.abandon();
-    }
-    return database_.isOpen() ? StoreResult() : openDatabase();
 }
 
 StoreResult StoreWriter::writeRows(std::span<StoreItem> group) {

@@ -15,41 +15,14 @@
 
 #include "common/Mutex.h"
 #include "linux/store/StoreDatabase.h"
+#include "linux/store/StoreKeeper.h"
 #include "linux/store/StoreLimits.h"
+#include "linux/store/StoreOptions.h"
 #include "linux/store/StoreQueue.h"
 #include "linux/store/StoreRetention.h"
 #include "platform/Clock.h"
 
 namespace halyard::linux_ {
-
-struct StoreOptions {
-    std::filesystem::path path; // of telemetry.db
-    StoreLimits limits;
-    StoreQueue::Marks marks;
-    // Called from any thread that uses the store, never twice with the same value.
-    StoreQueue::PressureHandler onPressure;
-    // Called on the thread that opens the file, each time that it was opened or made.
-    std::function<void()> onOpened;
-
-    // A group is committed when it has this many rows, or limits.syncInterval after the
-    // first of fewer came. A slow disk gets larger ones, and so does one that is to be
-    // written to more seldom than kPromptInterval.
-    std::size_t groupRows = 1024;
-    std::size_t patientRows = 6144;
-    std::chrono::milliseconds busyTimeout{1000};
-    std::chrono::nanoseconds firstRetry = std::chrono::milliseconds(100);
-    std::chrono::nanoseconds lastRetry = std::chrono::seconds(5);
-    // When one operation counts as hanging, by the clock, and how often to look.
-    std::chrono::nanoseconds stuckAfter = std::chrono::seconds(10);
-    std::chrono::nanoseconds watchPeriod = std::chrono::seconds(1);
-    // How often the age of rows is looked at, and how often at most when none come: a
-    // tenth of the age in between.
-    std::chrono::nanoseconds agePeriod = std::chrono::minutes(1);
-    std::chrono::nanoseconds idlePeriod = std::chrono::minutes(10);
-    // How long the end of the store may take.
-    std::chrono::nanoseconds closeLimit = std::chrono::seconds(10);
-    const char* vfs = nullptr; // SQLite's default
-};
 
 // Where the operator has asked for more than this, groups grow rather than be many.
 inline constexpr std::chrono::milliseconds kPromptInterval{500};
@@ -103,12 +76,7 @@ private:
         std::uint64_t lostBefore;
     };
 
-    StoreResult openDatabase();
-    StoreResult openFile();
-    StoreResult replaceDamaged(const StoreFailure& damage);
-    void carryOver(const std::filesystem::path& aside);
     void closeDatabase();
-    StoreResult reopenIfNeeded();
     void writeTaken();
     std::chrono::nanoseconds idleDelay() const HY_EXCLUDES(mutex_);
     void writeGroup(std::span<StoreItem> group);
@@ -136,6 +104,7 @@ private:
     const std::shared_ptr<StoreQueue> queue_;
     StoreDatabase database_;
     StoreRetention retention_;
+    StoreKeeper keeper_;
     std::vector<StoreItem> taken_;
     std::vector<StoreTable> rejected_; // rows of the running attempt
     std::string rejection_;            // why the last of them was

@@ -1,0 +1,43 @@
+// What a store is made with. Plain values.
+#pragma once
+
+#include <chrono>
+#include <cstddef>
+#include <filesystem>
+#include <functional>
+
+#include "linux/store/StoreLimits.h"
+#include "linux/store/StoreQueue.h"
+
+namespace halyard::linux_ {
+
+struct StoreOptions {
+    std::filesystem::path path; // of telemetry.db
+    StoreLimits limits;
+    StoreQueue::Marks marks;
+    // Called from any thread that uses the store, never twice with the same value.
+    StoreQueue::PressureHandler onPressure;
+    // Called on the thread that opens the file, each time that it was opened or made.
+    std::function<void()> onOpened;
+
+    // A group is committed when it has this many rows, or limits.syncInterval after the
+    // first of fewer came. A slow disk gets larger ones, and so does one that is to be
+    // written to more seldom than kPromptInterval.
+    std::size_t groupRows = 1024;
+    std::size_t patientRows = 6144;
+    std::chrono::milliseconds busyTimeout{1000};
+    std::chrono::nanoseconds firstRetry = std::chrono::milliseconds(100);
+    std::chrono::nanoseconds lastRetry = std::chrono::seconds(5);
+    // When one operation counts as hanging, by the clock, and how often to look.
+    std::chrono::nanoseconds stuckAfter = std::chrono::seconds(10);
+    std::chrono::nanoseconds watchPeriod = std::chrono::seconds(1);
+    // How often the age of rows is looked at, and how often at most when none come: a
+    // tenth of the age in between.
+    std::chrono::nanoseconds agePeriod = std::chrono::minutes(1);
+    std::chrono::nanoseconds idlePeriod = std::chrono::minutes(10);
+    // How long the end of the store may take.
+    std::chrono::nanoseconds closeLimit = std::chrono::seconds(10);
+    const char* vfs = nullptr; // SQLite's default
+};
+
+} // namespace halyard::linux_
