@@ -1,12 +1,15 @@
 // A disk that a test can make fail or hang: SQLite's own file layer with a gate
-// before every write and every sync of the write-ahead log.
+// before every write and every sync of the write-ahead log, and one before reads.
 #pragma once
 
 #include <atomic>
 #include <condition_variable>
+#include <cstdint>
 #include <cstring>
+#include <filesystem>
 #include <mutex>
 #include <sqlite3.h>
+#include <sys/stat.h>
 
 namespace halyard::linux_ {
 
@@ -30,6 +33,11 @@ public:
 
     // What writing to the log answers from now on.
     void fail(int code) { code_ = code; }
+    // What reading this file answers from now on, whatever its name will be.
+    void failReadsOf(const std::filesystem::path& path) { unreadable_ = numberOf(path.c_str()); }
+    void readAgain() { unreadable_ = 0; }
+    // So many pages come as nonsense.
+    void garble(int pages) { garbled_ = pages; }
     void hang() {
         const std::lock_guard lock(mutex_);
         hanging_ = true;
@@ -49,7 +57,7 @@ private:
     struct File {
         sqlite3_file base;
         sqlite3_io_methods methods;
-        const sqlite3_io_methods* realMethods;
+        std::uint64_t number; // of the file in its file system
     };
 
     static FaultyDisk*& current() {
@@ -77,6 +85,23 @@ private:
     static void passBarrier(sqlite3_file* file) {
         realOf(file)->pMethods->xShmBarrier(realOf(file));
     }
+    static std::uint64_t numberOf(const char* name) {
+        struct stat status {};
+        return name != nullptr && ::stat(name, &status) == 0 ? status.st_ino : 0;
+    }
+    static int read(sqlite3_file* file, void* bytes, int count, sqlite3_int64 offset) {
+        FaultyDisk& disk = *current();
+        const std::uint64_t number = reinterpret_cast<File*>(file)->number;
+        if (number != 0 && number == disk.unreadable_) {
+            return SQLITE_IOERR_READ;
+        }
+        const int code = pass<&sqlite3_io_methods::xRead>(file, bytes, count, offset);
+        if (code == SQLITE_OK && offset > 0 && disk.garbled_ > 0) {
+            --disk.garbled_;
+            std::memset(bytes, 0xA5, static_cast<std::size_t>(count));
+        }
+        return code;
+    }
     static int write(sqlite3_file* file, const void* bytes, int count, sqlite3_int64 offset) {
         const int code = current()->gate();
         return code != SQLITE_OK ? code
@@ -99,7 +124,7 @@ private:
         sqlite3_io_methods& methods = reinterpret_cast<File*>(file)->methods;
         methods = {real->pMethods->iVersion,
                    pass<&M::xClose>,
-                   pass<&M::xRead>,
+                   read,
                    log ? write : pass<&M::xWrite, const void*, int, sqlite3_int64>,
                    pass<&M::xTruncate>,
                    log ? sync : pass<&M::xSync, int>,
@@ -117,12 +142,15 @@ private:
                    pass<&M::xFetch>,
                    pass<&M::xUnfetch>};
         file->pMethods = &methods;
+        reinterpret_cast<File*>(file)->number = numberOf(name);
         return code;
     }
 
     sqlite3_vfs* real_ = nullptr;
     sqlite3_vfs layer_{};
     std::atomic<int> code_{SQLITE_OK};
+    std::atomic<std::uint64_t> unreadable_{0};
+    std::atomic<int> garbled_{0};
     std::mutex mutex_;
     std::condition_variable changed_;
     bool hanging_ = false;

@@ -1,6 +1,7 @@
 #include "linux/store/Store.h"
 
 #include <array>
+#include <atomic>
 #include <condition_variable>
 #include <csignal>
 #include <pthread.h>
@@ -11,23 +12,26 @@
 
 namespace halyard::linux_ {
 
-// How the writer's thread tells that it has ended, and the watch is told to. While
-// clients are held back, the watch sees to it that a writer that hangs lets them go.
+// How the writer's thread tells that it has ended, and the watch is told to. The watch
+// sleeps while the writer does, so that an idle daemon does not wake up, and looks at
+// its work more often while clients are held back for it.
 struct StoreEnding {
     Mutex mutex;
     std::condition_variable_any changed;
+    std::atomic<bool> armed{false};
     bool writerEnded HY_GUARDED_BY(mutex) = false;
     bool closing HY_GUARDED_BY(mutex) = false;
     bool pressed HY_GUARDED_BY(mutex) = false;
 
     // True while there is a reason to look after the writer. Waits for one.
-    bool waitForWatch(std::chrono::nanoseconds period) HY_EXCLUDES(mutex) {
+    bool waitForWatch(std::chrono::nanoseconds pressedPeriod, std::chrono::nanoseconds period)
+        HY_EXCLUDES(mutex) {
         const MutexLock lock(mutex);
-        while (!closing && !pressed) {
+        while (!closing && !pressed && !armed) {
             changed.wait(mutex);
         }
         if (!closing) {
-            changed.wait_for(mutex, period);
+            changed.wait_for(mutex, pressed ? pressedPeriod : period);
         }
         return !closing;
     }
@@ -35,6 +39,13 @@ struct StoreEnding {
         const MutexLock lock(mutex);
         pressed = on;
         changed.notify_all();
+    }
+    // Called for every commit, and all but free while the watch is awake.
+    void arm() HY_EXCLUDES(mutex) {
+        if (!armed.exchange(true)) {
+            const MutexLock lock(mutex);
+            changed.notify_all();
+        }
     }
 };
 
@@ -101,7 +112,9 @@ std::uint64_t settledMessages(const StoreStatus& store) {
 Store::Store(const StoreOptions& options, const platform::Clock& clock)
     : clock_(clock), closeLimit_(options.closeLimit), ending_(std::make_shared<StoreEnding>()),
       queue_(makeQueue(options, ending_)),
-      writer_(std::make_shared<StoreWriter>(options, clock, queue_)), open_(writer_->open()) {
+      writer_(std::make_shared<StoreWriter>(options, clock, queue_,
+                                            [ending = ending_] { ending->arm(); })),
+      open_(writer_->open()) {
     if (!open_) {
         return;
     }
@@ -112,9 +125,16 @@ Store::Store(const StoreOptions& options, const platform::Clock& clock)
         ending->changed.notify_all();
     });
     watching_ = startThread("store watch",
-                            [writer = writer_, ending = ending_, period = options.watchPeriod] {
-                                while (ending->waitForWatch(period)) {
+                            [writer = writer_, ending = ending_, pressed = options.watchPeriod,
+                             period = options.calmWatchPeriod] {
+                                while (ending->waitForWatch(pressed, period)) {
                                     writer->watch();
+                                    // In this order: work that begins in between is seen, or arms
+                                    // anew.
+                                    ending->armed = false;
+                                    if (writer->isWorking()) {
+                                        ending->armed = true;
+                                    }
                                 }
                             });
 }
@@ -128,7 +148,7 @@ Store::~Store() {
     }
 }
 
-bool Store::close() {
+bool Store::close(std::chrono::nanoseconds limit) {
     if (!writing_.joinable()) {
         return true;
     }
@@ -138,7 +158,7 @@ bool Store::close() {
         const MutexLock lock(ending_->mutex);
         ending_->closing = true;
         ending_->changed.notify_all();
-        const auto until = std::chrono::steady_clock::now() + closeLimit_;
+        const auto until = std::chrono::steady_clock::now() + limit;
         while (!ending_->writerEnded &&
                ending_->changed.wait_until(ending_->mutex, until) != std::cv_status::timeout) {
         }
@@ -149,6 +169,8 @@ bool Store::close() {
     }
     if (ended) {
         writing_.join();
+    } else if (!std::exchange(toldUnwritten_, true)) {
+        writer_->tellUnwritten();
     }
     return ended;
 }

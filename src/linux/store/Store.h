@@ -82,7 +82,9 @@ public:
     // it. False when that did not end within the limit: it goes on then and may be
     // waited for again, but once this object is destroyed its thread is left
     // behind, and the process should end without tearing anything down.
-    [[nodiscard]] bool close();
+    // What it leaves unwritten is told, once.
+    [[nodiscard]] bool close() { return close(closeLimit_); }
+    [[nodiscard]] bool close(std::chrono::nanoseconds limit);
 
 private:
     void hurryFor(std::uint16_t category);
@@ -96,6 +98,7 @@ private:
     const std::shared_ptr<StoreQueue> queue_;
     const std::shared_ptr<StoreWriter> writer_;
     bool open_ = false;
+    bool toldUnwritten_ = false;
     std::thread writing_;
     std::thread watching_;
 };

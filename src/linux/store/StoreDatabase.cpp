@@ -4,9 +4,10 @@
 #include <fmt/format.h>
 #include <fstream>
 #include <string_view>
+#include <sys/stat.h>
+#include <unistd.h>
 #include <utility>
 
-#include "common/Utf8.h"
 #include "linux/store/StorePurge.h"
 
 namespace halyard::linux_ {
@@ -38,10 +39,6 @@ constexpr const char* kCloseInterrupted =
     "UPDATE upload_session SET ended = 'interrupted', closed = coalesce((SELECT time FROM last "
     "WHERE upload_session = upload_session.id), opened) WHERE closed IS NULL";
 
-std::string_view nameOf(platform::UploadEnding ending) {
-    return ending == platform::UploadEnding::Disconnected ? kEndedDisconnected : kEndedStopped;
-}
-
 // The size of pages counts for new files only. Twice SQLite's saves a good part of
 // the writes to log and file, and the least commit is still small.
 // Space that deleted rows leave is not overwritten (it costs writes), and the
@@ -52,6 +49,8 @@ constexpr const char* kConfiguration = "PRAGMA page_size = 8192;"
                                        "PRAGMA secure_delete = OFF;"
                                        "PRAGMA trusted_schema = OFF;"
                                        "PRAGMA temp_store = MEMORY;";
+
+constexpr std::array<const char*, 2> kCompanionNames = {"-wal", "-shm"};
 
 constexpr std::size_t kVersionOffset = 60; // of user_version in a database file
 constexpr std::size_t kHeaderBytes = 64;
@@ -139,7 +138,9 @@ StoreResult StoreDatabase::openFile() {
         result = result.ok() ? (this->*step)() : result;
     }
     ++generation_;
-    return result.ok() && firstUpload_ == 0 ? takeOver() : result;
+    result = result.ok() && firstUpload_ == 0 ? takeOver() : result;
+    companions_ = companionsAtPath();
+    return result;
 }
 
 StoreResult StoreDatabase::configure() {
@@ -285,8 +286,21 @@ StoreResult StoreDatabase::resultOf(int code) const {
     return code == SQLITE_OK ? StoreResult() : failureOf(code);
 }
 
+// SQLite says no more than that it cannot open something.
+int StoreDatabase::whyNotWritable() const {
+    for (const fs::path& path : {settings_.path.parent_path(), settings_.path}) {
+        if (::access(path.c_str(), W_OK) != 0 && errno != ENOENT) {
+            return errno;
+        }
+    }
+    return 0;
+}
+
 StoreFailure StoreDatabase::failureOf(int code) const {
-    const int system = database_ == nullptr ? 0 : sqlite3_system_errno(database_);
+    int system = database_ == nullptr ? 0 : sqlite3_system_errno(database_);
+    if ((code & 0xFF) == SQLITE_CANTOPEN) {
+        system = whyNotWritable();
+    }
     const char* const said = database_ == nullptr ? nullptr : sqlite3_errmsg(database_);
     std::string text = fmt::format("{} ({})", said == nullptr ? sqlite3_errstr(code) : said, code);
     return {{static_cast<std::errc>(system), std::move(text)}, code};
@@ -297,6 +311,43 @@ bool StoreDatabase::hasMoved() {
     return database_ != nullptr &&
            sqlite3_file_control(database_, "main", SQLITE_FCNTL_HAS_MOVED, &moved) == SQLITE_OK &&
            moved != 0;
+}
+
+StoreDatabase::Companions StoreDatabase::companionsAtPath() const {
+    Companions found{};
+    for (std::size_t i = 0; i < found.size(); ++i) {
+        struct stat status {};
+        if (::stat((settings_.path.string() + kCompanionNames[i]).c_str(), &status) == 0) {
+            found[i] = {status.st_dev, status.st_ino};
+        }
+    }
+    return found;
+}
+
+bool StoreDatabase::hasLostLog() const {
+    return database_ != nullptr && companionsAtPath() != companions_;
+}
+
+// What lies at the log's path by then is none that this file may be given back: its
+// pages are older than those that have just been moved.
+StoreResult StoreDatabase::saveLostLog() {
+    const int code =
+        sqlite3_wal_checkpoint_v2(database_, nullptr, SQLITE_CHECKPOINT_FULL, nullptr, nullptr);
+    if (code != SQLITE_OK) {
+        return failureOf(code);
+    }
+    abandon();
+    for (const char* const name : kCompanionNames) {
+        std::error_code absent;
+        fs::remove(settings_.path.string() + name, absent);
+    }
+    return {};
+}
+
+void StoreDatabase::leaveRoom() {
+    for (std::int64_t& id : nextID_) {
+        id += kRoomForUnread;
+    }
 }
 
 void StoreDatabase::abandon() {
@@ -383,115 +434,6 @@ StoreResult StoreDatabase::boundLog(std::uint64_t maxBytes, std::uint64_t checkp
         logPages_ = 0;
     }
     return resultOf(code == SQLITE_BUSY ? SQLITE_OK : code);
-}
-
-// Ids are given here and not by SQLite, so that they are known without asking and
-// are not used twice when retention has emptied a table. When somebody else has
-// inserted rows meanwhile, ours go behind them.
-template <class... Values>
-StoreResult StoreDatabase::insertInto(StoreTable table, const Values&... values) {
-    const auto index = static_cast<std::size_t>(table);
-    StoreStatement& insert = inserts_[index];
-    insert.bindFrom(1, nextID_[index], values...);
-    int code = insert.run();
-    if (code == SQLITE_CONSTRAINT_PRIMARYKEY || code == SQLITE_CONSTRAINT_ROWID) {
-        if (StoreResult refreshed = refreshIds(); !refreshed.ok()) {
-            return refreshed;
-        }
-        insert.bind(1, nextID_[index]);
-        code = insert.run();
-    }
-    if (code != SQLITE_OK) {
-        return failureOf(code);
-    }
-    ++nextID_[index];
-    ++groupRows_[index];
-    return {};
-}
-
-StoreResult StoreDatabase::ensureUpload(const StoreUploadPtr& upload) {
-    if (upload->row != 0 && upload->generation != generation_) {
-        findUpload_.bindFrom(1, upload->row, upload->sessionID);
-        const int code = findUpload_.step();
-        findUpload_.reset();
-        if (code != SQLITE_ROW && code != SQLITE_DONE) {
-            return failureOf(code);
-        }
-        upload->row = code == SQLITE_ROW ? upload->row : 0;
-        upload->generation = generation_;
-    }
-    if (upload->row != 0) {
-        return {};
-    }
-    StoreResult inserted = insertInto(
-        StoreTable::UploadSession, upload->sessionID, sessionInfo_.write(upload->sessionInfo),
-        userInfo_.write(upload->userInfo), upload->opened, nullptr, nullptr);
-    if (!inserted.ok()) {
-        return inserted;
-    }
-    wroteUpload_ = true;
-    upload->row = nextID_[static_cast<std::size_t>(StoreTable::UploadSession)] - 1;
-    upload->generation = generation_;
-    groupUploads_.push_back(upload);
-    return inserted;
-}
-
-StoreResult StoreDatabase::insert(const StoreOpenRow& row) {
-    return ensureUpload(row.upload);
-}
-
-StoreResult StoreDatabase::insert(const StoreCloseRow& row) {
-    if (StoreResult done = ensureUpload(row.upload); !done.ok()) {
-        return done;
-    }
-    closeUpload_.bindFrom(1, row.time, nameOf(row.ending), row.upload->row);
-    return resultOf(closeUpload_.run());
-}
-
-StoreResult StoreDatabase::insert(const StoreMessageRow& row) {
-    if (StoreResult done = ensureUpload(row.upload); !done.ok()) {
-        return done;
-    }
-    return insertInto(StoreTable::UploadMessage, row.upload->row, nullptr, nullptr,
-                      std::int64_t{row.category}, std::int64_t{row.type},
-                      payload_.write(row.payload), row.time);
-}
-
-StoreResult StoreDatabase::insert(const StoreSingleRow& row) {
-    return insertInto(StoreTable::UploadMessage, nullptr, sessionInfo_.write(row.sessionInfo),
-                      userInfo_.write(row.userInfo), std::int64_t{row.category},
-                      std::int64_t{row.type}, payload_.write(row.payload), row.time);
-}
-
-StoreResult StoreDatabase::insert(const StoreAnalyticsRow& row) {
-    return insertInto(StoreTable::AnalyticsEvent, row.name.text(), payload_.write(row.payload),
-                      row.time);
-}
-
-StoreResult StoreDatabase::insert(const StoreEnergyRow& row) {
-    return insertInto(StoreTable::EnergyEvent, std::int64_t{row.client}, row.name.text(),
-                      payload_.write(row.payload), row.time);
-}
-
-StoreResult StoreDatabase::insert(const StoreMetricRow& row) {
-    return insertInto(StoreTable::Metric, std::int64_t{row.metricID}, StoreBlob{row.message},
-                      row.time);
-}
-
-StoreResult StoreDatabase::insert(const StoreIncidentRow& row) {
-    const std::string report = replaceInvalidUtf8(row.report.text());
-    return insertInto(StoreTable::Incident, payload_.write(row.signature), std::string_view(report),
-                      row.time);
-}
-
-StoreResult StoreDatabase::insert(const StoreRepeatRow& row) {
-    if (StoreResult done = ensureUpload(row.upload); !done.ok()) {
-        return done;
-    }
-    const platform::Repeats& repeats = row.repeats;
-    return insertInto(StoreTable::Repeat, row.upload->row, std::int64_t{repeats.category},
-                      std::int64_t{repeats.type}, static_cast<std::int64_t>(repeats.count),
-                      repeats.first, repeats.last);
 }
 
 } // namespace halyard::linux_

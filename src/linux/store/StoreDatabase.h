@@ -17,6 +17,7 @@
 #include <memory>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include "common/Json.h"
@@ -37,6 +38,8 @@ public:
         std::chrono::milliseconds busyTimeout{1000};
         const char* vfs = nullptr; // SQLite's default
     };
+    // More ids than any store has used.
+    static constexpr std::int64_t kRoomForUnread = std::int64_t{1} << 40;
     using RowCounts = std::array<std::uint64_t, kStoreTables>;
 
     explicit StoreDatabase(Settings settings);
@@ -47,6 +50,10 @@ public:
     bool isOpen() const { return database_ != nullptr; }
     // The file was removed or replaced behind our back.
     bool hasMoved();
+    // The write-ahead log or its index was: nobody else will ever see what is in ours.
+    bool hasLostLog() const;
+    // Moves that into the file, and closes it.
+    StoreResult saveLostLog();
     // Without a checkpoint: for a file that is not to be touched any more.
     void abandon();
     // Moves everything from the log into the file first.
@@ -91,9 +98,18 @@ public:
     // After rows were brought in from elsewhere, of an earlier run unless this one has
     // written a session already.
     StoreResult takeOver();
+    // Ids go on far behind, so that those before are there for rows that could not be
+    // read yet.
+    void leaveRoom();
+    // How often a file was opened.
+    std::uint64_t generation() const { return generation_; }
 
 private:
+    // Device and number of the log's file and its index's.
+    using Companions = std::array<std::pair<std::uint64_t, std::uint64_t>, 2>;
+
     StoreResult openFile();
+    Companions companionsAtPath() const;
     StoreResult configure();
     StoreResult migrate();
     StoreResult check();
@@ -105,6 +121,7 @@ private:
     StoreResult readPageCounts();
     // Requires a code that is an error.
     StoreFailure failureOf(int code) const;
+    int whyNotWritable() const;
 
     StoreResult ensureUpload(const StoreUploadPtr& upload);
     template <class... Values> StoreResult insertInto(StoreTable table, const Values&... values);
@@ -124,6 +141,7 @@ private:
     std::vector<StoreUploadPtr> groupUploads_;
     std::int64_t firstUpload_ = 0;
     bool wroteUpload_ = false;
+    Companions companions_{};
     std::uint64_t generation_ = 0;
     std::uint64_t pageSize_ = 0;
     std::uint64_t pageCount_ = 0;

@@ -4,6 +4,7 @@
 #include <csignal>
 #include <fstream>
 #include <sys/mount.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -74,17 +75,42 @@ TEST_F(StoreFailureTest, FullDiskAtTheStartIsOvercomeToo) {
     EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 2);
 }
 
-TEST_F(StoreFailureTest, ReadOnlyDiskMeansNoStore) {
+TEST_F(StoreFailureTest, AReadOnlyDiskAtTheStartIsOvercomeToo) {
     if (!mountSmallDisk("size=1m")) {
         GTEST_SKIP() << "needs the right to mount";
     }
+    keepFew();
     open();
+    addSingles(1, {});
     store_.reset();
-    ASSERT_EQ(
-        ::mount("tmpfs", directory_.path().c_str(), "tmpfs", MS_REMOUNT | MS_RDONLY, "size=1m"), 0);
+    const char* const directory = directory_.path().c_str();
+    ASSERT_EQ(::mount("tmpfs", directory, "tmpfs", MS_REMOUNT | MS_RDONLY, "size=1m"), 0);
     open();
-    EXPECT_FALSE(store_->isOpen());
-    EXPECT_EQ(log_.countOf("running without a store", LogLevel::Error), 1U);
+    EXPECT_TRUE(store_->isOpen());
+    EXPECT_NE(log_.waitFor("cannot write").find("read-only"), std::string::npos);
+    addSingles(12, {});
+    EXPECT_EQ(lost(StoreLoss::ReadOnly), 2U);
+    ASSERT_EQ(::mount("tmpfs", directory, "tmpfs", MS_REMOUNT, "size=1m"), 0);
+    flush();
+    EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 11);
+}
+
+TEST_F(StoreFailureTest, ADirectoryWithoutRightsAtTheStartIsOvercomeToo) {
+    if (::geteuid() == 0) {
+        GTEST_SKIP() << "root has every right";
+    }
+    open();
+    addSingles(1, {});
+    store_.reset();
+    ASSERT_EQ(::chmod(directory_.path().c_str(), 0500), 0);
+    ASSERT_EQ(::chmod(options_.path.c_str(), 0400), 0);
+    open();
+    addSingles(2, {});
+    EXPECT_NE(log_.waitFor("cannot write").find("read-only"), std::string::npos);
+    ASSERT_EQ(::chmod(directory_.path().c_str(), 0700), 0);
+    ASSERT_EQ(::chmod(options_.path.c_str(), 0600), 0);
+    flush();
+    EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 3);
 }
 
 TEST_F(StoreFailureTest, WithoutAStoreEverythingIsCountedAndFlushAnswers) {
@@ -165,17 +191,39 @@ TEST_F(StoreFailureTest, AHangingDiskLetsTheClientsGo) {
     EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 12);
 }
 
-TEST_F(StoreFailureTest, ClosingGivesUpOnADiskThatHangs) {
+TEST_F(StoreFailureTest, AHangIsNoticedHoweverFewRowsCome) {
+    options_.calmWatchPeriod = 1ms;
     options_.vfs = FaultyDisk::kName;
-    options_.closeLimit = 1ms;
     open();
+    addSingles(1, {});
+    flush();
     disk_.hang();
     addSingles(1, {});
+    store_->flush([] {});
+    disk_.waitForVictim();
+    clock_.advance(options_.stuckAfter);
+    log_.waitFor("the file system does not answer");
+    EXPECT_TRUE(store_->status().failing);
+    disk_.goOn();
+    log_.waitFor("0 rows lost");
+    flush();
+    EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 2);
+}
+
+TEST_F(StoreFailureTest, ClosingGivesUpOnADiskThatHangsAndTellsWhatIsLost) {
+    options_.vfs = FaultyDisk::kName;
+    options_.closeLimit = 1ms;
+    options_.groupRows = 3;
+    open();
+    disk_.hang();
+    store_->closeUpload(store_->openUpload(1, {}, {})); // A row, and no further one.
+    addSingles(4, {});
     EXPECT_FALSE(store_->close());
     disk_.goOn();
     while (!store_->close()) { // Waits a while each time.
     }
-    EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 1);
+    EXPECT_EQ(log_.countOf("5 rows lost: the file system does not answer", LogLevel::Error), 1U);
+    EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 4);
 }
 
 TEST_F(StoreFailureTest, ARowThatIsRefusedForItselfIsLostAlone) {

@@ -70,6 +70,7 @@ TEST_F(StoreMigrationTest, AFirstVersionThatIsDamagedIsCarriedOver) {
     open();
     EXPECT_EQ(log_.countOf("is damaged, set aside", LogLevel::Error), 1U);
     EXPECT_THAT(log_.waitFor("carried over"), ::testing::HasSubstr("carried over 8 rows"));
+    EXPECT_THAT(log_.waitFor("carried over"), ::testing::HasSubstr("in 0 places"));
     EXPECT_EQ(sessions(), migrated_);
     EXPECT_EQ(reader().one("SELECT * FROM energy_event"), "8|NULL|event|{}|1699999001.0");
 }

@@ -30,11 +30,20 @@ struct StoreOptions {
     std::chrono::nanoseconds lastRetry = std::chrono::seconds(5);
     // When one operation counts as hanging, by the clock, and how often to look.
     std::chrono::nanoseconds stuckAfter = std::chrono::seconds(10);
-    std::chrono::nanoseconds watchPeriod = std::chrono::seconds(1);
+    std::chrono::nanoseconds watchPeriod = std::chrono::seconds(1); // while clients are held back
+    std::chrono::nanoseconds calmWatchPeriod = std::chrono::seconds(5);
     // How often the age of rows is looked at, and how often at most when none come: a
     // tenth of the age in between.
     std::chrono::nanoseconds agePeriod = std::chrono::minutes(1);
     std::chrono::nanoseconds idlePeriod = std::chrono::minutes(10);
+    // Damage is looked at so many times, with growing pauses, before it is believed, and
+    // a file that cannot be read for so long is given up.
+    int looks = 3;
+    std::chrono::nanoseconds lookPause = std::chrono::milliseconds(50);
+    std::chrono::nanoseconds unreadableFor = std::chrono::minutes(1);
+    // When what was set aside and could not be read is tried again, at doubled intervals.
+    std::chrono::nanoseconds firstRereading = std::chrono::seconds(10);
+    std::chrono::nanoseconds lastRereading = std::chrono::minutes(10);
     // How long the end of the store may take.
     std::chrono::nanoseconds closeLimit = std::chrono::seconds(10);
     const char* vfs = nullptr; // SQLite's default

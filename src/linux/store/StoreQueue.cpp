@@ -12,6 +12,10 @@ constexpr std::size_t kKeptCapacity = 8192;
 // How fast the expected size of payloads forgets a large one.
 constexpr std::size_t kForgetShare = 64;
 
+bool isClose(const StoreRow& row) {
+    return std::holds_alternative<StoreCloseRow>(row);
+}
+
 } // namespace
 
 StoreQueue::StoreQueue(Marks marks, Window window, PressureHandler onPressure)
@@ -42,6 +46,7 @@ void StoreQueue::pushAlways(StoreRow row) {
     const std::size_t bytes = storeBytes(row);
     const MutexLock lock(mutex_);
     if (!stopping_) {
+        heldCloses_ += isClose(row) ? 1 : 0;
         appendLocked(std::move(row), bytes);
     }
 }
@@ -50,6 +55,8 @@ void StoreQueue::appendLocked(StoreRow&& row, std::size_t bytes) {
     if (items_.empty()) {
         firstCame_ = std::chrono::steady_clock::now();
         due_ = firstCame_ + window_.delay;
+    } else if (items_.size() % window_.rows == 0) {
+        groupStarts_.push_back({items_.size(), std::chrono::steady_clock::now()});
     }
     const bool wasFull = isFullLocked();
     items_.push_back({std::move(row), bytes});
@@ -140,7 +147,7 @@ StoreQueue::Levels StoreQueue::levels() const {
     const auto oldest = heldRows_ == 0
                             ? std::chrono::nanoseconds(0)
                             : std::chrono::steady_clock::now() - (taken ? takenCame_ : firstCame_);
-    return {heldRows_, heldBytes_, lost_, oldest};
+    return {heldRows_, heldBytes_, heldRows_ - heldCloses_, lost_, oldest};
 }
 
 void StoreQueue::countLost(StoreLoss reason, StoreTable table) {
@@ -184,23 +191,32 @@ void StoreQueue::take(std::vector<StoreItem>& items) {
         std::vector<StoreItem>().swap(items);
     }
     const MutexLock lock(mutex_);
-    const Instant now = std::chrono::steady_clock::now();
-    const bool all = takeAll_ || now >= due_ || queuedBytes_ >= window_.bytes;
+    const bool all =
+        takeAll_ || std::chrono::steady_clock::now() >= due_ || queuedBytes_ >= window_.bytes;
     const std::size_t rest = all ? 0 : items_.size() % window_.rows;
     items.swap(items_);
     takeAll_ = false;
     takenCame_ = firstCame_;
     queuedBytes_ = 0;
     if (rest != 0) {
-        const auto cut = std::prev(items.end(), static_cast<std::ptrdiff_t>(rest));
-        for (auto item = cut; item != items.end(); ++item) {
-            queuedBytes_ += item->bytes;
-        }
-        std::move(cut, items.end(), std::back_inserter(items_));
-        items.erase(cut, items.end());
-        firstCame_ = now;
-        due_ = now + window_.delay;
+        leaveBehindLocked(items, rest);
     }
+    groupStarts_.clear();
+}
+
+// When the window was changed meanwhile, they may look a little older than they are.
+void StoreQueue::leaveBehindLocked(std::vector<StoreItem>& items, std::size_t rest) {
+    const std::size_t from = items.size() - rest;
+    for (const GroupStart& start : groupStarts_) {
+        firstCame_ = start.at <= from ? start.came : firstCame_;
+    }
+    due_ = firstCame_ + window_.delay;
+    const auto cut = std::prev(items.end(), static_cast<std::ptrdiff_t>(rest));
+    for (auto item = cut; item != items.end(); ++item) {
+        queuedBytes_ += item->bytes;
+    }
+    std::move(cut, items.end(), std::back_inserter(items_));
+    items.erase(cut, items.end());
 }
 
 void StoreQueue::pause(std::chrono::nanoseconds delay) {
@@ -210,13 +226,20 @@ void StoreQueue::pause(std::chrono::nanoseconds delay) {
     }
 }
 
-void StoreQueue::settle(std::size_t rows, std::size_t bytes) {
+void StoreQueue::settle(std::span<const StoreItem> rows) {
     std::vector<Flush> finished;
     bool relieved = false;
+    std::size_t bytes = 0;
+    std::size_t closes = 0;
+    for (const StoreItem& item : rows) {
+        bytes += item.bytes;
+        closes += isClose(item.row) ? 1 : 0;
+    }
     {
         const MutexLock lock(mutex_);
-        settled_ += rows;
-        heldRows_ -= rows;
+        settled_ += rows.size();
+        heldRows_ -= rows.size();
+        heldCloses_ -= closes;
         heldBytes_ -= std::min(bytes, heldBytes_);
         noteTightLocked();
         const auto rest =

@@ -16,6 +16,7 @@
 #include <functional>
 #include <limits>
 #include <optional>
+#include <span>
 #include <string_view>
 #include <vector>
 
@@ -70,6 +71,7 @@ public:
     struct Levels {
         std::size_t rows = 0;
         std::size_t bytes = 0;
+        std::size_t unwritten = 0; // The same without those that only close a session.
         StoreLossesByTable lost{};
         std::chrono::nanoseconds oldest{}; // How long the first of them has waited.
     };
@@ -121,8 +123,8 @@ public:
     void take(std::vector<StoreItem>& items) HY_EXCLUDES(mutex_);
     // Writer's thread: waits, but not for longer than until stop().
     void pause(std::chrono::nanoseconds delay) HY_EXCLUDES(mutex_);
-    // Writer's thread: the oldest `rows` that were taken are done with.
-    void settle(std::size_t rows, std::size_t bytes) HY_EXCLUDES(mutex_);
+    // Writer's thread: these, the oldest of those that were taken, are done with.
+    void settle(std::span<const StoreItem> rows) HY_EXCLUDES(mutex_);
 
 private:
     using Instant = std::chrono::steady_clock::time_point;
@@ -135,6 +137,7 @@ private:
     void appendLocked(StoreRow&& row, std::size_t bytes) HY_REQUIRES(mutex_);
     bool crowdedLocked() const HY_REQUIRES(mutex_);
     void noteTightLocked() HY_REQUIRES(mutex_);
+    void leaveBehindLocked(std::vector<StoreItem>& items, std::size_t rest) HY_REQUIRES(mutex_);
     bool groupReadyLocked() const HY_REQUIRES(mutex_);
     bool isFullLocked() const HY_REQUIRES(mutex_);
     void tellPressure() HY_EXCLUDES(pressureMutex_);
@@ -149,11 +152,18 @@ private:
     std::size_t queuedBytes_ HY_GUARDED_BY(mutex_) = 0; // of items_
     Window window_ HY_GUARDED_BY(mutex_);
     Instant firstCame_ HY_GUARDED_BY(mutex_);
+    // The same of each whole group behind it, and where in items_ it begins.
+    struct GroupStart {
+        std::size_t at;
+        Instant came;
+    };
+    std::vector<GroupStart> groupStarts_ HY_GUARDED_BY(mutex_);
     Instant due_ HY_GUARDED_BY(mutex_);
     // When the first of the rows came that are taken and not settled.
     Instant takenCame_ HY_GUARDED_BY(mutex_);
     std::size_t heldRows_ HY_GUARDED_BY(mutex_) = 0; // queued and taken
     std::size_t heldBytes_ HY_GUARDED_BY(mutex_) = 0;
+    std::size_t heldCloses_ HY_GUARDED_BY(mutex_) = 0;
     std::uint64_t pushed_ HY_GUARDED_BY(mutex_) = 0;
     std::uint64_t settled_ HY_GUARDED_BY(mutex_) = 0;
     std::vector<Flush> flushes_ HY_GUARDED_BY(mutex_);

@@ -4,6 +4,7 @@
 #include <array>
 #include <fmt/chrono.h>
 #include <fmt/format.h>
+#include <fstream>
 #include <limits>
 #include <string>
 #include <string_view>
@@ -37,7 +38,9 @@ namespace {
 namespace fs = std::filesystem;
 
 constexpr std::string_view kMark = ".damaged-";
-constexpr std::array<std::string_view, 2> kCompanions = {"-wal", "-shm"};
+constexpr std::string_view kUnreadMark = "-unread";
+// The last is ours, see storeNoteUnread().
+constexpr std::array<std::string_view, 3> kCompanions = {"-wal", "-shm", kUnreadMark};
 constexpr std::uint64_t kRowsPerCommit = 4096;
 // Behind a hole the next row is looked for this far on, then twice as far and
 // so on: the first step is less than a page's worth of rows.
@@ -102,14 +105,18 @@ std::string stampOf(platform::WallTime now) {
     return fmt::format("{:%Y%m%dT%H%M%SZ}", fmt::gmtime(seconds.time_since_epoch().count()));
 }
 
+bool isCompanion(std::string_view name) {
+    return std::any_of(kCompanions.begin(), kCompanions.end(),
+                       [name](std::string_view end) { return name.ends_with(end); });
+}
+
 void removeOldest(const fs::path& path) {
     std::vector<fs::path> kept;
     std::error_code ignored;
     const std::string prefix = path.filename().string() + std::string(kMark);
     for (const auto& entry : fs::directory_iterator(path.parent_path(), ignored)) {
         const std::string name = entry.path().filename().string();
-        const bool companion = name.ends_with(kCompanions[0]) || name.ends_with(kCompanions[1]);
-        if (name.starts_with(prefix) && !companion) {
+        if (name.starts_with(prefix) && !isCompanion(name)) {
             kept.push_back(entry.path());
         }
     }
@@ -126,15 +133,15 @@ void removeOldest(const fs::path& path) {
 void removeEmptyCompanions(const fs::path& path) {
     std::error_code error;
     if (fs::file_size(path.string() + "-wal", error) == 0 && !error) {
-        for (const std::string_view companion : kCompanions) {
-            fs::remove(path.string() + std::string(companion), error);
-        }
+        fs::remove(path.string() + "-wal", error);
+        fs::remove(path.string() + "-shm", error);
     }
 }
 
 class TableCarrier {
 public:
-    TableCarrier(const StoreTableSchema& table, sqlite3* from, sqlite3* to, StoreSalvage& result)
+    TableCarrier(const StoreTableSchema& table, std::string_view verb, sqlite3* from, sqlite3* to,
+                 StoreSalvage& result)
         : columns_(static_cast<int>(table.columns.size()) + 1), to_(to), result_(result) {
         const auto present = columnsOf(from, table.name);
         // A table of a later schema than the file's is no loss.
@@ -143,7 +150,7 @@ public:
             read_.prepare(from, fmt::format("SELECT {}, {} FROM {} WHERE id > ? ORDER BY id",
                                             readableColumns(table, present),
                                             validity(table, present), table.name));
-        code_ = insert_.prepare(to, storeInsert(table, "INSERT OR REPLACE"));
+        code_ = insert_.prepare(to, storeInsert(table, verb));
     }
 
     // SQLite's code for the new database.
@@ -151,12 +158,18 @@ public:
         if (readable_ == SQLITE_OK) {
             carryAll();
         } else if (!absent_) {
+            noteFailure(readable_);
             ++result_.holes;
         }
         return code_;
     }
 
 private:
+    void noteFailure(int code) {
+        const int primary = code & 0xFF;
+        result_.unreadable =
+            result_.unreadable || primary == SQLITE_IOERR || primary == SQLITE_CANTOPEN;
+    }
     void carryAll() {
         std::int64_t step = 0;
         while (code_ == SQLITE_OK && step <= kLargestStep) {
@@ -183,6 +196,9 @@ private:
             }
         }
         read_.reset();
+        if (code != SQLITE_DONE && code != SQLITE_ROW) {
+            noteFailure(code);
+        }
         return code == SQLITE_DONE;
     }
 
@@ -191,6 +207,9 @@ private:
             insert_.bindColumn(i + 1, read_, i);
         }
         code_ = insert_.run();
+        if (sqlite3_changes(to_) == 0) {
+            return; // It was there.
+        }
         if (code_ == SQLITE_OK && ++result_.carried % kRowsPerCommit == 0) {
             code_ = sqlite3_exec(to_, "COMMIT; BEGIN IMMEDIATE", nullptr, nullptr, nullptr);
         }
@@ -229,33 +248,82 @@ Result<fs::path> storeSetAside(const fs::path& path, platform::WallTime now) {
     return aside;
 }
 
-StoreSalvage storeCarryOver(const fs::path& damaged, sqlite3* fresh) {
+namespace {
+
+// Of sessions that were brought in later: those that are open live here.
+constexpr const char* kRememberOpen =
+    "CREATE TEMP TABLE live AS SELECT id FROM upload_session WHERE closed IS NULL";
+constexpr const char* kCloseOthers =
+    "UPDATE upload_session SET ended = 'interrupted', closed = coalesce((SELECT max(time) FROM "
+    "upload_message WHERE upload_session = upload_session.id), opened) "
+    "WHERE closed IS NULL AND id NOT IN temp.live; DROP TABLE temp.live";
+
+int run(sqlite3* database, const char* sql) {
+    return sqlite3_exec(database, sql, nullptr, nullptr, nullptr);
+}
+
+int carryTables(sqlite3* from, sqlite3* fresh, SalvageTime time, StoreSalvage& result) {
+    const bool later = time == SalvageTime::Later;
+    const char* const verb = later ? "INSERT OR IGNORE" : "INSERT OR REPLACE";
+    int code = later ? run(fresh, kRememberOpen) : SQLITE_OK;
+    code = code == SQLITE_OK ? run(fresh, "BEGIN IMMEDIATE") : code;
+    for (const StoreTableSchema& table : kStoreSchema) {
+        code = code == SQLITE_OK ? TableCarrier(table, verb, from, fresh, result).run() : code;
+    }
+    code = code == SQLITE_OK ? run(fresh, kSayHowEnded) : code;
+    if (sqlite3_get_autocommit(fresh) == 0) {
+        const int committed = run(fresh, "COMMIT");
+        code = code == SQLITE_OK ? committed : code;
+    }
+    return code == SQLITE_OK && later ? run(fresh, kCloseOthers) : code;
+}
+
+} // namespace
+
+StoreSalvage storeCarryOver(const fs::path& damaged, sqlite3* fresh, SalvageTime time,
+                            const char* vfs) {
     StoreSalvage result;
     sqlite3* from = nullptr;
-    if (sqlite3_open_v2(damaged.c_str(), &from, SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX,
-                        nullptr) == SQLITE_OK) {
+    if (sqlite3_open_v2(damaged.c_str(), &from, SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX, vfs) ==
+        SQLITE_OK) {
         sqlite3_db_config(from, SQLITE_DBCONFIG_NO_CKPT_ON_CLOSE, 1, nullptr);
         // A table of contents that contradicts the file is what we came for.
-        sqlite3_exec(from, "PRAGMA writable_schema = ON", nullptr, nullptr, nullptr);
-        int code = sqlite3_exec(fresh, "BEGIN IMMEDIATE", nullptr, nullptr, nullptr);
-        for (const StoreTableSchema& table : kStoreSchema) {
-            code = code == SQLITE_OK ? TableCarrier(table, from, fresh, result).run() : code;
-        }
-        code =
-            code == SQLITE_OK ? sqlite3_exec(fresh, kSayHowEnded, nullptr, nullptr, nullptr) : code;
-        if (sqlite3_get_autocommit(fresh) == 0) {
-            const int committed = sqlite3_exec(fresh, "COMMIT", nullptr, nullptr, nullptr);
-            code = code == SQLITE_OK ? committed : code;
-        }
-        if (code != SQLITE_OK) {
+        run(from, "PRAGMA writable_schema = ON");
+        if (const int code = carryTables(from, fresh, time, result); code != SQLITE_OK) {
             result.whole = StoreFailure{{{}, sqlite3_errstr(code)}, code};
         }
     } else {
         ++result.holes;
+        result.unreadable = true;
     }
     sqlite3_close(from);
     removeEmptyCompanions(damaged);
     return result;
+}
+
+void storeNoteUnread(const fs::path& aside, bool unread) {
+    const fs::path mark = aside.string() + std::string(kUnreadMark);
+    std::error_code absent;
+    if (unread) {
+        std::ofstream(mark).flush();
+    } else {
+        fs::remove(mark, absent);
+    }
+}
+
+std::vector<fs::path> storeUnread(const fs::path& path) {
+    std::vector<fs::path> found;
+    std::error_code ignored;
+    const std::string prefix = path.filename().string() + std::string(kMark);
+    for (const auto& entry : fs::directory_iterator(path.parent_path(), ignored)) {
+        std::string name = entry.path().filename().string();
+        if (name.starts_with(prefix) && name.ends_with(kUnreadMark)) {
+            name.resize(name.size() - kUnreadMark.size());
+            found.push_back(path.parent_path() / name);
+        }
+    }
+    std::sort(found.begin(), found.end());
+    return found;
 }
 
 } // namespace halyard::linux_

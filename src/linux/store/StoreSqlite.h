@@ -27,9 +27,20 @@ struct StoreFailure : Failure {
         return primary() == SQLITE_BUSY || primary() == SQLITE_LOCKED ||
                primary() == SQLITE_PROTOCOL;
     }
+    // What is there cannot be read, now or for good.
+    bool isUnreadable() const {
+        return sqlite == SQLITE_IOERR_READ || sqlite == SQLITE_IOERR_SHORT_READ ||
+               sqlite == SQLITE_IOERR_CORRUPTFS || sqlite == SQLITE_IOERR_DATA;
+    }
+    bool isReadOnly() const {
+        const int system = static_cast<int>(code);
+        return primary() == SQLITE_READONLY || system == EROFS || system == EACCES ||
+               system == EPERM;
+    }
     // Worth another try.
     bool mayPass() const {
-        return !isDamage() && (isWantOfSpace() || isLock() || primary() == SQLITE_NOMEM);
+        return !isDamage() && (isWantOfSpace() || isLock() || isReadOnly() ||
+                               primary() == SQLITE_IOERR || primary() == SQLITE_NOMEM);
     }
 };
 using StoreResult = Result<void, StoreFailure>;
@@ -80,10 +91,14 @@ public:
         sqlite3_bind_value(statement_, index, sqlite3_column_value(from.statement_, column));
     }
 
-    // SQLITE_ROW while there is a row; resets at the end and on an error.
+    // SQLITE_ROW while there is a row, then SQLITE_DONE; resets at the end and on an error.
     [[nodiscard]] int step() {
         const int code = sqlite3_step(statement_);
-        return code == SQLITE_ROW ? code : finish(code);
+        if (code == SQLITE_ROW) {
+            return code;
+        }
+        const int finished = finish(code);
+        return finished == SQLITE_OK ? SQLITE_DONE : finished;
     }
     // For statements that give no rows that matter: SQLITE_OK or the error.
     [[nodiscard]] int run() {

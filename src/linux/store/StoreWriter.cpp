@@ -55,17 +55,13 @@ bool concernsOneRow(const StoreFailure& failure) {
 }
 
 StoreLoss lossOf(const StoreFailure& failure) {
-    if (failure.primary() == SQLITE_READONLY) {
-        return StoreLoss::ReadOnly;
-    }
     if (failure.isLock()) {
         return StoreLoss::Locked;
     }
     if (failure.isWantOfSpace()) {
         return StoreLoss::DiskFull;
     }
-    return failure.code == std::errc::read_only_file_system ? StoreLoss::ReadOnly
-                                                            : StoreLoss::IoError;
+    return failure.isReadOnly() ? StoreLoss::ReadOnly : StoreLoss::IoError;
 }
 
 } // namespace
@@ -93,11 +89,12 @@ std::uint64_t sum(const StoreLossesByTable& losses) {
 }
 
 StoreWriter::StoreWriter(const StoreOptions& options, const platform::Clock& clock,
-                         std::shared_ptr<StoreQueue> queue)
+                         std::shared_ptr<StoreQueue> queue, std::function<void()> onWork)
     : options_(options), clock_(clock), queue_(std::move(queue)),
       database_({options_.path, options_.busyTimeout, options_.vfs}),
       retention_(platform::secondsSince1970(clock.wallTime())),
-      keeper_(options_, clock, database_, retention_), limits_(options_.limits) {}
+      keeper_(options_, clock, database_, retention_), onWork_(std::move(onWork)),
+      limits_(options_.limits) {}
 
 bool StoreWriter::open() {
     const StoreResult opened = keeper_.open();
@@ -121,11 +118,17 @@ void StoreWriter::closeDatabase() {
                      options_.path.string(), sum(queue_->levels().lost), nameOf(*surrendered_));
     }
     retention_.reset();
-    if (database_.hasMoved()) {
+    const bool moved = database_.hasMoved();
+    if (moved || !keeper_.keepLog().ok()) {
         database_.abandon(); // What lies at its path is not ours.
     } else {
         database_.close();
     }
+}
+
+void StoreWriter::tellUnwritten() const {
+    HY_LOG_ERROR(HYReportingPlatformCategory, "closing {}, {} rows lost: {}",
+                 options_.path.string(), queue_->levels().unwritten, nameOf(StoreLoss::Stuck));
 }
 
 void StoreWriter::run() {
@@ -149,11 +152,13 @@ void StoreWriter::run() {
 // Without rows there is nothing to do but to let old ones go, and that may wait: a
 // machine that sleeps is not woken for it.
 std::chrono::nanoseconds StoreWriter::idleDelay() const {
-    if (trimMore_ || !database_.isOpen()) {
+    if (trimMore_ || !database_.isOpen() || database_.hasLostLog()) {
         return trimMore_ ? std::chrono::nanoseconds(0) : options_.lastRetry;
     }
-    return std::clamp<std::chrono::nanoseconds>(limits().maxAge / 10, options_.agePeriod,
-                                                std::max(options_.agePeriod, options_.idlePeriod));
+    const auto idle =
+        std::clamp<std::chrono::nanoseconds>(limits().maxAge / 10, options_.agePeriod,
+                                             std::max(options_.agePeriod, options_.idlePeriod));
+    return std::min(idle, keeper_.untilRereading().value_or(idle));
 }
 
 // A disk that takes long for each commit gets fewer and larger ones, so that what has
@@ -203,12 +208,16 @@ void StoreWriter::writeGroup(std::span<StoreItem> group) {
 
 void StoreWriter::maintain() {
     if (!limitsChanged_.load() && !trimMore_ && !isAgeDue() && database_.isOpen() &&
-        !database_.hasMoved()) {
+        !database_.hasMoved() && !database_.hasLostLog() && !keeper_.isRereadingDue()) {
         return;
     }
     trimMore_ = false;
     if (const StoreResult done = attempt({}); !done.ok()) {
         beginEpisode(lossOf(done.failure()), done.failure().text);
+    } else if (keeper_.isRereadingDue()) {
+        beginWork();
+        keeper_.reread();
+        busySince_.store(0);
     }
 }
 
@@ -248,7 +257,7 @@ void StoreWriter::purgeIfAsked() {
     if (asked.empty()) {
         return;
     }
-    busySince_.store(clock_.steadyTime().time_since_epoch().count());
+    beginWork();
     const auto purged = purgeRows();
     busySince_.store(0);
     noteSizes();
@@ -263,26 +272,45 @@ Result<std::uint64_t, StoreFailure> StoreWriter::purgeRows() {
     }
     auto purged = database_.purge();
     if (!purged.ok() && purged.failure().isDamage()) {
-        const StoreResult replaced = keeper_.replaceDamaged(purged.failure());
-        return replaced.ok() ? database_.purge() : replaced.failure();
+        const StoreResult recovered = keeper_.recover(purged.failure());
+        return recovered.ok() ? database_.purge() : recovered.failure();
     }
     return purged;
 }
 
-StoreResult StoreWriter::attempt(std::span<StoreItem> group) {
+void StoreWriter::beginWork() {
     busySince_.store(clock_.steadyTime().time_since_epoch().count());
-    StoreResult result = keeper_.reopenIfNeeded();
-    if (result.ok()) {
-        result = writeRows(group);
-        if (!result.ok() && result.failure().isDamage()) {
-            result = keeper_.replaceDamaged(result.failure());
-            result = result.ok() ? writeRows(group) : result;
-        }
+    if (onWork_) {
+        onWork_();
     }
+}
+
+StoreResult StoreWriter::attempt(std::span<StoreItem> group) {
+    beginWork();
+    const StoreResult result = tryOnce(group);
+    // The log may have gone while these rows were written into it.
+    const StoreResult kept = result.ok() ? keeper_.keepLog() : StoreResult();
     busySince_.store(0);
-    if (result.ok()) {
+    if (!kept.ok()) {
+        beginEpisode(lossOf(kept.failure()), kept.failure().text);
+    } else if (result.ok()) {
+        keeper_.noteSuccess();
         noteSizes();
         endEpisode();
+    }
+    return result;
+}
+
+// Once, but for what the keeper thinks is worth another look.
+StoreResult StoreWriter::tryOnce(std::span<StoreItem> group) {
+    StoreResult result = keeper_.reopenIfNeeded();
+    result = result.ok() ? writeRows(group) : result;
+    for (int look = 0; StoreKeeper::isSuspect(result) && look <= options_.looks; ++look) {
+        result = keeper_.recover(result.failure());
+        if (!result.ok()) {
+            return result;
+        }
+        result = writeRows(group);
     }
     return result;
 }
@@ -368,10 +396,6 @@ void StoreWriter::noteRemoved() {
 }
 
 void StoreWriter::settle(std::span<StoreItem> group) {
-    std::size_t bytes = 0;
-    for (const StoreItem& item : group) {
-        bytes += item.bytes;
-    }
     {
         const MutexLock lock(mutex_);
         ++status_.commits;
@@ -386,18 +410,16 @@ void StoreWriter::settle(std::span<StoreItem> group) {
         HY_LOG_ERROR(HYReportingPlatformCategory, "the store rejected {} rows: {}",
                      rejected_.size(), rejection_);
     }
-    queue_->settle(group.size(), bytes);
+    queue_->settle(group);
 }
 
 void StoreWriter::giveUp(std::span<StoreItem> group, StoreLoss reason) {
-    std::size_t bytes = 0;
     for (const StoreItem& item : group) {
-        bytes += item.bytes;
         if (!std::holds_alternative<StoreCloseRow>(item.row)) {
             queue_->countLost(reason, tableOf(item.row));
         }
     }
-    queue_->settle(group.size(), bytes);
+    queue_->settle(group);
 }
 
 bool StoreWriter::isAgeDue() const {

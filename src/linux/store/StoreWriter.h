@@ -47,9 +47,10 @@ struct StoreStatus {
 
 class StoreWriter {
 public:
-    // Borrows `clock`.
+    // Borrows `clock`. `onWork` is called on the writer's thread whenever it begins
+    // something that may hang.
     StoreWriter(const StoreOptions& options, const platform::Clock& clock,
-                std::shared_ptr<StoreQueue> queue);
+                std::shared_ptr<StoreQueue> queue, std::function<void()> onWork);
 
     // False when there is no store to be had. Before run().
     [[nodiscard]] bool open();
@@ -57,6 +58,9 @@ public:
     void run();
     // Looks whether run() hangs. Any thread.
     void watch();
+    bool isWorking() const { return busySince_.load() != 0; }
+    // Says what run() has not come to, which will be lost. Any thread.
+    void tellUnwritten() const;
 
     // Removes every row that was committed by then, see StoreDatabase. The answer comes
     // on the writer's thread, or not at all when that has ended.
@@ -85,6 +89,8 @@ private:
     void runTasks() HY_EXCLUDES(mutex_);
     Result<std::uint64_t, StoreFailure> purgeRows();
     StoreResult attempt(std::span<StoreItem> group);
+    StoreResult tryOnce(std::span<StoreItem> group);
+    void beginWork();
     StoreResult writeRows(std::span<StoreItem> group);
     StoreResult insertAll(std::span<StoreItem> group);
     StoreResult trim(const StoreLimits& bounds, bool ageDue, bool& more);
@@ -105,6 +111,7 @@ private:
     StoreDatabase database_;
     StoreRetention retention_;
     StoreKeeper keeper_;
+    const std::function<void()> onWork_;
     std::vector<StoreItem> taken_;
     std::vector<StoreTable> rejected_; // rows of the running attempt
     std::string rejection_;            // why the last of them was

@@ -1,0 +1,51 @@
+#include "linux/store/StoreQueue.h"
+
+#include <gtest/gtest.h>
+
+namespace halyard::linux_ {
+namespace {
+
+using namespace std::chrono_literals;
+using Steady = std::chrono::steady_clock;
+
+StoreRow row() {
+    return StoreMetricRow{"x", 1, 0};
+}
+
+void waitUntil(Steady::time_point moment) {
+    while (Steady::now() <= moment) {
+    }
+}
+
+TEST(StoreQueueTest, RowsThatAreLeftBehindStayAsOldAsTheyAre) {
+    StoreQueue queue({}, {.delay = 1h, .rows = 4}, nullptr);
+    for (int i = 0; i < 6; ++i) {
+        (void)queue.push(row());
+    }
+    const auto came = Steady::now();
+    waitUntil(came + 2ms);
+    std::vector<StoreItem> taken;
+    queue.take(taken);
+    EXPECT_EQ(taken.size(), 4U);
+    queue.settle(taken);
+    EXPECT_EQ(queue.levels().rows, 2U);
+    EXPECT_GT(queue.levels().oldest, 2ms);
+}
+
+TEST(StoreQueueTest, RowsThatAreLeftBehindAreNoOlderThanTheyAre) {
+    StoreQueue queue({}, {.delay = 1h, .rows = 4}, nullptr);
+    for (int i = 0; i < 4; ++i) {
+        (void)queue.push(row());
+    }
+    const auto before = Steady::now();
+    waitUntil(before + 2ms);
+    const auto came = Steady::now();
+    (void)queue.push(row());
+    std::vector<StoreItem> taken;
+    queue.take(taken);
+    queue.settle(taken);
+    EXPECT_LE(queue.levels().oldest, Steady::now() - came);
+}
+
+} // namespace
+} // namespace halyard::linux_
