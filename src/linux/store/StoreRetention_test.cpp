@@ -63,6 +63,23 @@ TEST_F(StoreRetentionTest, OldRowsGoByAgeAlone) {
     EXPECT_EQ(store_->status().removed[static_cast<std::size_t>(StoreTable::UploadMessage)], 10U);
 }
 
+TEST_F(StoreRetentionTest, AClockThatIsSetForwardTakesNoRowsAlong) {
+    open();
+    addSingles(10, {});
+    flush();
+    clock_.setWallTime(clock_.wallTime() + std::chrono::days(10));
+    clock_.advance(options_.agePeriod);
+    commitOne();
+    EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 10);
+    open(); // The next run does not take them either.
+    clock_.advance(options_.agePeriod);
+    commitOne();
+    EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 10);
+    clock_.advance(options_.limits.maxAge - 60s);
+    commitOne();
+    EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 0);
+}
+
 TEST_F(StoreRetentionTest, LimitsCanBeLoweredAtRunTime) {
     options_.limits.maxBytes = 64 * 1024 * 1024;
     open();

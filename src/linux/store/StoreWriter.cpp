@@ -93,7 +93,7 @@ StoreWriter::StoreWriter(const StoreOptions& options, const platform::Clock& clo
     : options_(options), clock_(clock), queue_(std::move(queue)),
       database_({options_.path, options_.busyTimeout, options_.vfs}),
       retention_(platform::secondsSince1970(clock.wallTime())),
-      keeper_(options_, clock, database_, retention_), onWork_(std::move(onWork)),
+      keeper_(options_, clock, database_, retention_), age_(clock), onWork_(std::move(onWork)),
       limits_(options_.limits) {}
 
 bool StoreWriter::open() {
@@ -339,6 +339,7 @@ StoreResult StoreWriter::writeRows(std::span<StoreItem> group) {
         trimMore_ = more;
         noteRemoved();
         if (ageDue) {
+            age_.noteCommitted();
             agedAt_ = more ? platform::SteadyTime() : clock_.steadyTime();
         }
     }
@@ -366,8 +367,10 @@ StoreResult StoreWriter::insertAll(std::span<StoreItem> group) {
 StoreResult StoreWriter::trim(const StoreLimits& bounds, bool ageDue, bool& more) {
     std::optional<double> oldest;
     if (ageDue) {
-        oldest = platform::secondsSince1970(clock_.wallTime()) -
-                 static_cast<double>(bounds.maxAge.count());
+        if (StoreResult known = age_.update(database_); !known.ok()) {
+            return known;
+        }
+        oldest = age_.oldest(bounds.maxAge);
     }
     return retention_.trim(database_, bounds.maxBytes, oldest, more);
 }

@@ -14,6 +14,7 @@
 #include <vector>
 
 #include "common/Mutex.h"
+#include "linux/store/StoreAge.h"
 #include "linux/store/StoreDatabase.h"
 #include "linux/store/StoreKeeper.h"
 #include "linux/store/StoreLimits.h"
@@ -111,6 +112,7 @@ private:
     StoreDatabase database_;
     StoreRetention retention_;
     StoreKeeper keeper_;
+    StoreAge age_;
     const std::function<void()> onWork_;
     std::vector<StoreItem> taken_;
     std::vector<StoreTable> rejected_; // rows of the running attempt
