@@ -3,8 +3,8 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "common/Description.h"
 #include "linux/config/Quantities.h"
+#include "linux/config/SettingsTesting.h"
 
 namespace halyard::linux_ {
 namespace {
@@ -12,37 +12,6 @@ namespace {
 using namespace std::chrono_literals;
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
-
-ParsedSettings parsed(std::string_view text) {
-    auto result = parseSettings(text, "/etc/halyard/halyard.toml");
-    if (!result.ok()) {
-        const SettingsFailure& failure = result.failure();
-        ADD_FAILURE() << failure.line << ":" << failure.column << ": " << failure.text;
-        return {};
-    }
-    return std::move(result).value();
-}
-
-Settings settings(std::string_view text) {
-    ParsedSettings result = parsed(text);
-    EXPECT_THAT(result.warnings, ElementsAre());
-    return result.settings;
-}
-
-// "LINE:COLUMN: MESSAGE", empty when the text is taken.
-std::string mistake(std::string_view text) {
-    const auto result = parseSettings(text, "f");
-    if (result.ok()) {
-        return "";
-    }
-    const SettingsFailure& failure = result.failure();
-    return std::to_string(failure.line) + ":" + std::to_string(failure.column) + ": " +
-           failure.text;
-}
-
-std::vector<SettingsWarning> warnings(std::string_view text) {
-    return parsed(text).warnings;
-}
 
 TEST(SettingsTest, AnEmptyFileMeansTheStrictestDefaults) {
     const Settings defaults = settings("");
