@@ -168,6 +168,7 @@ constexpr Key<Settings> kSections[] = {
     {"log", &readKeys<kLogKeys>},
     {"service", &readKeys<kServiceKeys>},
     {"drivers", &readDrivers},
+    {"export", &readExport},
 };
 
 // The line where there are too many dots within keys; runs of dots, which no

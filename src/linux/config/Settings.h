@@ -16,6 +16,7 @@
 #include "common/LogCategory.h"
 #include "common/Result.h"
 #include "common/Value.h"
+#include "linux/config/ExportSettings.h"
 #include "linux/drivers/DriverChannel.h"
 #include "linux/net/Peer.h"
 #include "linux/store/StoreLimits.h"
@@ -36,6 +37,7 @@ struct Settings {
     LogLevel logLevel = LogLevel::Info;
     std::optional<std::chrono::seconds> idleExit; // none: never
     std::vector<DriverChannel> driverChannels;
+    ExportSettings exporting;
 
     bool operator==(const Settings&) const = default;
 };

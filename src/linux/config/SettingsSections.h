@@ -1,4 +1,4 @@
-// The section of the configuration file that has a source of its own.
+// The sections of the configuration file that have a source of their own.
 #pragma once
 
 #include "linux/config/TomlReader.h"
@@ -6,5 +6,6 @@
 namespace halyard::linux_ {
 
 void readDrivers(TomlReader& reader, const NamedNode& at, Settings& into);
+void readExport(TomlReader& reader, const NamedNode& at, Settings& into);
 
 } // namespace halyard::linux_
