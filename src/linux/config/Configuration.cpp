@@ -1,33 +1,29 @@
 #include "linux/config/Configuration.h"
 
+#include <fmt/format.h>
 #include <utility>
 
-#include "linux/system/SmallFile.h"
+#include "linux/config/SettingsFiles.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {
 namespace {
 
-bool isMissing(const Failure& failure) {
-    return failure.code == std::errc::no_such_file_or_directory ||
-           failure.code == std::errc::not_a_directory;
-}
-
-void logWarnings(const std::string& file, const ParsedSettings& parsed) {
-    for (const SettingsWarning& warning : parsed.warnings) {
-        HY_LOG_DEFAULT(HYReportingPlatformCategory, "{}:{}: {}", file, warning.line,
+void logWarnings(const LoadedSettings::File& file) {
+    for (const SettingsWarning& warning : file.warnings) {
+        HY_LOG_DEFAULT(HYReportingPlatformCategory, "{}:{}: {}", file.path.native(), warning.line,
                        warning.message);
     }
-    if (parsed.warningsLeftOut > 0) {
-        HY_LOG_DEFAULT(HYReportingPlatformCategory, "{}: {} more warnings", file,
-                       parsed.warningsLeftOut);
+    if (file.warningsLeftOut > 0) {
+        HY_LOG_DEFAULT(HYReportingPlatformCategory, "{}: {} more warnings", file.path.native(),
+                       file.warningsLeftOut);
     }
 }
 
 } // namespace
 
 Configuration::Configuration(const std::filesystem::path& directory)
-    : file_(directory / kFileName), settings_(std::make_shared<const Settings>()) {}
+    : directory_(directory), settings_(std::make_shared<const Settings>()) {}
 
 std::shared_ptr<const Settings> Configuration::settings() const {
     const MutexLock lock(mutex_);
@@ -36,16 +32,16 @@ std::shared_ptr<const Settings> Configuration::settings() const {
 
 Configuration::Outcome Configuration::reload() {
     const MutexLock lock(reloading_);
-    const auto text = readSmallFile(file_, kMaxFileBytes);
-    if (!text.ok()) {
-        return isMissing(text.failure()) ? putInForce(Settings()) : refuse({text.failure(), file_});
+    auto loaded = loadSettings(directory_);
+    if (!loaded.ok()) {
+        return refuse(loaded.failure());
     }
-    auto parsed = parseSettings(text.value(), file_.native());
-    if (!parsed.ok()) {
-        return refuse(parsed.failure());
+    std::size_t dropIns = 0;
+    for (const LoadedSettings::File& file : loaded.value().files) {
+        logWarnings(file);
+        dropIns += file.isDropIn ? 1 : 0;
     }
-    logWarnings(file_, parsed.value());
-    return putInForce(std::move(parsed.value().settings));
+    return putInForce(std::move(loaded.value().settings), dropIns);
 }
 
 Configuration::Outcome Configuration::refuse(const SettingsFailure& failure) {
@@ -55,7 +51,7 @@ Configuration::Outcome Configuration::refuse(const SettingsFailure& failure) {
     return Outcome::Refused;
 }
 
-Configuration::Outcome Configuration::putInForce(Settings settings) {
+Configuration::Outcome Configuration::putInForce(Settings settings, std::size_t dropIns) {
     taken_ = true;
     const std::shared_ptr<const Settings> before = this->settings();
     if (*before == settings) {
@@ -70,7 +66,9 @@ Configuration::Outcome Configuration::putInForce(Settings settings) {
         observer(*before, *after);
     }
     // Last, so that the log's own level holds for it.
-    HY_LOG_INFO(HYReportingPlatformCategory, "configuration of {} is in force", file_.native());
+    HY_LOG_INFO(HYReportingPlatformCategory, "configuration of {}{} is in force",
+                (directory_ / kSettingsFile).native(),
+                dropIns == 0 ? "" : fmt::format(" and {} of {}", dropIns, kDropInFolder));
     return Outcome::Changed;
 }
 

@@ -1,8 +1,8 @@
 // The settings in force, and the core's view of them.
 //
 // Readers get snapshots, so that a reload never changes what somebody is in the
-// middle of reading. A file that cannot be taken is told in one log line and
-// changes nothing; a file that is gone means the defaults.
+// middle of reading. A file that cannot be taken is told in one log line, and none of
+// the files changes anything; what no file says has its default.
 #pragma once
 
 #include <filesystem>
@@ -22,23 +22,19 @@ class Configuration final : public platform::Preferences,
                             public platform::FeatureFlags,
                             public platform::DeviceProperties {
 public:
-    static constexpr std::string_view kFileName = "halyard.toml";
-    // A larger file is refused unread.
-    static constexpr std::size_t kMaxFileBytes = 1024 * 1024;
-
     using Observer = std::function<void(const Settings& before, const Settings& after)>;
 
     enum class Outcome {
         Unchanged,
         Changed, // Observers have been called.
-        Refused, // The file cannot be taken; what was in force stays.
+        Refused, // A file cannot be taken; what was in force stays.
     };
 
     explicit Configuration(const std::filesystem::path& directory);
 
     [[nodiscard]] std::shared_ptr<const Settings> settings() const;
 
-    // Reads the file and puts it in force.
+    // Reads the files and puts them in force.
     Outcome reload();
 
     // `observer` runs on the thread of each reload() that changes something,
@@ -52,9 +48,9 @@ public:
 
 private:
     Outcome refuse(const SettingsFailure& failure) HY_REQUIRES(reloading_);
-    Outcome putInForce(Settings settings) HY_REQUIRES(reloading_);
+    Outcome putInForce(Settings settings, std::size_t dropIns) HY_REQUIRES(reloading_);
 
-    const std::filesystem::path file_;
+    const std::filesystem::path directory_;
     Mutex reloading_; // taken before mutex_
     std::vector<Observer> observers_ HY_GUARDED_BY(reloading_);
     bool taken_ HY_GUARDED_BY(reloading_) = false; // a reload() has succeeded

@@ -13,6 +13,7 @@
 #include "linux/config/Configuration.h"
 #include "linux/config/ConfigurationWatch.h"
 #include "linux/config/PreferenceNotifications.h"
+#include "linux/config/SettingsFiles.h"
 #include "linux/system/NotificationCenter.h"
 #include "platform/Platform.h"
 
@@ -26,7 +27,7 @@ struct ConfigurationServices {
     // that a change after the first reading is told. Borrows `context`.
     void follow(asio::io_context& context) {
         watch = std::make_unique<ConfigurationWatch>(context, std::filesystem::absolute(directory),
-                                                     Configuration::kFileName,
+                                                     kSettingsFile, kDropInFolder,
                                                      [this] { (void)configuration.reload(); });
         (void)configuration.reload();
     }

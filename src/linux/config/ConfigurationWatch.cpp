@@ -7,6 +7,7 @@
 #include <unistd.h>
 #include <utility>
 
+#include "linux/config/SettingsFiles.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {
@@ -34,10 +35,12 @@ void logFailure(const std::filesystem::path& path) {
 } // namespace
 
 ConfigurationWatch::ConfigurationWatch(asio::io_context& context, std::filesystem::path directory,
-                                       std::string_view fileName, std::function<void()> changed,
+                                       std::string_view fileName, std::string_view dropInFolder,
+                                       std::function<void()> changed,
                                        std::chrono::milliseconds settleTime)
     : context_(context), directory_(std::move(directory)), fileName_(fileName),
-      changed_(std::move(changed)), settleTime_(settleTime), events_(context), settled_(context) {
+      dropInFolder_(dropInFolder), changed_(std::move(changed)), settleTime_(settleTime),
+      events_(context), settled_(context) {
     const int descriptor = ::inotify_init1(IN_NONBLOCK | IN_CLOEXEC);
     if (descriptor < 0) {
         logFailure(directory_);
@@ -50,12 +53,14 @@ ConfigurationWatch::ConfigurationWatch(asio::io_context& context, std::filesyste
 
 ConfigurationWatch::~ConfigurationWatch() = default;
 
-// Leaves one watch, or none and a log line.
+// Leaves one watch of the nearest directory, or none and a log line; and one of the
+// drop-ins where they are.
 void ConfigurationWatch::arm() {
     for (int attempt = 0; attempt < kMaxAttempts; ++attempt) {
         if (!watchNearest()) {
             return;
         }
+        watchDropIns();
         std::error_code ignored;
         if (watched_ == directory_ || !std::filesystem::exists(watched_ / awaited_, ignored)) {
             return;
@@ -83,6 +88,21 @@ bool ConfigurationWatch::watchNearest() {
         }
         awaited_ = watched_.filename();
         watched_ = watched_.parent_path();
+    }
+}
+
+// Whoever calls this tells, so that events of the watch given up are not missed.
+void ConfigurationWatch::watchDropIns() {
+    if (dropInWatch_ >= 0) {
+        ::inotify_rm_watch(events_.native_handle(), dropInWatch_);
+    }
+    const std::filesystem::path folder = directory_ / dropInFolder_;
+    // A folder that is the directory itself, by a link, must not take over its watch.
+    dropInWatch_ =
+        ::inotify_add_watch(events_.native_handle(), folder.c_str(),
+                            kWritten | kUnsettled | kWatchedGone | IN_ONLYDIR | IN_MASK_CREATE);
+    if (dropInWatch_ < 0 && !isMissing(errno) && errno != EEXIST) {
+        logFailure(folder);
     }
 }
 
@@ -118,21 +138,44 @@ void ConfigurationWatch::handle(const inotify_event& event) {
         tellSoon();
         return;
     }
-    if (event.wd != watch_) {
-        return; // Of a watch that was given up.
-    }
+    if (event.wd == watch_) {
+        handleNearest(event);
+    } else if (event.wd == dropInWatch_) {
+        handleDropIn(event);
+    } // Else it is of a watch that was given up.
+}
+
+void ConfigurationWatch::handleNearest(const inotify_event& event) {
     if ((event.mask & kWatchedGone) != 0) {
         arm();
         tellWhenSettled();
         return;
     }
-    if (event.len == 0 || awaited_ != event.name) {
+    const std::string_view name = event.len == 0 ? "" : event.name;
+    if (watched_ == directory_ && name == dropInFolder_) {
+        watchDropIns();
+        tell(event.mask);
+    } else if (name != awaited_) {
         return;
-    }
-    if (watched_ != directory_) {
+    } else if (watched_ != directory_) {
         arm();
         tellWhenSettled();
-    } else if ((event.mask & kWritten) != 0) {
+    } else {
+        tell(event.mask);
+    }
+}
+
+void ConfigurationWatch::handleDropIn(const inotify_event& event) {
+    if ((event.mask & kWatchedGone) != 0) {
+        watchDropIns();
+        tellWhenSettled();
+    } else if (event.len > 0 && isDropIn(event.name)) {
+        tell(event.mask);
+    }
+}
+
+void ConfigurationWatch::tell(std::uint32_t what) {
+    if ((what & kWritten) != 0) {
         tellSoon();
     } else {
         tellWhenSettled();

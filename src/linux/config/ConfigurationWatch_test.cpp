@@ -17,7 +17,7 @@ class ConfigurationWatchTest : public ::testing::Test {
 protected:
     void watch(const fs::path& directory, std::chrono::milliseconds settleTime = 0ms) {
         watch_ = std::make_unique<ConfigurationWatch>(
-            context_, directory, "halyard.toml", [this] { ++told_; }, settleTime);
+            context_, directory, "halyard.toml", "halyard.d", [this] { ++told_; }, settleTime);
     }
     // Runs the loop until something was told; the limit is for failures only.
     bool toldOnce() {
@@ -131,6 +131,77 @@ TEST_F(ConfigurationWatchTest, ADirectoryThatIsRemovedAndMadeAgainIsFollowed) {
     context_.poll();
     seen_ = told_;
     tree_.write("etc/halyard.toml", "c");
+    EXPECT_TRUE(toldOnce());
+}
+
+TEST_F(ConfigurationWatchTest, ADropInThatIsWrittenMovedOrRemovedIsTold) {
+    tree_.write("halyard.d/10.toml", "a");
+    watch(tree_.path());
+
+    tree_.write("halyard.d/10.toml", "b");
+    EXPECT_TRUE(toldOnce());
+    tree_.write("halyard.d/.20.toml.new", "a");
+    EXPECT_TRUE(toldNothing());
+    fs::rename(tree_ / "halyard.d/.20.toml.new", tree_ / "halyard.d/20.toml");
+    EXPECT_TRUE(toldOnce());
+    fs::remove(tree_ / "halyard.d/10.toml");
+    EXPECT_TRUE(toldOnce());
+}
+
+TEST_F(ConfigurationWatchTest, WhatIsNoDropInIsNotTold) {
+    tree_.write("halyard.d/10.toml", "a");
+    watch(tree_.path());
+
+    tree_.write("halyard.d/10.toml~", "a");
+    tree_.write("halyard.d/.hidden.toml", "a");
+    fs::create_directory(tree_ / "halyard.d/folder");
+    EXPECT_TRUE(toldNothing());
+}
+
+TEST_F(ConfigurationWatchTest, AFolderOfDropInsThatAppearsIsFollowed) {
+    watch(tree_.path());
+
+    fs::create_directory(tree_ / "halyard.d");
+    EXPECT_TRUE(toldOnce());
+    tree_.write("halyard.d/10.toml", "a");
+    EXPECT_TRUE(toldOnce());
+}
+
+TEST_F(ConfigurationWatchTest, AFolderOfDropInsThatIsRemovedAndMadeAgainIsFollowed) {
+    tree_.write("halyard.d/10.toml", "a");
+    watch(tree_.path());
+
+    fs::rename(tree_ / "halyard.d", tree_ / "old");
+    EXPECT_TRUE(toldOnce());
+    tree_.write("old/10.toml", "b");
+    EXPECT_TRUE(toldNothing());
+    fs::rename(tree_ / "old", tree_ / "halyard.d");
+    EXPECT_TRUE(toldOnce());
+    tree_.write("halyard.d/10.toml", "c");
+    EXPECT_TRUE(toldOnce());
+    fs::remove_all(tree_ / "halyard.d");
+    EXPECT_TRUE(toldOnce());
+}
+
+TEST_F(ConfigurationWatchTest, DropInsOfADirectoryThatAppearsAreFollowed) {
+    watch(tree_ / "etc");
+
+    fs::create_directories(tree_ / "new/halyard.d");
+    fs::rename(tree_ / "new", tree_ / "etc");
+    EXPECT_TRUE(toldOnce());
+    tree_.write("etc/halyard.d/10.toml", "a");
+    EXPECT_TRUE(toldOnce());
+}
+
+TEST_F(ConfigurationWatchTest, AFolderOfDropInsThatIsTheDirectoryItselfLosesNothing) {
+    fs::create_directory_symlink(".", tree_ / "halyard.d");
+    watch(tree_.path());
+
+    tree_.write("halyard.toml", "a");
+    EXPECT_TRUE(toldOnce());
+    fs::remove(tree_ / "halyard.d");
+    EXPECT_TRUE(toldOnce());
+    tree_.write("halyard.toml", "b");
     EXPECT_TRUE(toldOnce());
 }
 

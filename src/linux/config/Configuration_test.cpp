@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 #include <thread>
 
+#include "linux/config/SettingsFiles.h"
 #include "platform/Platform.h"
 #include "testing/RecordingLog.h"
 #include "testing/TempTree.h"
@@ -93,7 +94,7 @@ TEST_F(ConfigurationTest, AFileThatCannotBeReadLeavesTheLastGoodOne) {
     reloadWith("log.level = 'debug'\n");
     log_.clear();
 
-    EXPECT_EQ(reloadWith(std::string(Configuration::kMaxFileBytes + 1, '\n')), Outcome::Refused);
+    EXPECT_EQ(reloadWith(std::string(kMaxSettingsBytes + 1, '\n')), Outcome::Refused);
     std::filesystem::remove(file());
     std::filesystem::create_directory(file());
     EXPECT_EQ(configuration_.reload(), Outcome::Refused);
@@ -109,6 +110,40 @@ TEST_F(ConfigurationTest, RemovingTheFileMeansTheDefaults) {
     std::filesystem::remove(file());
     EXPECT_EQ(configuration_.reload(), Outcome::Changed);
     EXPECT_EQ(*configuration_.settings(), Settings());
+}
+
+TEST_F(ConfigurationTest, DropInsWinInOrderOfTheirNames) {
+    tree_.write("halyard.d/20.toml", "log.level = 'error'\n");
+    tree_.write("halyard.d/10.toml", "log.level = 'default'\nstore.max_age = '2d'\n");
+    reloadWith("log.level = 'debug'\nstore.max_age = '1d'\nstore.max_bytes = '1MiB'\n");
+
+    EXPECT_EQ(configuration_.settings()->logLevel, LogLevel::Error);
+    EXPECT_EQ(configuration_.settings()->store.maxAge, std::chrono::hours(48));
+    EXPECT_EQ(configuration_.settings()->store.maxBytes, 1048576u);
+    EXPECT_THAT(log_.texts(),
+                ElementsAre("configuration of " + file() + " and 2 of halyard.d is in force"));
+}
+
+TEST_F(ConfigurationTest, DropInsHoldWithoutTheFileBeforeThem) {
+    tree_.write("halyard.d/10.toml", "log.level = 'debug'\n");
+
+    EXPECT_EQ(configuration_.reload(), Outcome::Changed);
+    EXPECT_EQ(configuration_.settings()->logLevel, LogLevel::Debug);
+}
+
+TEST_F(ConfigurationTest, OneBrokenFileLeavesTheLastGoodConfigurationAsAWhole) {
+    tree_.write("halyard.d/10.toml", "log.level = 'debug'\n");
+    reloadWith("store.max_bytes = '1MiB'\n");
+    log_.clear();
+
+    tree_.write("halyard.d/10.toml", "log.level = 'info'\n");
+    tree_.write("halyard.d/20.toml", "\nlog.level = 'loud'\n");
+    EXPECT_EQ(reloadWith("store.max_bytes = '2MiB'\n"), Outcome::Refused);
+
+    EXPECT_EQ(configuration_.settings()->logLevel, LogLevel::Debug);
+    EXPECT_EQ(configuration_.settings()->store.maxBytes, 1048576u);
+    EXPECT_THAT(log_.texts(), ElementsAre(StartsWith((tree_ / "halyard.d/20.toml").native() +
+                                                     ":2:13: log.level must be one of ")));
 }
 
 TEST_F(ConfigurationTest, WarningsAreLoggedWithTheirLines) {

@@ -52,6 +52,7 @@ void check(TomlReader& reader, const NamedNode& at, Channel& channel) {
     }
 }
 
+// Added to those of the files before.
 void readChannels(TomlReader& reader, const NamedNode& at, Settings& into) {
     const toml::array* const channels = at.node.as_array();
     if (channels == nullptr) {
@@ -59,7 +60,7 @@ void readChannels(TomlReader& reader, const NamedNode& at, Settings& into) {
                     fmt::format("{0} must be a list of tables, each begun by [[{0}]]", at.name));
         return;
     }
-    if (channels->size() > kMaxDriverChannels) {
+    if (channels->size() + into.driverChannels.size() > kMaxDriverChannels) {
         reader.fail(at.node,
                     fmt::format("{} has more than {} entries", at.name, kMaxDriverChannels));
         return;

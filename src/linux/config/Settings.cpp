@@ -188,8 +188,8 @@ std::optional<std::uint32_t> lineOfTooManyDots(std::string_view text) {
 
 } // namespace
 
-Result<ParsedSettings, SettingsFailure> parseSettings(std::string_view text,
-                                                      std::string_view path) {
+Result<ParsedSettings, SettingsFailure> parseSettings(std::string_view text, std::string_view path,
+                                                      Settings before) {
     const auto refused = [&](std::string why, std::uint32_t line, std::uint32_t column) {
         return SettingsFailure{{{}, std::move(why)}, std::string(path), line, column};
     };
@@ -199,9 +199,8 @@ Result<ParsedSettings, SettingsFailure> parseSettings(std::string_view text,
     try {
         const toml::table root = toml::parse(text, std::string_view());
         TomlReader reader(path);
-        Settings settings;
-        reader.readSection<Settings>({root, ""}, kSections, settings);
-        return reader.finish(std::move(settings));
+        reader.readSection<Settings>({root, ""}, kSections, before);
+        return reader.finish(std::move(before));
     } catch (const toml::parse_error& error) {
         const toml::source_position at = error.source().begin;
         return refused(std::string(error.description()), at.line, at.column);

@@ -64,14 +64,18 @@ struct ParsedSettings {
     std::size_t warningsLeftOut = 0;
     // The dotted names of all that the tables of the file may hold.
     std::set<std::string, std::less<>> known;
+    std::set<std::string, std::less<>> given; // of these, what the file has
 };
 
 inline constexpr std::size_t kMaxSettingsWarnings = 32;
 // Of lists and dictionaries within a preference.
 inline constexpr int kMaxPreferenceDepth = 32;
 
-// Reads the text of halyard.toml. All or nothing: of several mistakes the first
-// in the file is told. `path` only names the file in the error.
-Result<ParsedSettings, SettingsFailure> parseSettings(std::string_view text, std::string_view path);
+// Reads the text of a configuration file over what the files before it left: what it
+// says wins, a list as a whole, preferences, switches and attributes each by its key;
+// driver channels are added. All or nothing: of several mistakes the first in the file
+// is told. `path` only names the file in the error.
+Result<ParsedSettings, SettingsFailure> parseSettings(std::string_view text, std::string_view path,
+                                                      Settings before = {});
 
 } // namespace halyard::linux_

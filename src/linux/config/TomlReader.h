@@ -1,7 +1,8 @@
 // Walks a parsed file section by section, and keeps what is wrong with it.
 //
 // Goes on after a mistake, so that the one told is the first of the file, whatever
-// order the walk has. Sections are tables of keys, each
+// order the walk has. What a file leaves out stays as it was in what it is read into:
+// so a second file wins over the first, key by key. Sections are tables of keys, each
 // with the function that reads it. On the stack of one reading; only the settings'
 // sources include this: the library's header is heavy.
 #pragma once
@@ -101,6 +102,7 @@ void TomlReader::readSection(const NamedNode& at, std::span<const Key<T>> keys, 
         if (known == keys.end()) {
             warn(name.source(), "unknown key " + path + " has no effect");
         } else {
+            result_.given.insert(path);
             known->read(*this, {element, path}, into);
         }
     }
