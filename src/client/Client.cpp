@@ -130,6 +130,19 @@ void Client::abandon(std::unique_ptr<Abandoned> session) noexcept {
     wakeUp_.notify(0, true);
 }
 
+Client::Losses Client::losses() const noexcept {
+    using enum protocol::ClientLoss;
+    Losses losses{};
+    const auto set = [&](protocol::ClientLoss reason, const std::atomic<std::uint64_t>& count) {
+        losses[static_cast<std::size_t>(reason)] = count.load(std::memory_order_relaxed);
+    };
+    set(QueueFull, counters_.queueFull);
+    set(Discarded, counters_.discarded);
+    set(TooLarge, counters_.tooLarge);
+    set(Invalid, counters_.invalid);
+    return losses;
+}
+
 bool Client::countSession() noexcept {
     if (sessions_.fetch_add(1) < kMaxSessions) {
         return true;

@@ -7,6 +7,7 @@
 
 #include <pthread.h>
 
+#include <array>
 #include <atomic>
 #include <chrono>
 #include <condition_variable>
@@ -21,6 +22,7 @@
 #include "client/TimeStamps.h"
 #include "client/WakeUp.h"
 #include "common/Mutex.h"
+#include "protocol/ClientLosses.h"
 
 namespace halyard::client {
 
@@ -90,6 +92,9 @@ public:
     // Ends the thread. Once.
     halyard_result close(std::chrono::milliseconds timeout);
     Counters& counters() noexcept { return counters_; }
+    // Messages that were dropped, by protocol::ClientLoss.
+    using Losses = std::array<std::uint64_t, protocol::kClientLossNames.size()>;
+    Losses losses() const noexcept;
     const MessageRing& queue() const noexcept { return ring_; }
     // False when there are too many already.
     [[nodiscard]] bool countSession() noexcept;

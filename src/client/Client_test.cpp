@@ -343,6 +343,41 @@ TEST_F(ClientTest, WithoutADaemonCountsWhatFindsNoRoom) {
     EXPECT_EQ(statistics.memory_limit, 64U * 1024);
 }
 
+TEST_F(ClientTest, TellsTheDaemonThatComesWhatItHadNoRoomFor) {
+    connect(64 * 1024);
+    ASSERT_FALSE(states_.take());
+    reporting::Session session = client_->createSession(1);
+    int refused = 0;
+    for (int i = 0; i < 2000; ++i) {
+        refused += sendNumber(session, i) == HALYARD_QUEUE_FULL ? 1 : 0;
+    }
+    daemon_->start();
+    ASSERT_TRUE(daemon_->waitForCalls(1));
+    EXPECT_EQ(daemon_->calls()[0].method, Method::ClientDropped);
+    EXPECT_EQ(daemon_->calls()[0].arguments.dictionary, (Dictionary{{"queue_full", refused}}));
+}
+
+TEST_F(ClientTest, TellsWhatItLostWhenItEndsAndNothingTwice) {
+    reporting::Dictionary broken;
+    broken.beginList("open");
+    connect();
+    ASSERT_FALSE(states_.take());
+    client_->broadcast(broken, 1, 1);
+    daemon_->start();
+    ASSERT_TRUE(daemon_->waitForCalls(1));
+    stopDaemonAgain();
+    daemon_->start();
+    ASSERT_TRUE(states_.take());
+    client_->broadcast(broken, 1, 1);
+    client_->broadcast(broken, 1, 1);
+    client_.reset();
+    ASSERT_TRUE(daemon_->waitForEnds(1));
+    const Calls calls = daemon_->calls();
+    EXPECT_THAT(methodsOf(calls), ElementsAre(Method::ClientDropped, Method::ClientDropped));
+    EXPECT_EQ(calls[0].arguments.dictionary, (Dictionary{{"invalid", 1}}));
+    EXPECT_EQ(calls[1].arguments.dictionary, (Dictionary{{"invalid", 2}}));
+}
+
 // However long the daemon is away and whatever the queue holds, the sessions
 // that it finds when it comes are those that live then.
 TEST_F(ClientTest, WithoutADaemonForgetsMessagesRatherThanSessions) {

@@ -72,6 +72,7 @@ void Worker::connectIfDue() {
     client_.counters().reconnects.fetch_add(everConnected_ ? 1 : 0, std::memory_order_relaxed);
     everConnected_ = true;
     recreateSessions();
+    lossReport_.append(outbox_.bytes(), client_.losses());
     tellState(HALYARD_CONNECTED);
 }
 
@@ -104,6 +105,7 @@ void Worker::lose() {
     if (!connection_.isOpen()) {
         return;
     }
+    lossReport_.gone();
     connection_.close();
     reader_.reset();
     outbox_.clear();
@@ -154,6 +156,9 @@ bool Worker::pump() {
         wouldBlock_ = outcome == Connection::Outcome::WouldBlock;
     }
     takeWritten();
+    if (outbox_.allWritten()) {
+        lossReport_.written();
+    }
     if (queueIsRead() && outbox_.allWritten()) {
         client_.ring().rewind();
         cursor_ = client_.ring().releasedTo();
@@ -236,6 +241,7 @@ void Worker::sayGoodbye() {
                           session.reporterID);
         replies_.letGo(session.reporterID);
     }
+    lossReport_.append(outbox_.bytes(), client_.losses());
 }
 
 // ---- When there is no delivering ------------------------------------------------

@@ -23,6 +23,7 @@
 #include "client/Backoff.h"
 #include "client/Client.h"
 #include "client/Connection.h"
+#include "client/LossReport.h"
 #include "client/Outbox.h"
 #include "client/Replies.h"
 #include "client/SessionTable.h"
@@ -83,6 +84,7 @@ private:
     Replies replies_;
     SessionTable table_;
     Backoff backoff_;
+    LossReport lossReport_;
 
     std::uint64_t cursor_ = 0; // Up to here the queue is in the outbox.
     std::uint32_t nextMessageID_ = 1;

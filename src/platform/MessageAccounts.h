@@ -5,6 +5,8 @@
 // Each of these is counted where it is decided, so that what does not add up shows: it
 // stays "waiting" for good.
 //
+// What clients lost before it came here is told by themselves and stands beside the sheet.
+//
 // Kept with the platform (see Platform), because who counts has nothing else in common.
 // Any thread; adding costs one atomic operation.
 #pragma once
@@ -14,6 +16,7 @@
 #include <cstdint>
 
 #include "common/Value.h"
+#include "protocol/ClientLosses.h"
 
 namespace halyard::platform {
 
@@ -43,13 +46,20 @@ public:
     std::uint64_t of(MessageCount what) const {
         return counts_[static_cast<std::size_t>(what)].load(std::memory_order_acquire);
     }
+    // What a client says that it lost, by reason. Clients are not trusted: other reasons are
+    // taken together, and what is no count is left out.
+    void addLostInClient(const Dictionary& counts) const;
     // As admin.status shows it. `delivered` is what the store is done with, read before:
     // it must not be ahead of what is read here.
     Dictionary describe(std::uint64_t delivered) const;
 
 private:
+    // And one for all other reasons.
+    static constexpr std::size_t kClientLosses = protocol::kClientLossNames.size() + 1;
+
     // One processor writes the first seven, others the rest.
     alignas(64) mutable std::array<std::atomic<std::uint64_t>, kMessageCounts> counts_{};
+    mutable std::array<std::atomic<std::uint64_t>, kClientLosses> lostInClients_{};
 };
 
 } // namespace halyard::platform

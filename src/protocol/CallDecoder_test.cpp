@@ -93,6 +93,7 @@ TEST(CallDecoderTest, KnowsEveryMethodAndItsArguments) {
         {"reporterIDValid", {id}},
         {"getAllReporters", {}},
         {"killService", {}},
+        {"client.dropped", {map}},
         {"admin.postNotification", {packed("x")}},
         {"admin.flush", {}},
         {"admin.status", {}},

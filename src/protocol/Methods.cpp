@@ -40,6 +40,7 @@ constexpr MethodEntry kMethods[] = {
     {Method::ReporterIDValid, "reporterIDValid", 1, {Argument::ReporterID}},
     {Method::GetAllReporters, "getAllReporters"},
     {Method::KillService, "killService"},
+    {Method::ClientDropped, "client.dropped", 1, {Argument::Dictionary}},
     {Method::AdminPostNotification, "admin.postNotification", 1, {Argument::Name}},
     {Method::AdminFlush, "admin.flush"},
     {Method::AdminStatus, "admin.status"},

@@ -29,6 +29,8 @@ enum class Method : std::uint8_t {
     ReporterIDValid,
     GetAllReporters,
     KillService,
+    // What a client has to tell of itself.
+    ClientDropped,
     // For operators, beside the request interface.
     AdminPostNotification,
     AdminFlush,
@@ -42,7 +44,7 @@ using ReporterIDs = std::vector<std::int64_t>;
 struct Arguments {
     std::int64_t reporterID = 0;
     std::uint16_t serviceType = 0;
-    Dictionary dictionary{}; // a message or a configuration
+    Dictionary dictionary{}; // a message, a configuration, counts
     std::uint32_t category = 0;
     std::uint16_t type = 0;
     std::optional<ReporterIDs> reporterIDs{}; // nullopt: no list at all (broadcast)

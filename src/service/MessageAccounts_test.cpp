@@ -1,8 +1,10 @@
 // The sheet of messages: whatever clients do, it adds up.
 
 #include <array>
+#include <limits>
 #include <random>
 
+#include "common/Json.h"
 #include "service/ServiceFixture.h"
 
 namespace halyard {
@@ -90,6 +92,31 @@ TEST_F(MessageAccountsTest, ASingleMessageWithoutABackEndIsNotDelivered) {
     platform_.queues.advance(1s);
     run();
     EXPECT_EQ(rule("no_backend"), 1);
+}
+
+TEST_F(MessageAccountsTest, AddsUpWhatClientsSayThatTheyLost) {
+    const Peer peer = connect(10);
+    const auto tell = [&](Dictionary counts) {
+        peer.connection().send(protocol::Method::ClientDropped, {.dictionary = std::move(counts)});
+    };
+    tell({{"queue_full", 3}, {"invalid", 1}});
+    tell({{"queue_full", 2}, {"discarded", 1}, {"too_large", 4}});
+    EXPECT_EQ(toJson(sheet()["lost_in_clients"]),
+              R"({"queue_full":5,"discarded":1,"too_large":4,"invalid":1,"other":0})");
+}
+
+TEST_F(MessageAccountsTest, TrustsNoClientWithItsLosses) {
+    const Peer peer = connect(10);
+    const auto tell = [&](Dictionary counts) {
+        peer.connection().send(protocol::Method::ClientDropped, {.dictionary = std::move(counts)});
+    };
+    tell({{"made", 1}, {"up", 2}});
+    tell({{"queue_full", -1}, {"invalid", "many"}, {"discarded", 1.5}, {"too_large", List()}});
+    tell({{"invalid", std::numeric_limits<std::uint64_t>::max()}});
+    tell({{"invalid", 5}});
+    EXPECT_EQ(toJson(sheet()["lost_in_clients"]),
+              R"({"queue_full":0,"discarded":0,"too_large":0,"invalid":9223372036854775807,)"
+              R"("other":3})");
 }
 
 // One run of clients that do anything, in any order.

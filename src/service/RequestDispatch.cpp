@@ -111,6 +111,9 @@ void RequestDispatch::handle(protocol::Request request) {
             });
     case Method::KillService:
         return client_->killService(boolReply(std::move(reply)));
+    case Method::ClientDropped:
+        platform::current().messageAccounts.addLostInClient(a.dictionary);
+        return reply(std::nullopt, true);
     case Method::AdminPostNotification:
     case Method::AdminFlush:
     case Method::AdminStatus:
