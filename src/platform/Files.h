@@ -32,6 +32,10 @@ public:
     // Replaces the file as a whole: readers, and a machine that loses power, see
     // the old contents or the new ones.
     virtual MaybeError writeFileAtomically(std::string_view path, std::string_view contents) = 0;
+    // The same for a file that is one of many: one that is there already stays, and the new
+    // one gets a name like it. The oldest of its directory go when they are too many.
+    virtual std::variant<std::string, Error> addFile(std::string_view path,
+                                                     std::string_view contents) = 0;
 };
 
 } // namespace halyard::platform

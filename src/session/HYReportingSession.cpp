@@ -179,10 +179,12 @@ void HYReportingSession::writeSummaryJson() const {
         summaryFileName(clock.wallTime(), clock.utcOffset(clock.wallTime()),
                         describe(HYReportingUtilityRetrieveAppName(configuration())),
                         HYReportingUtilityGenerateServiceNameFromServiceType(serviceType()));
-    if (const auto error = files.writeFileAtomically(path, *text)) {
+    const auto added = files.addFile(path, *text);
+    if (const auto* const error = std::get_if<Error>(&added)) {
         HY_LOG_ERROR(HYReportingSessionCategory, "jsonOutput writeToURL: {}", error->message);
     } else {
-        HY_LOG_INFO(HYReportingSessionCategory, "jsonOutput writeToURL: {}", files.located(path));
+        HY_LOG_INFO(HYReportingSessionCategory, "jsonOutput writeToURL: {}",
+                    files.located(std::get<std::string>(added)));
     }
 }
 

@@ -42,6 +42,13 @@ public:
         }
         return writeError;
     }
+    std::variant<std::string, Error> addFile(std::string_view path,
+                                             std::string_view contents) override {
+        if (const MaybeError error = writeFileAtomically(path, contents)) {
+            return *error;
+        }
+        return std::string(path);
+    }
 
     std::map<std::string, std::string> files; // by path
     std::vector<Made> directories;

@@ -1,6 +1,7 @@
 #include "linux/system/CollectedFiles.h"
 
 #include <fmt/format.h>
+#include <regex>
 #include <string>
 #include <system_error>
 #include <vector>
@@ -47,6 +48,26 @@ Result<void> removeAll(const std::vector<fs::path>& paths) {
     return result;
 }
 
+// ".name.PID-N", see AtomicFile.
+bool isTemporary(const fs::directory_entry& entry) {
+    static const std::regex form(R"(\..+\.[0-9]+-[0-9]+)");
+    std::error_code ignored;
+    return entry.symlink_status(ignored).type() == fs::file_type::regular &&
+           std::regex_match(entry.path().filename().string(), form);
+}
+
+void removeTemporaries(const fs::path& tree) {
+    std::vector<fs::path> found;
+    std::error_code error;
+    for (auto entry = fs::recursive_directory_iterator(tree, error);
+         !error && entry != fs::recursive_directory_iterator(); entry.increment(error)) {
+        if (isTemporary(*entry)) {
+            found.push_back(entry->path());
+        }
+    }
+    (void)removeAll(found);
+}
+
 } // namespace
 
 Result<void> keepStorePrivate(const fs::path& state) {
@@ -83,6 +104,12 @@ Result<void> removeCollectedState(const fs::path& state) {
         }
     }
     return removeAll(paths);
+}
+
+void removeUnfinished(const fs::path& state, const fs::path& logs) {
+    (void)removeWhole(state / kIncidentsFolder / kUnfinishedIncident);
+    removeTemporaries(logs / kSummariesFolder);
+    removeTemporaries(logs / kTracesFolder);
 }
 
 Result<void> removeCollectedLogs(const fs::path& logs) {

@@ -33,6 +33,28 @@ TEST(CollectedFilesTest, WhatWasCollectedGoesAndTheRestStays) {
     EXPECT_EQ(left, (std::vector<std::string>{"log/other", "state/other", "state/telemetry.db"}));
 }
 
+TEST(CollectedFilesTest, WhatKilledDaemonsLeftHalfWrittenGoesAndTheRestStays) {
+    const testing::TempTree tree;
+    for (const char* const path :
+         {"state/incidents/.unfinished/a", "state/incidents/000001-x/.a.json.7-1",
+          "log/Reporting/.a.json.4711-0", "log/Reporting/a.json", "log/Reporting/.hidden",
+          "log/Traces/b/.tracing_results.pbj.4711-12", "log/Traces/b/tracing_results.pbj"}) {
+        tree.write(path, "x");
+    }
+    removeUnfinished(tree / "state", tree / "log");
+    removeUnfinished(tree / "no state", tree / "no log");
+    std::vector<std::string> left;
+    for (const auto& entry : fs::recursive_directory_iterator(tree.path())) {
+        if (entry.is_regular_file()) {
+            left.push_back(fs::relative(entry.path(), tree.path()));
+        }
+    }
+    std::sort(left.begin(), left.end());
+    EXPECT_EQ(left, (std::vector<std::string>{"log/Reporting/.hidden", "log/Reporting/a.json",
+                                              "log/Traces/b/tracing_results.pbj",
+                                              "state/incidents/000001-x/.a.json.7-1"}));
+}
+
 TEST(CollectedFilesTest, WhereNothingIsThereIsNothingToDo) {
     EXPECT_TRUE(removeCollectedState("/nonexistent").ok());
     EXPECT_TRUE(removeCollectedLogs("/nonexistent").ok());

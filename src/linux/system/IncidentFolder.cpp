@@ -11,6 +11,7 @@
 
 #include "common/Description.h"
 #include "common/Json.h"
+#include "linux/system/CollectedFiles.h"
 #include "linux/system/PrivateFiles.h"
 #include "linux/system/ProcessFacts.h"
 #include "platform/Log.h"
@@ -19,8 +20,6 @@ namespace halyard::linux_ {
 namespace {
 
 namespace fs = std::filesystem;
-
-constexpr std::string_view kUnfinished = ".unfinished";
 
 Date dateOf(platform::WallTime time) {
     const auto seconds = std::chrono::floor<std::chrono::seconds>(time);
@@ -72,11 +71,24 @@ std::map<std::uint64_t, fs::path> finishedFolders(const fs::path& directory) {
     return folders;
 }
 
-void removeOldest(const fs::path& directory, std::size_t kept) {
+std::uintmax_t bytesOf(const fs::path& folder) {
+    std::uintmax_t bytes = 0;
+    for (const fs::directory_entry& entry : fs::recursive_directory_iterator(folder)) {
+        bytes += entry.symlink_status().type() == fs::file_type::regular ? entry.file_size() : 0;
+    }
+    return bytes;
+}
+
+// The newest stays, however large it is.
+void removeOldest(const fs::path& directory) {
     const auto folders = finishedFolders(directory);
-    auto oldest = folders.begin();
-    for (std::size_t count = folders.size(); count > kept; --count, ++oldest) {
-        fs::remove_all(oldest->second);
+    std::size_t count = 0;
+    std::uintmax_t bytes = 0;
+    for (auto folder = folders.rbegin(); folder != folders.rend(); ++folder) {
+        bytes += bytesOf(folder->second);
+        if (++count > IncidentFolder::kKept || (count > 1 && bytes > IncidentFolder::kKeptBytes)) {
+            fs::remove_all(folder->second);
+        }
     }
 }
 
@@ -191,7 +203,7 @@ Result<fs::path> IncidentFolder::write(const Snapshot& snapshot) const try {
     if (const auto made = makePrivateDirectory(directory); !made.ok()) {
         return made.failure();
     }
-    const fs::path unfinished = directory / kUnfinished;
+    const fs::path unfinished = directory / kUnfinishedIncident;
     fs::remove_all(unfinished); // Of a daemon that was killed meanwhile.
     Result<void> filled = makeFolder(unfinished);
     filled = filled.ok() ? fillFolder(unfinished, snapshot) : filled;
@@ -207,7 +219,7 @@ Result<fs::path> IncidentFolder::write(const Snapshot& snapshot) const try {
         return kept.failure();
     }
     fs::rename(unfinished, finished);
-    removeOldest(directory, kKept);
+    removeOldest(directory);
     return finished;
 } catch (const std::exception& error) {
     return Failure{{}, error.what()};

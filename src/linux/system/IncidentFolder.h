@@ -5,9 +5,9 @@
 //     incidents/000017-20240229T123456Z-AudioAnalytics-haptics-DSP_IO-mpv/
 //         incident.json  log.txt  process-4711/{status,stat,io,…}
 //
-// A folder is put together under a hidden name and appears whole. The rising
-// number in front, not the time, tells which are the newest, since the clock may
-// jump. The folders are the service's own to read: a process's facts are nobody
+// The newest are kept, within a bound in number and bytes. A folder is put together under a hidden
+// name and appears whole. The rising number in front, not the time, tells which are the newest,
+// since the clock may jump. The folders are the service's own to read: a process's facts are nobody
 // else's business.
 //
 // Any thread may ask; snapshots are taken one after the other by a worker of its
@@ -33,6 +33,7 @@ namespace halyard::linux_ {
 class IncidentFolder final : public platform::IncidentReporter {
 public:
     static constexpr std::size_t kKept = 50;
+    static constexpr std::uintmax_t kKeptBytes = 32 * 1024 * 1024;
     static constexpr std::size_t kMostWaiting = 8;
     static constexpr std::size_t kMostLogBytes = 1024 * 1024;
 

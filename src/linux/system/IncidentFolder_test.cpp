@@ -144,6 +144,18 @@ TEST_F(IncidentFolderTest, TheNewestFiftyStayEvenWhenTheClockGoesBack) {
     EXPECT_EQ(names.back().substr(0, 16), "000051-19700101T");
 }
 
+TEST_F(IncidentFolderTest, FoldersHaveABoundInBytesToo) {
+    for (const char* const name : {"000001-a", "000002-b"}) {
+        root_.write(directory_ / name / "log.txt", "");
+        fs::resize_file(directory_ / name / "log.txt", IncidentFolder::kKeptBytes / 2);
+    }
+    IncidentFolder folder(clock_, options());
+    take(folder, signature_);
+    const auto names = namesIn(directory_);
+    ASSERT_EQ(names.size(), 2U);
+    EXPECT_EQ(names.front(), "000002-b");
+}
+
 TEST_F(IncidentFolderTest, NumbersGoOnAfterARestart) {
     {
         IncidentFolder folder(clock_, options());

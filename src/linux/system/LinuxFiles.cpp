@@ -1,7 +1,9 @@
 #include "linux/system/LinuxFiles.h"
 
 #include <algorithm>
+#include <fmt/format.h>
 #include <sys/stat.h>
+#include <vector>
 
 #include "linux/system/AtomicFile.h"
 #include "linux/system/PrivateFiles.h"
@@ -20,6 +22,52 @@ Result<void> makeDirectory(const fs::path& path, mode_t mode) {
     const Failure failure = Failure::ofErrno();
     std::error_code ignored;
     return fs::is_directory(path, ignored) ? Result<void>() : failure;
+}
+
+// "name-2.json" where there is a "name.json".
+fs::path freeName(const std::string& path) {
+    const fs::path wanted(path);
+    fs::path name = wanted;
+    std::error_code ignored;
+    for (int i = 2; fs::exists(fs::symlink_status(name, ignored)); ++i) {
+        name = wanted.parent_path() /
+               fmt::format("{}-{}{}", wanted.stem().string(), i, wanted.extension().string());
+    }
+    return name;
+}
+
+struct Added {
+    fs::path path;
+    fs::file_time_type time;
+    std::uintmax_t bytes;
+};
+
+std::vector<Added> newestFirst(const fs::path& directory) {
+    std::vector<Added> files;
+    std::error_code ignored;
+    for (const fs::directory_entry& entry : fs::directory_iterator(directory, ignored)) {
+        if (entry.symlink_status(ignored).type() == fs::file_type::regular &&
+            !entry.path().filename().native().starts_with('.')) {
+            files.push_back(
+                {entry.path(), entry.last_write_time(ignored), entry.file_size(ignored)});
+        }
+    }
+    std::sort(files.begin(), files.end(),
+              [](const Added& a, const Added& b) { return a.time > b.time; });
+    return files;
+}
+
+// The newest stays, however large it is.
+void removeOldest(const fs::path& directory) {
+    const std::vector<Added> files = newestFirst(directory);
+    std::uintmax_t bytes = 0;
+    for (std::size_t i = 0; i < files.size(); ++i) {
+        bytes += files[i].bytes;
+        if (i >= LinuxFiles::kMostAdded || (i > 0 && bytes > LinuxFiles::kMostAddedBytes)) {
+            std::error_code ignored;
+            fs::remove(files[i].path, ignored);
+        }
+    }
 }
 
 } // namespace
@@ -81,6 +129,17 @@ MaybeError LinuxFiles::writeFileAtomically(std::string_view path, std::string_vi
     file.write(contents);
     const auto result = file.commit();
     return result.ok() ? MaybeError() : systemError(result.failure());
+}
+
+std::variant<std::string, Error> LinuxFiles::addFile(std::string_view path,
+                                                     std::string_view contents) {
+    const MutexLock lock(adding_);
+    const std::string free = freeName(directories_.mapped(path)).string();
+    if (const MaybeError error = writeFileAtomically(free, contents)) {
+        return *error;
+    }
+    removeOldest(fs::path(free).parent_path());
+    return free;
 }
 
 } // namespace halyard::linux_

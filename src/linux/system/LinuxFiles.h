@@ -4,6 +4,7 @@
 // Any thread.
 #pragma once
 
+#include "common/Mutex.h"
 #include "linux/system/Directories.h"
 #include "platform/Files.h"
 
@@ -11,6 +12,10 @@ namespace halyard::linux_ {
 
 class LinuxFiles final : public platform::Files {
 public:
+    // What a directory keeps of files that are added.
+    static constexpr std::size_t kMostAdded = 500;
+    static constexpr std::uintmax_t kMostAddedBytes = 64 * 1024 * 1024;
+
     explicit LinuxFiles(Directories directories) : directories_(std::move(directories)) {}
 
     std::variant<std::string, Error> readFile(std::string_view path,
@@ -19,11 +24,14 @@ public:
     std::string located(std::string_view path) const override;
     MaybeError createDirectories(std::string_view path, std::uint32_t mode) override;
     MaybeError writeFileAtomically(std::string_view path, std::string_view contents) override;
+    std::variant<std::string, Error> addFile(std::string_view path,
+                                             std::string_view contents) override;
 
 private:
     bool isOwn(const std::filesystem::path& path) const;
 
     const Directories directories_;
+    Mutex adding_; // So that a name that is free stays so.
 };
 
 // What the core is told of the system's refusal: errno as the code.

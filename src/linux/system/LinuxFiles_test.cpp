@@ -87,6 +87,39 @@ TEST_F(LinuxFilesTest, WritesReplaceAndLeaveNothingElseBehind) {
     EXPECT_THAT(names(), ::testing::ElementsAre("file"));
 }
 
+TEST_F(LinuxFilesTest, AFileThatIsAddedLeavesTheOthersAlone) {
+    const std::string path = (tree_ / "a.json").string();
+    for (const char* const text : {"1", "2", "3"}) {
+        EXPECT_TRUE(std::holds_alternative<std::string>(files_.addFile(path, text)));
+    }
+    EXPECT_THAT(names(), ::testing::UnorderedElementsAre("a.json", "a-2.json", "a-3.json"));
+    EXPECT_EQ(read("a.json"), "1");
+    EXPECT_EQ(read("a-3.json"), "3");
+}
+
+TEST_F(LinuxFilesTest, OfTooManyAddedFilesTheOldestGo) {
+    for (std::size_t i = 0; i < LinuxFiles::kMostAdded; ++i) {
+        tree_.write(std::to_string(i), "");
+        fs::last_write_time(tree_ / std::to_string(i),
+                            fs::file_time_type::clock::now() - std::chrono::hours(i + 1));
+    }
+    (void)files_.addFile((tree_ / "new").string(), "");
+    EXPECT_EQ(names().size(), LinuxFiles::kMostAdded);
+    EXPECT_FALSE(fs::exists(tree_ / std::to_string(LinuxFiles::kMostAdded - 1)));
+    EXPECT_TRUE(fs::exists(tree_ / "new"));
+}
+
+TEST_F(LinuxFilesTest, AddedFilesHaveABoundInBytesToo) {
+    for (const char* const name : {"older", "old"}) {
+        tree_.write(name, "");
+        fs::resize_file(tree_ / name, LinuxFiles::kMostAddedBytes / 2);
+    }
+    fs::last_write_time(tree_ / "older", fs::file_time_type::clock::now() - std::chrono::hours(2));
+    fs::last_write_time(tree_ / "old", fs::file_time_type::clock::now() - std::chrono::hours(1));
+    (void)files_.addFile((tree_ / "new").string(), "text");
+    EXPECT_THAT(names(), ::testing::UnorderedElementsAre("old", "new"));
+}
+
 TEST_F(LinuxFilesTest, FailedWritesTellAndLeaveWhatWasThere) {
     tree_.write("folder/file", "old");
     const auto error = files_.writeFileAtomically((tree_ / "folder").string(), "new");
