@@ -42,10 +42,11 @@ class Launcher:
             file.write(text)
         os.rename(path + ".new", path)
 
-    def start(self, arguments=(), **options):
-        """Starts it; `options` are subprocess.Popen's."""
+    def start(self, arguments=(), extra=None, **options):
+        """Starts it, with what is `extra` in its environment; `options` are subprocess.Popen's."""
         environment = {name: value for name, value in os.environ.items() if name not in NOT_FOR_IT}
         environment |= {name: self.path(folder) for name, folder in FOLDERS.items()}
+        environment |= extra or {}
         with open(self.log_path, "ab") as log:
             self.process = subprocess.Popen([self.program, *arguments], env=environment, stderr=log,
                                             stdin=subprocess.DEVNULL, **options)

@@ -22,10 +22,11 @@ constexpr const char* kSocketFile = "reporting.sock";
 constexpr const char* kCyclesFolder = "cycles";
 // What is left to read fits into the sockets' buffers, unless the disk does not keep up.
 constexpr std::chrono::seconds kReadingLimit{5};
-// Sessions may wait nine seconds for their back ends, the store ten for a disk.
-constexpr std::chrono::seconds kShutdownLimit{25};
-// The same without the store's ten, which it keeps to by itself.
-constexpr std::chrono::seconds kSaveLimit{15};
+// The end as a whole, whatever hangs, and what of it may go by before the store has to
+// come to its own.
+constexpr std::chrono::milliseconds kEndLimit{9500};
+constexpr std::chrono::seconds kShutdownLimit{7};
+constexpr std::chrono::milliseconds kCloseLimit{2000};
 
 // What waits for the disk is accepted, and accepted means durable within half a
 // second: these rows take a slow machine less than that.
@@ -146,12 +147,18 @@ LinuxPlatform::~LinuxPlatform() {
     queues_->stop();
     incidents_.reset();
     listener_.reset();
-    const bool closed = store_->store.close();
-    logAccounts();
-    if (!closed) {
-        log_.flush();
-        std::_Exit(EXIT_SUCCESS); // A disk that hangs: nothing more can be saved.
+    if (!store_->store.close(kCloseLimit)) {
+        endAsItIs();
     }
+    logAccounts();
+}
+
+// Something hangs, such as a disk: nothing more can be saved, nor its thread waited for.
+void LinuxPlatform::endAsItIs() {
+    store_->store.tellUnwritten();
+    logAccounts();
+    log_.flush();
+    std::_Exit(EXIT_SUCCESS);
 }
 
 void LinuxPlatform::applySettings(const Settings& settings) {
@@ -176,6 +183,7 @@ Result<void> LinuxPlatform::open(platform::ListenerDelegate* delegate) {
         std::make_unique<SocketListener>(context_, pressure_, listening.value(),
                                          [this](const Peer& peer) { return rightsOfPeer(peer); });
     listener_->setDelegate(delegate);
+    removeUnfinished(directories_.state, directories_.logs); // Nobody else runs here.
     listener_->onConnectionsChanged([this](std::size_t connections) {
         idleExit_.connectionsChanged(connections);
         freeMemory_.released(); // If somebody has left, which this need not know.
@@ -255,14 +263,15 @@ void LinuxPlatform::serve() {
 // to the connections and then none of these (which stops its sessions, as when it is
 // lost, and so leaves their last deliveries), then everything that is on its way, down to
 // the disk. Who waits on a socket that outlives us is served by the next. Only then does
-// the loop stop that draining needs for its timers. What a hanging disk or a
-// session's back ends may take is bounded where they are waited for; the limit here
-// is for what nobody has thought of.
+// the loop stop that draining needs for its timers. A disk that hangs lets the limit
+// pass; the store then tells what it could not write. The last resort is for what
+// nobody has thought of.
 void LinuxPlatform::beginShutdown() {
     if (std::exchange(stopping_, true)) {
         return;
     }
     ::sd_notify(0, "STOPPING=1");
+    lastResort_.emplace(kEndLimit, [this] { endAsItIs(); });
     if (!socketInherited_) {
         listener_->acceptTheLast();
     }
@@ -305,8 +314,8 @@ void LinuxPlatform::saveWhatWasAccepted() {
     const BlockingSection blocking;
     const auto drained = std::make_shared<std::promise<void>>();
     queues_->drain([drained] { drained->set_value(); });
-    (void)drained->get_future().wait_for(kSaveLimit);
-    (void)store_->store.close();
+    (void)drained->get_future().wait_for(kShutdownLimit);
+    (void)store_->store.close(kCloseLimit);
     logAccounts();
     log_.flush();
 }

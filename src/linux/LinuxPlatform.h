@@ -10,6 +10,7 @@
 #include <asio/steady_timer.hpp>
 #include <cstdint>
 #include <memory>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -26,6 +27,7 @@
 #include "linux/system/Directories.h"
 #include "linux/system/FreeMemory.h"
 #include "linux/system/IncidentFolder.h"
+#include "linux/system/LastResort.h"
 #include "linux/system/LogWriter.h"
 #include "linux/system/SystemServices.h"
 #include "linux/trace/TraceServices.h"
@@ -71,6 +73,7 @@ private:
     void logAccounts() const;
     void finishShutdown(bool inTime);
     void saveWhatWasAccepted();
+    [[noreturn]] void endAsItIs();
     PeerRights rightsOfPeer(const Peer& peer) const;
 
     const Directories directories_;
@@ -100,6 +103,7 @@ private:
     platform::SteadyTime startTime_;
     bool socketInherited_ = false;
     bool stopping_ = false;
+    std::optional<LastResort> lastResort_; // Goes first.
 };
 
 } // namespace halyard::linux_

@@ -2,11 +2,12 @@
 keep is counted and told once."""
 
 import os
+import re
 import sqlite3
 import subprocess
 import unittest
 
-from harness import Daemon, DaemonTest
+from harness import PATIENCE, Daemon, DaemonTest
 
 
 def send(client, reporter_id, count, size=2000):
@@ -110,6 +111,85 @@ class NotOpened(unittest.TestCase):
         aside = [name for name in os.listdir(os.path.dirname(daemon.store_path))
                  if name.startswith("telemetry.db.damaged-")]
         self.assertEqual(len(aside), 1)
+
+
+class OnAFaultyDisk(unittest.TestCase):
+    """A disk that answers late, with errors, or not at all."""
+
+    def setUp(self):
+        library = os.environ.get("FAULTY_DISK_LIBRARY", "")
+        if not os.path.exists(library):
+            self.skipTest("FAULTY_DISK_LIBRARY names no library")
+        self.daemon = Daemon()
+        self.addCleanup(self.daemon.remove)
+        self.order = self.daemon.path("order")
+        self.tell("")
+        self.daemon.start(extra={"LD_PRELOAD": library, "FAULTY_DISK": self.order})
+        self.daemon.wait_until_it_accepts(PATIENCE)
+        self.client = self.daemon.client()
+        self.addCleanup(self.client.close)
+        self.client.session(1)
+        self.sent = 0
+
+    def tell(self, order):
+        with open(self.order + ".new", "w", encoding="utf-8") as file:
+            file.write(order)
+        os.rename(self.order + ".new", self.order)
+
+    def send(self):
+        self.client.result("sendMessage", {"n": self.sent}, 4, 1, [1])
+        self.sent += 1
+
+    def store(self):
+        return self.client.result("admin.status")["store"]
+
+    def messages(self):
+        return self.daemon.rows("SELECT count(*) FROM upload_message WHERE category = 4")[0][0]
+
+    def test_a_hang_is_told_and_so_is_what_it_costs(self):
+        self.send()
+        self.client.result("admin.flush")
+        self.tell("hang")
+
+        def failing():
+            self.send()
+            return self.store()["failing"]
+
+        self.daemon.wait_for(failing)
+        self.assertIn("the file system does not answer", self.daemon.log())
+        status = self.daemon.terminate()
+        self.assertEqual(status, 0)
+        lost = re.search(r"closing .*, (\d+) rows lost", self.daemon.log())
+        self.assertIsNotNone(lost, self.daemon.log())
+        self.assertGreaterEqual(int(lost.group(1)), self.sent - self.messages())
+
+    def test_read_errors_for_a_while_cost_nothing(self):
+        for _ in range(100):
+            self.send()
+        self.client.result("admin.flush")
+        other = sqlite3.connect(self.daemon.store_path)  # Makes the daemon read again.
+        other.execute("INSERT INTO incident(signature) VALUES('{}')")
+        other.commit()
+        other.execute("PRAGMA wal_checkpoint(TRUNCATE)")
+        other.close()
+        self.tell("eio")
+        self.send()
+        self.daemon.wait_for(lambda: self.store()["failing"])
+        self.tell("")
+        self.send()
+        self.client.result("admin.flush")
+        self.assertEqual(self.messages(), self.sent)
+        self.assertNotIn("set aside", self.daemon.log())
+
+    def test_a_log_that_is_removed_takes_nothing_along(self):
+        self.send()
+        self.client.result("admin.flush")
+        os.remove(self.daemon.store_path + "-wal")
+        for _ in range(10):
+            self.send()
+        self.client.result("admin.flush")
+        self.daemon.kill()
+        self.assertEqual(self.messages(), self.sent)
 
 
 if __name__ == "__main__":

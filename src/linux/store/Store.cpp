@@ -169,10 +169,16 @@ bool Store::close(std::chrono::nanoseconds limit) {
     }
     if (ended) {
         writing_.join();
-    } else if (!std::exchange(toldUnwritten_, true)) {
-        writer_->tellUnwritten();
+    } else {
+        tellUnwritten();
     }
     return ended;
+}
+
+void Store::tellUnwritten() {
+    if (!toldUnwritten_.exchange(true)) {
+        writer_->tellUnwritten();
+    }
 }
 
 void Store::purge(StoreWriter::PurgeReply reply) {

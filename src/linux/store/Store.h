@@ -11,6 +11,7 @@
 // Any thread. docs/store.md describes the file.
 #pragma once
 
+#include <atomic>
 #include <functional>
 #include <memory>
 #include <string>
@@ -85,6 +86,8 @@ public:
     // What it leaves unwritten is told, once.
     [[nodiscard]] bool close() { return close(closeLimit_); }
     [[nodiscard]] bool close(std::chrono::nanoseconds limit);
+    // The same for an end that does not come to that. Any thread.
+    void tellUnwritten();
 
 private:
     void hurryFor(std::uint16_t category);
@@ -98,7 +101,7 @@ private:
     const std::shared_ptr<StoreQueue> queue_;
     const std::shared_ptr<StoreWriter> writer_;
     bool open_ = false;
-    bool toldUnwritten_ = false;
+    std::atomic<bool> toldUnwritten_{false};
     std::thread writing_;
     std::thread watching_;
 };
