@@ -3,6 +3,7 @@
 
 #include <gtest/gtest.h>
 
+#include <chrono>
 #include <fstream>
 #include <sstream>
 #include <string>
@@ -54,6 +55,7 @@ Settings byMeaning(Settings settings) {
 Settings setOnPurpose() {
     Settings settings;
     settings.sessions.recount = true;
+    settings.store.syncInterval = std::chrono::seconds(5);
     return settings;
 }
 
