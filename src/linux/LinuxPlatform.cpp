@@ -164,6 +164,7 @@ void LinuxPlatform::endAsItIs() {
 void LinuxPlatform::applySettings(const Settings& settings) {
     store_->analytics.setWanted(settings.wantedEvents);
     store_->store.setLimits(settings.store);
+    store_->store.setConsent(settings.exporting.consent);
     platform_.sessionRules.set(settings.sessions);
 }
 

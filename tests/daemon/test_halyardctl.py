@@ -483,7 +483,8 @@ class Caring(CtlTest):
     def test_a_purge_through_the_daemon_leaves_not_a_byte(self):
         self.collect()
         tables = [row[0] for row in self.daemon.rows(
-            "SELECT name FROM sqlite_master WHERE type = 'table'")]
+            "SELECT name FROM sqlite_master WHERE type = 'table' AND "
+            "name NOT IN ('consent', 'identity')")]
         rows = sum(self.daemon.rows(f"SELECT count(*) FROM {table}")[0][0] for table in tables)
         # Clients that have just gone leave a row each.
         self.assertGreaterEqual(self.listed("purge")["rows"], rows - 1)

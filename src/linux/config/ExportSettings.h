@@ -1,5 +1,6 @@
 // What of the store may leave the machine, and where to. The daemon sends nothing
-// itself; it reads these so that a mistake is told where all others are.
+// itself; it reads these so that a mistake is told where all others are, and notes when
+// the owner's consent changes.
 //
 // A plain value.
 #pragma once

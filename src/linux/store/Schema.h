@@ -89,6 +89,15 @@ inline constexpr std::array<StoreTableSchema, kStoreTables> kStoreSchema = {
      {"incident", store_columns::kIncident},
      {"repeat", store_columns::kRepeat, 2}}};
 
+// What the store says of itself: see StoreFacts. Made when they are missing, in whatever
+// version, since programs that do not know them need not; `given` is 0 or 1, and there is
+// one identity.
+inline constexpr std::string_view kStoreFactTables =
+    "CREATE TABLE IF NOT EXISTS consent(id INTEGER PRIMARY KEY, given INTEGER, time REAL);"
+    "CREATE TABLE IF NOT EXISTS identity(device TEXT);";
+// Older ones are removed; what has no note counts as refused.
+inline constexpr std::int64_t kMaxConsentNotes = 1000;
+
 // The values of upload_session.ended; NULL while it is open.
 inline constexpr std::string_view kEndedStopped = "stopped";
 inline constexpr std::string_view kEndedDisconnected = "disconnected";

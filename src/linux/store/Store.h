@@ -77,6 +77,9 @@ public:
     void onThread(std::function<void()> task) { writer_->onThread(std::move(task)); }
 
     void setLimits(StoreLimits limits) { writer_->setLimits(limits); }
+    // Whether the owner agrees, from now on, that rows may leave the machine: noted in
+    // the file, see StoreFacts.
+    void setConsent(bool given) { writer_->setConsent(given); }
     StoreStatus status() const { return writer_->status(); }
 
     // Writes what is waiting, moves the write-ahead log into the file and closes

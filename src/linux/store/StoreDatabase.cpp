@@ -405,8 +405,8 @@ void StoreDatabase::rollback() {
     groupUploads_.clear();
 }
 
-Result<std::uint64_t, StoreFailure> StoreDatabase::purge() {
-    auto purged = storePurge(database_, firstUpload_);
+Result<std::uint64_t, StoreFailure> StoreDatabase::purge(double now) {
+    auto purged = storePurge(database_, firstUpload_, now);
     logPages_ = triedLogPages_ = purged.ok() ? 0 : logPages_;
     const StoreResult counted = readPageCounts();
     return counted.ok() ? purged : counted.failure();

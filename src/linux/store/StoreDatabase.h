@@ -80,7 +80,7 @@ public:
 
     // How many rows went; open sessions of this run keep theirs, empty. No bytes of
     // rows are left in file or log when it succeeded. Requires no begin().
-    Result<std::uint64_t, StoreFailure> purge();
+    Result<std::uint64_t, StoreFailure> purge(double now);
 
     // Bounds the write-ahead log, which cannot be reused while a reader stays in
     // one transaction. SQLITE_BUSY when a reader keeps more of it than `maxBytes`.

@@ -4,6 +4,7 @@
 #include <string>
 
 #include "linux/store/Schema.h"
+#include "linux/store/StoreFacts.h"
 
 namespace halyard::linux_ {
 namespace {
@@ -12,20 +13,19 @@ class Purge {
 public:
     explicit Purge(sqlite3* database) : database_(database) {}
 
+    template <class Step> void step(Step&& step) { code_ = code_ == SQLITE_OK ? step() : code_; }
     void execute(const std::string& sql) {
-        if (code_ == SQLITE_OK) {
-            code_ = sqlite3_exec(database_, sql.c_str(), nullptr, nullptr, nullptr);
-        }
+        step([&] { return sqlite3_exec(database_, sql.c_str(), nullptr, nullptr, nullptr); });
     }
     void remove(const StoreTableSchema& table, const std::string& which) {
         execute(fmt::format("DELETE FROM {}{}", table.name, which));
         rows_ += code_ == SQLITE_OK ? static_cast<std::uint64_t>(sqlite3_changes64(database_)) : 0;
     }
     void checkpoint() {
-        if (code_ == SQLITE_OK) {
-            code_ = sqlite3_wal_checkpoint_v2(database_, nullptr, SQLITE_CHECKPOINT_TRUNCATE,
-                                              nullptr, nullptr);
-        }
+        step([&] {
+            return sqlite3_wal_checkpoint_v2(database_, nullptr, SQLITE_CHECKPOINT_TRUNCATE,
+                                             nullptr, nullptr);
+        });
     }
     Result<std::uint64_t, StoreFailure> result() {
         if (code_ == SQLITE_OK) {
@@ -48,7 +48,8 @@ private:
 
 } // namespace
 
-Result<std::uint64_t, StoreFailure> storePurge(sqlite3* database, std::int64_t firstOpen) {
+Result<std::uint64_t, StoreFailure> storePurge(sqlite3* database, std::int64_t firstOpen,
+                                               double now) {
     const std::string open = fmt::format("id >= {} AND closed IS NULL", firstOpen);
     Purge purge(database);
     purge.execute("BEGIN IMMEDIATE");
@@ -57,6 +58,7 @@ Result<std::uint64_t, StoreFailure> storePurge(sqlite3* database, std::int64_t f
         purge.remove(table, ofSessions ? fmt::format(" WHERE NOT ({})", open) : "");
     }
     purge.execute("UPDATE upload_session SET session_info = '{}', user_info = '{}'");
+    purge.step([&] { return storeRenewFacts(database, now); });
     purge.execute("COMMIT");
     purge.execute("VACUUM");
     purge.checkpoint();

@@ -18,6 +18,9 @@ namespace halyard::linux_ {
 // without what it told; they do not count. Requires no open transaction and no statement
 // under way. SQLITE_BUSY when a reader keeps what was deleted alive: the rows are gone
 // for everybody else then, and the next purge has less to do.
-Result<std::uint64_t, StoreFailure> storePurge(sqlite3* database, std::int64_t firstOpen);
+// The identity goes as well: what comes is another store's, whose owner agrees or not as
+// of `now`.
+Result<std::uint64_t, StoreFailure> storePurge(sqlite3* database, std::int64_t firstOpen,
+                                               double now);
 
 } // namespace halyard::linux_

@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "linux/store/Schema.h"
+#include "linux/store/StoreFacts.h"
 
 // How rows are saved.
 //
@@ -270,6 +271,7 @@ int carryTables(sqlite3* from, sqlite3* fresh, SalvageTime time, StoreSalvage& r
     for (const StoreTableSchema& table : kStoreSchema) {
         code = code == SQLITE_OK ? TableCarrier(table, verb, from, fresh, result).run() : code;
     }
+    code = code == SQLITE_OK ? storeCarryFacts(from, fresh) : code;
     code = code == SQLITE_OK ? run(fresh, kSayHowEnded) : code;
     if (sqlite3_get_autocommit(fresh) == 0) {
         const int committed = run(fresh, "COMMIT");

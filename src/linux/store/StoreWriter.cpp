@@ -93,8 +93,8 @@ StoreWriter::StoreWriter(const StoreOptions& options, const platform::Clock& clo
     : options_(options), clock_(clock), queue_(std::move(queue)),
       database_({options_.path, options_.busyTimeout, options_.vfs}),
       retention_(platform::secondsSince1970(clock.wallTime())),
-      keeper_(options_, clock, database_, retention_), age_(clock), onWork_(std::move(onWork)),
-      limits_(options_.limits) {}
+      keeper_(options_, clock, database_, retention_), age_(clock), facts_(clock),
+      onWork_(std::move(onWork)), limits_(options_.limits) {}
 
 bool StoreWriter::open() {
     const StoreResult opened = keeper_.open();
@@ -152,7 +152,8 @@ void StoreWriter::run() {
 // Without rows there is nothing to do but to let old ones go, and that may wait: a
 // machine that sleeps is not woken for it.
 std::chrono::nanoseconds StoreWriter::idleDelay() const {
-    if (trimMore_ || !database_.isOpen() || database_.hasLostLog()) {
+    if (trimMore_ || !database_.isOpen() || database_.hasLostLog() ||
+        facts_.isDue(database_.generation())) {
         return trimMore_ ? std::chrono::nanoseconds(0) : options_.lastRetry;
     }
     const auto idle =
@@ -208,7 +209,8 @@ void StoreWriter::writeGroup(std::span<StoreItem> group) {
 
 void StoreWriter::maintain() {
     if (!limitsChanged_.load() && !trimMore_ && !isAgeDue() && database_.isOpen() &&
-        !database_.hasMoved() && !database_.hasLostLog() && !keeper_.isRereadingDue()) {
+        !database_.hasMoved() && !database_.hasLostLog() && !keeper_.isRereadingDue() &&
+        !facts_.isDue(database_.generation())) {
         return;
     }
     trimMore_ = false;
@@ -270,10 +272,10 @@ Result<std::uint64_t, StoreFailure> StoreWriter::purgeRows() {
     if (const StoreResult open = keeper_.reopenIfNeeded(); !open.ok()) {
         return open.failure();
     }
-    auto purged = database_.purge();
+    auto purged = purgeOnce();
     if (!purged.ok() && purged.failure().isDamage()) {
         const StoreResult recovered = keeper_.recover(purged.failure());
-        return recovered.ok() ? database_.purge() : recovered.failure();
+        return recovered.ok() ? purgeOnce() : recovered.failure();
     }
     return purged;
 }
@@ -283,6 +285,17 @@ void StoreWriter::beginWork() {
     if (onWork_) {
         onWork_();
     }
+}
+
+// What waits to be noted is older than what the purge notes.
+Result<std::uint64_t, StoreFailure> StoreWriter::purgeOnce() {
+    const double now = platform::secondsSince1970(clock_.wallTime());
+    if (facts_.isDue(database_.generation())) {
+        if (const StoreResult written = writeRows({}); !written.ok()) {
+            return written.failure();
+        }
+    }
+    return database_.purge(now);
 }
 
 StoreResult StoreWriter::attempt(std::span<StoreItem> group) {
@@ -315,6 +328,12 @@ StoreResult StoreWriter::tryOnce(std::span<StoreItem> group) {
     return result;
 }
 
+StoreResult StoreWriter::writeFacts() {
+    return facts_.isDue(database_.generation())
+               ? database_.resultOf(facts_.write(database_.handle()))
+               : StoreResult();
+}
+
 StoreResult StoreWriter::writeRows(std::span<StoreItem> group) {
     const bool ageDue = limitsChanged_.exchange(false) || isAgeDue();
     const StoreLimits bounds = limits();
@@ -326,7 +345,8 @@ StoreResult StoreWriter::writeRows(std::span<StoreItem> group) {
     if (!result.ok()) {
         return result;
     }
-    result = insertAll(group);
+    result = writeFacts();
+    result = result.ok() ? insertAll(group) : result;
     result = result.ok() ? trim(bounds, ageDue, more) : result;
     if (!result.ok()) {
         database_.rollback();
@@ -336,6 +356,7 @@ StoreResult StoreWriter::writeRows(std::span<StoreItem> group) {
     result = database_.commit();
     commitTime_ = clock_.steadyTime() - began;
     if (result.ok()) {
+        facts_.noteCommitted(database_.generation());
         trimMore_ = more;
         noteRemoved();
         if (ageDue) {
@@ -472,6 +493,11 @@ void StoreWriter::setLimits(StoreLimits limits) {
     }
     queue_->setWindow(storeWindow(options_, limits));
     limitsChanged_ = true;
+    queue_->wake();
+}
+
+void StoreWriter::setConsent(bool given) {
+    facts_.setConsent(given);
     queue_->wake();
 }
 

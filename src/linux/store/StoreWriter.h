@@ -16,6 +16,7 @@
 #include "common/Mutex.h"
 #include "linux/store/StoreAge.h"
 #include "linux/store/StoreDatabase.h"
+#include "linux/store/StoreFacts.h"
 #include "linux/store/StoreKeeper.h"
 #include "linux/store/StoreLimits.h"
 #include "linux/store/StoreOptions.h"
@@ -72,6 +73,7 @@ public:
     void onThread(std::function<void()> task) HY_EXCLUDES(mutex_);
 
     void setLimits(StoreLimits limits) HY_EXCLUDES(mutex_);
+    void setConsent(bool given);
     StoreStatus status() const HY_EXCLUDES(mutex_);
 
 private:
@@ -89,10 +91,12 @@ private:
     void purgeIfAsked() HY_EXCLUDES(mutex_);
     void runTasks() HY_EXCLUDES(mutex_);
     Result<std::uint64_t, StoreFailure> purgeRows();
+    Result<std::uint64_t, StoreFailure> purgeOnce();
     StoreResult attempt(std::span<StoreItem> group);
     StoreResult tryOnce(std::span<StoreItem> group);
     void beginWork();
     StoreResult writeRows(std::span<StoreItem> group);
+    StoreResult writeFacts();
     StoreResult insertAll(std::span<StoreItem> group);
     StoreResult trim(const StoreLimits& bounds, bool ageDue, bool& more);
     void buildPayload(StoreRow& row);
@@ -113,6 +117,7 @@ private:
     StoreRetention retention_;
     StoreKeeper keeper_;
     StoreAge age_;
+    StoreFacts facts_;
     const std::function<void()> onWork_;
     std::vector<StoreItem> taken_;
     std::vector<StoreTable> rejected_; // rows of the running attempt

@@ -211,7 +211,7 @@ Outcome<std::uint64_t> purgeStore(const fs::path& path) {
     Result<std::uint64_t, StoreFailure> purged = std::uint64_t{0};
     if (done.ok()) {
         // It takes no session for open that was there before it.
-        purged = database.purge();
+        purged = database.purge(platform::secondsSince1970(std::chrono::system_clock::now()));
         database.close();
         done = purged.ok() ? done : purged.failure();
     }
