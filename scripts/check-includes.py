@@ -56,8 +56,9 @@ TEST_EXTRA = {"testing"}
 PROGRAMS = {
     "tools": set(),  # clients of the daemon like anybody's
     # Reads the store with the room that owns its schema, asks the daemon what libhalyard
-    # has no call for, and looks where the daemon has its directories.
-    "tools/halyardctl": {"common", "protocol", "linux/store", "linux/system"},
+    # has no call for, looks where the daemon has its directories, and reads its configuration
+    # with the daemon's own reader, so that the two cannot disagree about what is in force.
+    "tools/halyardctl": {"common", "protocol", "linux/store", "linux/system", "linux/config"},
     "tests": set(),  # strangers
     "benchmarks": BASE | {"session", "linux/system", "linux/store", "linux/drivers", "testing"},
     "benchmarks/load": {"common", "protocol", "testing"},  # the whole daemon from outside
@@ -237,7 +238,8 @@ ALLOWED = {
     "fuzz/a_fuzz.cpp": '#include "Require.h"\n#include "linux/config/Settings.h"\n',
     "tests/a/A.cpp": '#include "Sound.h"\n#include <halyard/halyard.h>\n',
     "src/client/a_test.c": "#include <halyard/halyard.h>\n",
-    "tools/halyardctl/A.cpp": '#include "linux/store/Schema.h"\n#include "protocol/Wire.h"\n',
+    "tools/halyardctl/A.cpp": '#include "linux/store/Schema.h"\n#include "protocol/Wire.h"\n'
+                              '#include "linux/config/SettingsFiles.h"\n',
     "tools/ctl/ATesting.cpp": '#include "ATesting.h"\n#include "testing/Tree.h"\n',
     "tools/ctl/A_test.cpp": '#include "protocol/Wire.h"\n#include "testing/FakeDaemon.h"\n',
 }

@@ -31,6 +31,14 @@ std::optional<Watched> watchedKind(const std::string& name) {
                                  : std::nullopt;
 }
 
+// None for any other word.
+std::optional<ConsentAction> consentAction(const std::string& name) {
+    return name == "give"       ? std::optional(ConsentAction::Give)
+           : name == "withdraw" ? std::optional(ConsentAction::Withdraw)
+           : name == "show"     ? std::optional(ConsentAction::Show)
+                                : std::nullopt;
+}
+
 // An option whose value goes by a printed name or by its number.
 template <class Number>
 CLI::Option* takeNumber(CLI::App* command, const char* name, Number& number,
@@ -62,6 +70,7 @@ private:
     void addLists();
     // Commands about files.
     void addFiles();
+    void addConsent();
     void addReport();
     void addWatch();
     // Commands about the store as a whole.
@@ -76,6 +85,7 @@ private:
     std::string by_;
     std::string file_;
     std::string watched_ = "messages";
+    std::string consent_;
     bool repair_ = false;
     SendOptions send_{};
     SessionOptions session_{};
@@ -95,6 +105,7 @@ CommandLine::CommandLine(Context& context) : context_(context) {
     addSenders();
     addFiles();
     addCare();
+    addConsent();
     addReport();
 }
 
@@ -185,6 +196,22 @@ void CommandLine::addCare() {
         ->add_flag("--repair", repair_,
                    "Set a damaged store aside and save what can be read; without a daemon only");
     add("purge", "Removes everything that was collected", [this] { return runPurge(context_); });
+}
+
+void CommandLine::addConsent() {
+    CLI::App* const consent =
+        add("consent", "Whether what is collected may leave the machine",
+            [this] { return runConsent(context_, *consentAction(consent_)); });
+    consent->add_option("ACTION", consent_, "give, withdraw or show")
+        ->type_name("")
+        ->required()
+        ->check([](const std::string& name) {
+            return consentAction(name) ? "" : "give, withdraw or show";
+        });
+    consent
+        ->add_option("--config", context_.configurationOption,
+                     "The daemon's configuration directory")
+        ->type_name("DIR");
 }
 
 void CommandLine::addReport() {

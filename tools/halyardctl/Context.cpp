@@ -37,6 +37,20 @@ Outcome<fs::path> Context::socketPath() const {
     return directory.ok() ? Outcome<fs::path>(directory.value() / "reporting.sock") : directory;
 }
 
+Outcome<fs::path> Context::configurationDirectory() const {
+    using linux_::Directories;
+    if (configurationOption) {
+        return fs::path(*configurationOption);
+    }
+    const auto unset = [](std::string_view) { return std::optional<std::string>(); };
+    const auto system = linux_::resolveDirectories(unset, 0);
+    if (stateOption && system.ok() &&
+        fs::path(*stateOption).lexically_normal() == system.value().state) {
+        return system.value().configuration;
+    }
+    return ofThisUser(&Directories::configuration, "--config");
+}
+
 Outcome<fs::path> Context::storePath() const {
     auto directory = stateDirectory();
     return directory.ok() ? Outcome<fs::path>(directory.value() / reading::StoreReader::kFileName)

@@ -24,13 +24,17 @@ struct Context {
     double now = 0; // seconds since 1970
     std::optional<std::string> stateOption{};
     std::optional<std::string> socketOption{};
+    std::optional<std::string> configurationOption{};
     bool json = false;
     reading::TimeRange range{};
     std::string applicationPattern{}; // empty: all
 
-    // As --state and --socket say, or where the daemon of this user would have them.
+    // As --state, --socket and --config say, or where the daemon of this user would have
+    // them.
     Outcome<std::filesystem::path> stateDirectory() const;
     Outcome<std::filesystem::path> socketPath() const;
+    // That of the system's daemon where --state names its state directory.
+    Outcome<std::filesystem::path> configurationDirectory() const;
     Outcome<std::filesystem::path> storePath() const;
     Outcome<reading::StoreReader> openStore() const;
 

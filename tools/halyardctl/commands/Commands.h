@@ -41,6 +41,9 @@ struct SessionOptions {
 };
 Exit runSession(Context& context, const SessionOptions& options);
 
+enum class ConsentAction : std::uint8_t { Give, Withdraw, Show };
+Exit runConsent(Context& context, ConsentAction action);
+
 Exit runCheck(Context& context, bool repair);
 Exit runPurge(Context& context);
 // Into `file`.
