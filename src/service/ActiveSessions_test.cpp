@@ -51,6 +51,8 @@ TEST_F(ActiveSessionsTest, TheLimitIsTheOperators) {
     peer.createAndStart(2);
     EXPECT_TRUE(session(1)->relayReportingEnabled());
     EXPECT_FALSE(session(2)->relayReportingEnabled());
+    EXPECT_EQ(service_->status()["sessions_not_uploaded"], Value(1));
+    EXPECT_EQ(service_->status()["upload_limit"], Value(1));
 }
 
 TEST_F(ActiveSessionsTest, OneLineAnEpisodeTellsThatUploadsAreWithheld) {

@@ -270,6 +270,7 @@ bool HYReportingServiceDelegate::isStopWaiting() const {
 Dictionary HYReportingServiceDelegate::status() const {
     std::int64_t sessions = 0;
     std::int64_t started = 0;
+    std::int64_t notUploaded = 0;
     std::uint64_t repeats = repeatsOfRetiredSessions_.load();
     List waiting;
     const auto now = platform::current().clock->steadyTime();
@@ -278,6 +279,7 @@ Dictionary HYReportingServiceDelegate::status() const {
         for (const Session& session : sessionsOf(*client)) {
             ++sessions;
             started += session->started() ? 1 : 0;
+            notUploaded += session->started() && !session->relayReportingEnabled() ? 1 : 0;
             repeats += session->redundantMessages();
             if (const auto since = session->stopWaitsSince()) {
                 waiting.append(
@@ -287,10 +289,14 @@ Dictionary HYReportingServiceDelegate::status() const {
             }
         }
     }
-    return Dictionary{
-        {"connections", clients.size()}, {"sessions", sessions},
-        {"sessions_started", started},   {"active_session_count", activeSessionCount_.load()},
-        {"stops_waiting", waiting},      {"repeats_dropped", repeats}};
+    return Dictionary{{"connections", clients.size()},
+                      {"sessions", sessions},
+                      {"sessions_started", started},
+                      {"active_session_count", activeSessionCount_.load()},
+                      {"sessions_not_uploaded", notUploaded},
+                      {"upload_limit", platform::current().sessionRules.uploadLimit()},
+                      {"stops_waiting", waiting},
+                      {"repeats_dropped", repeats}};
 }
 
 } // namespace halyard

@@ -193,6 +193,8 @@ TEST_F(RequestDispatchTest, TheStatusJoinsTheAdaptersCountersAndTheServices) {
                                                {"sessions", 2},
                                                {"sessions_started", 1},
                                                {"active_session_count", 1},
+                                               {"sessions_not_uploaded", 0},
+                                               {"upload_limit", 5},
                                                {"stops_waiting", List()},
                                                {"repeats_dropped", 1}}));
 }

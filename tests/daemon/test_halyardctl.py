@@ -261,6 +261,17 @@ class Asking(CtlTest):
                       "\n".join(" ".join(line.split()).replace(" ", "  ", 1)
                                 for line in shown.stdout.splitlines()) + "\n")
 
+    def test_status_begins_with_what_became_of_the_messages(self):
+        client = self.connect()
+        client.session(1)
+        client.result("sendMessage", {"n": 1}, 4, 1, [1])
+        client.result("sendMessage", {"n": 1}, 4, 1, [1])
+        self.flush()
+        self.assertEqual(self.ctl("status").stdout.splitlines()[:3], [
+            "Messages since the daemon started",
+            "  offered 2 of 2 requests, made by the daemon 0",
+            "  stored 1, repeats 1, waiting 0"])
+
 
 class OnATerminal(CtlTest):
     def shown(self, *arguments, **variables):

@@ -1,5 +1,6 @@
 // What the daemon says of itself.
 #include "commands/Commands.h"
+#include "commands/MessageSheet.h"
 
 #include "common/Description.h"
 #include "daemon/DaemonClient.h"
@@ -49,6 +50,11 @@ Exit runStatus(Context& context) {
         json.value(status.value());
         json.endDocument();
     } else {
+        const auto sheet = messageSheet(status.value().dictionary());
+        for (const std::string& line : sheet) {
+            context.terminal.write(line + "\n");
+        }
+        context.terminal.write(sheet.empty() ? "" : "\n");
         Table table(context.terminal, {{"KEY"}, {"VALUE", Align::Left, true}});
         addAll(table, "", status.value().dictionary());
         table.finish("The daemon says nothing of itself.");
