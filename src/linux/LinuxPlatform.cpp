@@ -9,6 +9,7 @@
 #include <unistd.h>
 #include <utility>
 
+#include "common/Json.h"
 #include "linux/queues/BlockingSection.h"
 #include "linux/system/CollectedFiles.h"
 #include "linux/system/PrivateFiles.h"
@@ -326,7 +327,7 @@ void LinuxPlatform::logAccounts() const {
     const StoreStatus store = store_->store.status();
     Dictionary sheet = platform_.messageAccounts.describe(settledMessages(store));
     sheet.set("lost", sum(store.lost[static_cast<std::size_t>(StoreTable::UploadMessage)]));
-    HY_LOG_DEFAULT(HYReportingPlatformCategory, "messages since the start: {}", Value(sheet));
+    HY_LOG_DEFAULT(HYReportingPlatformCategory, "messages since the start: {}", toJson(sheet));
 }
 
 void LinuxPlatform::flush(std::function<void()> done) {

@@ -1,5 +1,6 @@
 """The sheet of messages in admin.status: it adds up, at rest and at work."""
 
+import json
 import os
 import re
 import socket
@@ -269,7 +270,7 @@ class TheEnd(DaemonTest):
 
     def last_sheet(self):
         [sheet] = re.findall("messages since the start: (.*)", self.daemon.log())
-        return {key: int(value) for key, value in re.findall(r"(\w+) = (\d+)", sheet)}
+        return json.loads(sheet)
 
     def test_sigterm_leaves_nothing_behind_that_writers_had_written(self):
         writers = [self.writer(reporter_id, wants_answers=reporter_id == 4)
