@@ -4,7 +4,6 @@
 #include <fmt/format.h>
 #include <fstream>
 #include <string_view>
-#include <sys/stat.h>
 #include <unistd.h>
 #include <utility>
 
@@ -49,8 +48,6 @@ constexpr const char* kConfiguration = "PRAGMA page_size = 8192;"
                                        "PRAGMA secure_delete = OFF;"
                                        "PRAGMA trusted_schema = OFF;"
                                        "PRAGMA temp_store = MEMORY;";
-
-constexpr std::array<const char*, 2> kCompanionNames = {"-wal", "-shm"};
 
 constexpr std::size_t kVersionOffset = 60; // of user_version in a database file
 constexpr std::size_t kHeaderBytes = 64;
@@ -306,44 +303,6 @@ StoreFailure StoreDatabase::failureOf(int code) const {
     return {{static_cast<std::errc>(system), std::move(text)}, code};
 }
 
-bool StoreDatabase::hasMoved() {
-    int moved = 0;
-    return database_ != nullptr &&
-           sqlite3_file_control(database_, "main", SQLITE_FCNTL_HAS_MOVED, &moved) == SQLITE_OK &&
-           moved != 0;
-}
-
-StoreDatabase::Companions StoreDatabase::companionsAtPath() const {
-    Companions found{};
-    for (std::size_t i = 0; i < found.size(); ++i) {
-        struct stat status {};
-        if (::stat((settings_.path.string() + kCompanionNames[i]).c_str(), &status) == 0) {
-            found[i] = {status.st_dev, status.st_ino};
-        }
-    }
-    return found;
-}
-
-bool StoreDatabase::hasLostLog() const {
-    return database_ != nullptr && companionsAtPath() != companions_;
-}
-
-// What lies at the log's path by then is none that this file may be given back: its
-// pages are older than those that have just been moved.
-StoreResult StoreDatabase::saveLostLog() {
-    const int code =
-        sqlite3_wal_checkpoint_v2(database_, nullptr, SQLITE_CHECKPOINT_FULL, nullptr, nullptr);
-    if (code != SQLITE_OK) {
-        return failureOf(code);
-    }
-    abandon();
-    for (const char* const name : kCompanionNames) {
-        std::error_code absent;
-        fs::remove(settings_.path.string() + name, absent);
-    }
-    return {};
-}
-
 void StoreDatabase::leaveRoom() {
     for (std::int64_t& id : nextID_) {
         id += kRoomForUnread;
@@ -410,30 +369,6 @@ Result<std::uint64_t, StoreFailure> StoreDatabase::purge(double now) {
     logPages_ = triedLogPages_ = purged.ok() ? 0 : logPages_;
     const StoreResult counted = readPageCounts();
     return counted.ok() ? purged : counted.failure();
-}
-
-StoreResult StoreDatabase::boundLog(std::uint64_t maxBytes, std::uint64_t checkpointBytes) {
-    const std::uint64_t step = checkpointBytes / pageSize_;
-    if (logPages_ < step || logPages_ < triedLogPages_ + step / 4) {
-        return {};
-    }
-    const bool tooLong = logBytes() > maxBytes;
-    const int mode = tooLong ? SQLITE_CHECKPOINT_TRUNCATE : SQLITE_CHECKPOINT_PASSIVE;
-    int logged = 0;
-    int moved = 0;
-    const int code = sqlite3_wal_checkpoint_v2(database_, nullptr, mode, &logged, &moved);
-    if (tooLong) {
-        if (code == SQLITE_OK) {
-            logPages_ = triedLogPages_ = 0;
-        }
-        return resultOf(code);
-    }
-    // Once all of it has moved, the next commit begins the log anew.
-    triedLogPages_ = code == SQLITE_OK && logged == moved ? 0 : logPages_;
-    if (triedLogPages_ == 0) {
-        logPages_ = 0;
-    }
-    return resultOf(code == SQLITE_BUSY ? SQLITE_OK : code);
 }
 
 } // namespace halyard::linux_

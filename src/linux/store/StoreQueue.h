@@ -21,36 +21,10 @@
 #include <vector>
 
 #include "common/Mutex.h"
+#include "linux/store/StoreLosses.h"
 #include "linux/store/StoreRow.h"
 
 namespace halyard::linux_ {
-
-// Why a row was not stored.
-enum class StoreLoss : std::uint8_t {
-    NoStore,  // There was none since the start.
-    DiskFull, // Or over quota.
-    ReadOnly,
-    Locked, // By another process that would not let go.
-    IoError,
-    Stuck,    // An operation of the file system did not come back.
-    Rejected, // The row itself: too big for the database, say.
-};
-inline constexpr std::size_t kStoreLosses = 7;
-// In the order of StoreLoss.
-struct StoreLossName {
-    std::string_view inStatus;
-    std::string_view inLog;
-};
-inline constexpr std::array<StoreLossName, kStoreLosses> kStoreLossNames = {
-    {{"no_store", "no store"},
-     {"disk_full", "disk full"},
-     {"read_only", "read-only"},
-     {"locked", "locked by another process"},
-     {"io_error", "input/output error"},
-     {"stuck", "the file system does not answer"},
-     {"rejected", "rejected"}}};
-using StoreLosses = std::array<std::uint64_t, kStoreLosses>;
-using StoreLossesByTable = std::array<StoreLosses, kStoreTables>;
 
 class StoreQueue {
 public:

@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <fmt/format.h>
-#include <numeric>
 #include <utility>
 
 #include "platform/Log.h"
@@ -20,8 +19,9 @@
 //   one line when it begins, one when it ends.
 // - The file is gone or another one: it is opened, or made, anew, and the group goes
 //   there. Sessions that had a row in the old file get one in the new.
-// - The file is damaged: it is set aside, its rows are carried over, and the group is
-//   written to the new one in the same attempt. A second failure is an ordinary one.
+// - The file looks damaged: the keeper looks again, and if need be sets it aside and
+//   carries its rows over; the group is written to whatever is open then, in the same
+//   attempt. What cannot be read is an ordinary failure.
 // - An operation does not come back: this thread cannot tell, so the watch begins the
 //   episode, which lets the clients go. The attempt's own end ends it. The end may
 //   slip in between the watch's look and its episode, which nobody would end then;
@@ -45,25 +45,6 @@ constexpr std::chrono::milliseconds kSlowCommit{20};
 // the size of the store.
 constexpr std::uint64_t kLogAllowance = 16 * 1024 * 1024;
 
-std::string_view nameOf(StoreLoss reason) {
-    return kStoreLossNames[static_cast<std::size_t>(reason)].inLog;
-}
-
-bool concernsOneRow(const StoreFailure& failure) {
-    const int primary = failure.primary();
-    return primary == SQLITE_TOOBIG || primary == SQLITE_CONSTRAINT || primary == SQLITE_MISMATCH;
-}
-
-StoreLoss lossOf(const StoreFailure& failure) {
-    if (failure.isLock()) {
-        return StoreLoss::Locked;
-    }
-    if (failure.isWantOfSpace()) {
-        return StoreLoss::DiskFull;
-    }
-    return failure.isReadOnly() ? StoreLoss::ReadOnly : StoreLoss::IoError;
-}
-
 } // namespace
 
 // While rows wait as long as the operator asks, they must not hold anybody back: a group
@@ -74,18 +55,6 @@ StoreQueue::Window storeWindow(const StoreOptions& options, const StoreLimits& l
     }
     return {limits.syncInterval, std::max(options.groupRows, options.patientRows),
             options.marks.lowBytes};
-}
-
-std::uint64_t sum(const StoreLosses& losses) {
-    return std::accumulate(losses.begin(), losses.end(), std::uint64_t{0});
-}
-
-std::uint64_t sum(const StoreLossesByTable& losses) {
-    std::uint64_t all = 0;
-    for (const StoreLosses& each : losses) {
-        all += sum(each);
-    }
-    return all;
 }
 
 StoreWriter::StoreWriter(const StoreOptions& options, const platform::Clock& clock,
@@ -124,11 +93,6 @@ void StoreWriter::closeDatabase() {
     } else {
         database_.close();
     }
-}
-
-void StoreWriter::tellUnwritten() const {
-    HY_LOG_ERROR(HYReportingPlatformCategory, "closing {}, {} rows lost: {}",
-                 options_.path.string(), queue_->levels().unwritten, nameOf(StoreLoss::Stuck));
 }
 
 void StoreWriter::run() {
@@ -406,84 +370,8 @@ void StoreWriter::buildPayload(StoreRow& row) {
     }
 }
 
-void StoreWriter::noteSizes() {
-    const MutexLock lock(mutex_);
-    status_.fileBytes = database_.fileBytes();
-    status_.logBytes = database_.logBytes();
-}
-
-void StoreWriter::noteRemoved() {
-    const MutexLock lock(mutex_);
-    for (std::size_t i = 0; i < kStoreTables; ++i) {
-        status_.removed[i] += retention_.removed()[i];
-    }
-}
-
-void StoreWriter::settle(std::span<StoreItem> group) {
-    {
-        const MutexLock lock(mutex_);
-        ++status_.commits;
-        for (std::size_t i = 0; i < kStoreTables; ++i) {
-            status_.rows[i] += database_.committedRows()[i];
-        }
-    }
-    for (const StoreTable table : rejected_) {
-        queue_->countLost(StoreLoss::Rejected, table);
-    }
-    if (!rejected_.empty()) {
-        HY_LOG_ERROR(HYReportingPlatformCategory, "the store rejected {} rows: {}",
-                     rejected_.size(), rejection_);
-    }
-    queue_->settle(group);
-}
-
-void StoreWriter::giveUp(std::span<StoreItem> group, StoreLoss reason) {
-    for (const StoreItem& item : group) {
-        if (!std::holds_alternative<StoreCloseRow>(item.row)) {
-            queue_->countLost(reason, tableOf(item.row));
-        }
-    }
-    queue_->settle(group);
-}
-
 bool StoreWriter::isAgeDue() const {
     return clock_.steadyTime() - agedAt_ >= options_.agePeriod;
-}
-
-void StoreWriter::beginEpisode(StoreLoss reason, const std::string& text) {
-    bool first = false;
-    {
-        const MutexLock lock(mutex_);
-        first = !episode_;
-        if (first) {
-            episode_ = Episode{reason, clock_.steadyTime(), sum(queue_->levels().lost)};
-        }
-        episode_->reason = reason;
-        status_.failing = true;
-    }
-    queue_->setFailing(reason);
-    if (first) {
-        HY_LOG_ERROR(HYReportingPlatformCategory, "cannot write to {}, trying on: {}: {}",
-                     options_.path.string(), nameOf(reason), text);
-    }
-}
-
-void StoreWriter::endEpisode() {
-    std::optional<Episode> ended;
-    {
-        const MutexLock lock(mutex_);
-        ended = std::exchange(episode_, std::nullopt);
-        status_.failing = false;
-    }
-    if (!ended) {
-        return;
-    }
-    queue_->setFailing(std::nullopt);
-    const auto seconds =
-        std::chrono::duration_cast<std::chrono::seconds>(clock_.steadyTime() - ended->began);
-    HY_LOG_DEFAULT(HYReportingPlatformCategory, "writing to {} again after {} s, {} rows lost",
-                   options_.path.string(), seconds.count(),
-                   sum(queue_->levels().lost) - ended->lostBefore);
 }
 
 void StoreWriter::setLimits(StoreLimits limits) {
@@ -504,17 +392,6 @@ void StoreWriter::setConsent(bool given) {
 StoreLimits StoreWriter::limits() const {
     const MutexLock lock(mutex_);
     return limits_;
-}
-
-StoreStatus StoreWriter::status() const {
-    const StoreQueue::Levels levels = queue_->levels();
-    const MutexLock lock(mutex_);
-    StoreStatus status = status_;
-    status.queuedRows = levels.rows;
-    status.queuedBytes = levels.bytes;
-    status.lost = levels.lost;
-    status.oldestWaiting = std::chrono::duration<double>(levels.oldest).count();
-    return status;
 }
 
 } // namespace halyard::linux_

@@ -30,9 +30,6 @@ namespace halyard::linux_ {
 inline constexpr std::chrono::milliseconds kPromptInterval{500};
 StoreQueue::Window storeWindow(const StoreOptions& options, const StoreLimits& limits);
 
-std::uint64_t sum(const StoreLosses& losses);
-std::uint64_t sum(const StoreLossesByTable& losses);
-
 struct StoreStatus {
     bool open = false;
     bool failing = false;
