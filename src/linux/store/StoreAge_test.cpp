@@ -27,7 +27,7 @@ protected:
     static double daysOf(double count) { return count * 86400; }
 
     StoreLimits limits_;
-    StoreDatabase database_{{options_.path, 0ms, nullptr}};
+    StoreDatabase database_{{.path = options_.path, .busyTimeout = 0ms}};
     StoreAge age_{clock_};
 };
 

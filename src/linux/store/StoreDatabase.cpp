@@ -38,12 +38,9 @@ constexpr const char* kCloseInterrupted =
     "UPDATE upload_session SET ended = 'interrupted', closed = coalesce((SELECT time FROM last "
     "WHERE upload_session = upload_session.id), opened) WHERE closed IS NULL";
 
-// The size of pages counts for new files only. Twice SQLite's saves a good part of
-// the writes to log and file, and the least commit is still small.
 // Space that deleted rows leave is not overwritten (it costs writes), and the
 // file can be given back to the system page by page.
-constexpr const char* kConfiguration = "PRAGMA page_size = 8192;"
-                                       "PRAGMA auto_vacuum = INCREMENTAL;"
+constexpr const char* kConfiguration = "PRAGMA auto_vacuum = INCREMENTAL;"
                                        "PRAGMA synchronous = FULL;"
                                        "PRAGMA secure_delete = OFF;"
                                        "PRAGMA trusted_schema = OFF;"
@@ -141,7 +138,8 @@ StoreResult StoreDatabase::openFile() {
 }
 
 StoreResult StoreDatabase::configure() {
-    if (StoreResult done = execute(kConfiguration); !done.ok()) {
+    const std::string pages = fmt::format("PRAGMA page_size = {};", settings_.pageBytes);
+    if (StoreResult done = execute(pages + kConfiguration); !done.ok()) {
         return done;
     }
     StoreStatement mode;

@@ -25,6 +25,8 @@ struct StoreOptions {
     // written to more seldom than kPromptInterval.
     std::size_t groupRows = 1024;
     std::size_t patientRows = 6144;
+    // Few rows at a time write less with smaller pages. Of a new file.
+    int patientPageBytes = 4096;
     std::chrono::milliseconds busyTimeout{1000};
     std::chrono::nanoseconds firstRetry = std::chrono::milliseconds(100);
     std::chrono::nanoseconds lastRetry = std::chrono::seconds(5);

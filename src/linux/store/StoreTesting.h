@@ -61,6 +61,7 @@ protected:
         // Only a full group or a flush commits.
         options_.limits.syncInterval = std::chrono::hours(1);
         options_.patientRows = 0;
+        options_.patientPageBytes = StoreDatabase::kPageBytes;
         options_.busyTimeout = std::chrono::milliseconds(0);
         options_.firstRetry = std::chrono::milliseconds(1);
         options_.lastRetry = std::chrono::milliseconds(1);

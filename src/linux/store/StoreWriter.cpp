@@ -45,6 +45,11 @@ constexpr std::chrono::milliseconds kSlowCommit{20};
 // the size of the store.
 constexpr std::uint64_t kLogAllowance = 16 * 1024 * 1024;
 
+int pageBytes(const StoreOptions& options) {
+    return options.limits.syncInterval > kPromptInterval ? options.patientPageBytes
+                                                         : StoreDatabase::kPageBytes;
+}
+
 } // namespace
 
 // While rows wait as long as the operator asks, they must not hold anybody back: a group
@@ -60,7 +65,7 @@ StoreQueue::Window storeWindow(const StoreOptions& options, const StoreLimits& l
 StoreWriter::StoreWriter(const StoreOptions& options, const platform::Clock& clock,
                          std::shared_ptr<StoreQueue> queue, std::function<void()> onWork)
     : options_(options), clock_(clock), queue_(std::move(queue)),
-      database_({options_.path, options_.busyTimeout, options_.vfs}),
+      database_({options_.path, options_.busyTimeout, options_.vfs, pageBytes(options_)}),
       retention_(platform::secondsSince1970(clock.wallTime())),
       keeper_(options_, clock, database_, retention_), age_(clock), facts_(clock),
       onWork_(std::move(onWork)), limits_(options_.limits) {}

@@ -303,6 +303,18 @@ TEST_F(StoreTest, PressesBetweenTheMarksAndDropsNothing) {
     EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 20);
 }
 
+TEST_F(StoreTest, AFileThatIsWrittenToSeldomIsMadeOfSmallerPages) {
+    options_.patientPageBytes = 4096;
+    options_.limits.syncInterval = kPromptInterval;
+    open();
+    EXPECT_EQ(reader().number("PRAGMA page_size"), StoreDatabase::kPageBytes);
+    store_.reset();
+    std::filesystem::remove(options_.path);
+    options_.limits.syncInterval = kPromptInterval + std::chrono::milliseconds(1);
+    open();
+    EXPECT_EQ(reader().number("PRAGMA page_size"), 4096);
+}
+
 TEST_F(StoreTest, ReplacesAFileThatWasRemovedWhileOpen) {
     open();
     addSingles(1, {});
