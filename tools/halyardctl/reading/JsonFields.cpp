@@ -51,6 +51,15 @@ std::optional<std::int64_t> JsonFields::integer(const char* key) const {
                                               : std::nullopt;
 }
 
+void JsonFields::forEachEntry(
+    const std::function<void(std::string_view key, const rapidjson::Value&)>& take) const {
+    if (root_.IsObject()) {
+        for (const auto& entry : root_.GetObject()) {
+            take({entry.name.GetString(), entry.name.GetStringLength()}, entry.value);
+        }
+    }
+}
+
 void JsonFields::forEachText(const char* key,
                              const std::function<void(std::string_view)>& take) const {
     const rapidjson::Value* const value = find(key);

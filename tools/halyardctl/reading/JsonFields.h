@@ -29,6 +29,9 @@ public:
     std::optional<std::int64_t> integer(const char* key) const;
     // The texts of a list, or the one text that stands in its place.
     void forEachText(const char* key, const std::function<void(std::string_view)>& take) const;
+    // In their order.
+    void forEachEntry(
+        const std::function<void(std::string_view key, const rapidjson::Value&)>& take) const;
     // Null when there is none.
     const rapidjson::Value* find(const char* key) const;
 

@@ -15,13 +15,17 @@
 #include <string>
 #include <vector>
 
+#include "reading/DriverStatistics.h"
 #include "reading/GlitchTally.h"
 #include "reading/Sessions.h"
 #include "reading/TraceResults.h"
-#include "report/DriverStatistics.h"
 #include "report/RowChunks.h"
 
 namespace halyard::ctl {
+
+using reading::HistogramText;
+using reading::StateText;
+using reading::StatisticName;
 
 // What was asked for.
 struct ReportScope {

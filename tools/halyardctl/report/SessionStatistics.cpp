@@ -8,7 +8,7 @@ namespace halyard::ctl {
 namespace {
 
 std::optional<StatisticName> nameOf(std::string_view key, std::string_view kind) {
-    auto name = statisticName(key, kind);
+    auto name = reading::statisticName(key, kind);
     if (name) {
         name->driver = shortName(name->driver);
         name->group = shortName(name->group);
@@ -47,14 +47,14 @@ void SessionStatistics::takeEntry(std::int64_t session, std::int64_t type, std::
         }
     } else if (type == kAudioEventTypeHistogram) {
         auto name = nameOf(key, "Histogram");
-        auto histogram = histogramIn(textOf(value));
+        auto histogram = reading::histogramIn(textOf(value));
         if (name && histogram) {
             histogram->unit = shortName(histogram->unit);
             digest_.histograms.add({session, *std::move(name), *std::move(histogram)});
         }
     } else if (type == kAudioEventTypeState) {
         auto name = nameOf(key, "State");
-        auto states = statesIn(textOf(value));
+        auto states = reading::statesIn(textOf(value));
         if (name && !states.empty()) {
             for (StateText& state : states) {
                 state.name = shortName(state.name);

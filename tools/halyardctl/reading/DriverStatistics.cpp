@@ -1,10 +1,10 @@
-#include "report/DriverStatistics.h"
+#include "reading/DriverStatistics.h"
 
 #include <charconv>
 #include <cstddef>
 #include <fmt/format.h>
 
-namespace halyard::ctl {
+namespace halyard::reading {
 namespace {
 
 // As many as the daemon tells of a channel.
@@ -110,4 +110,4 @@ std::vector<StateText> statesIn(std::string_view text) {
     return states;
 }
 
-} // namespace halyard::ctl
+} // namespace halyard::reading

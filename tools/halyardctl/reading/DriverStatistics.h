@@ -10,7 +10,7 @@
 #include <string_view>
 #include <vector>
 
-namespace halyard::ctl {
+namespace halyard::reading {
 
 // "out.speaker_Speaker_Histogram_Cycletime": the driver, then its groups, the kind, the
 // channel. Where there is no driver, its place is empty.
@@ -45,4 +45,4 @@ struct StateText {
 // Up to the first that is of another form.
 std::vector<StateText> statesIn(std::string_view text);
 
-} // namespace halyard::ctl
+} // namespace halyard::reading

@@ -1,8 +1,8 @@
-#include "report/DriverStatistics.h"
+#include "reading/DriverStatistics.h"
 
 #include <gtest/gtest.h>
 
-namespace halyard::ctl {
+namespace halyard::reading {
 namespace {
 
 TEST(DriverStatistics, ANameIsDriverGroupsAndChannel) {
@@ -70,4 +70,4 @@ TEST(DriverStatistics, StatesEndWhereTheTextIsBroken) {
 }
 
 } // namespace
-} // namespace halyard::ctl
+} // namespace halyard::reading
