@@ -59,6 +59,9 @@ PROGRAMS = {
     # has no call for, looks where the daemon has its directories, and reads its configuration
     # with the daemon's own reader, so that the two cannot disagree about what is in force.
     "tools/halyardctl": {"common", "protocol", "linux/store", "linux/system", "linux/config"},
+    # Sends what the reading part of halyardctl reads, as the device's configuration says.
+    "tools/halyard-export": {"common", "platform", "linux/config", "linux/drivers", "linux/store",
+                             "linux/system"},
     "tests": set(),  # strangers
     "benchmarks": BASE | {"session", "linux/system", "linux/store", "linux/drivers", "testing"},
     "benchmarks/load": {"common", "protocol", "testing"},  # the whole daemon from outside

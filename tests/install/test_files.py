@@ -30,6 +30,9 @@ COMPONENTS = {
     "halyard-pipewire": [
         "bin/halyard-pipewire", "lib/systemd/user/halyard-pipewire.service",
         "share/man/man1/halyard-pipewire.1"],
+    "halyard-export": [
+        f"{UNITS}/halyard-export.service", "lib/sysusers.d/halyard-export.conf",
+        "sbin/halyard-export", "share/man/man8/halyard-export.8"],
 }
 
 

@@ -22,7 +22,8 @@ def output(*command, **options):
 class Installed(unittest.TestCase):
     @classmethod
     def setUpClass(cls):
-        cls.root = Root().install("halyard", "halyard-tools", "halyard-pipewire", "libhalyard-dev")
+        cls.root = Root().install("halyard", "halyard-tools", "halyard-pipewire", "libhalyard-dev",
+                                  "halyard-export")
         cls.addClassCleanup(cls.root.remove)
 
     def help(self, program, *arguments):
@@ -49,7 +50,7 @@ class Pages(Installed):
         if not shutil.which("mandoc"):
             self.skipTest("no mandoc here")
         pages = glob.glob(self.root.prefixed("share/man/man*/*"))
-        self.assertEqual(len(pages), 5)
+        self.assertEqual(len(pages), 6)
         found = subprocess.run(["mandoc", "-T", "lint", *pages], text=True, timeout=PATIENCE,
                                stdout=subprocess.PIPE, stderr=subprocess.STDOUT).stdout
         # The pages that they name need not be installed here.
@@ -69,6 +70,10 @@ class Pages(Installed):
     def test_halyard_pipewire_s_names_every_option_and_no_other(self):
         known = set(re.findall(r"--[\w-]+", self.help("halyard-pipewire")))
         self.assertEqual(self.named_options("halyard-pipewire.1"), known)
+
+    def test_halyard_export_s_names_every_option_and_no_other(self):
+        known = set(OPTION.findall(output(self.root.prefixed("sbin/halyard-export"), "--help")))
+        self.assertEqual(self.named_options("halyard-export.8"), known)
 
     def test_the_configuration_s_names_every_key_that_the_file_shows(self):
         with open(os.path.join(self.root.path, "etc/halyard/halyard.toml"),

@@ -20,7 +20,7 @@ def analyze(*arguments):
 class Units(unittest.TestCase):
     @classmethod
     def setUpClass(cls):
-        cls.root = Root().install("halyard", "halyard-pipewire")
+        cls.root = Root().install("halyard", "halyard-pipewire", "halyard-export")
         cls.addClassCleanup(cls.root.remove)
         # Checked are units whose programs exist; these do in the root.
         for unit in cls.all_units():
@@ -36,13 +36,18 @@ class Units(unittest.TestCase):
     @classmethod
     def all_units(cls):
         return [cls.unit("halyardd.service"), cls.unit("halyardd.socket"),
-                cls.root.prefixed("lib/systemd/user/halyard-pipewire.service")]
+                cls.root.prefixed("lib/systemd/user/halyard-pipewire.service"),
+                cls.unit("halyard-export.service")]
 
     def test_the_daemon_s_have_no_mistakes(self):
         found = analyze("verify", "--man=no", self.unit("halyardd.socket"),
                         self.unit("halyardd.service"))
         ours = [line for line in found.stdout.splitlines() if "halyard" in line]
         self.assertEqual(ours, [])
+
+    def test_the_export_s_has_no_mistakes(self):
+        found = analyze("verify", "--man=no", self.unit("halyard-export.service"))
+        self.assertEqual([line for line in found.stdout.splitlines() if "halyard" in line], [])
 
     def test_the_user_s_has_no_mistakes(self):
         found = analyze("verify", "--man=no", "--user", self.all_units()[2])
@@ -56,6 +61,9 @@ class Units(unittest.TestCase):
 
     def test_the_daemon_s_sandbox_leaves_little_open(self):
         self.assertLessEqual(self.exposure(self.unit("halyardd.service")), 1.5)
+
+    def test_the_export_s_sandbox_leaves_little_but_the_network_open(self):
+        self.assertLessEqual(self.exposure(self.unit("halyard-export.service")), 1.5)
 
     def test_event_traces_open_no_more_than_they_need(self):
         drop_in = self.unit("halyardd.service") + ".d"

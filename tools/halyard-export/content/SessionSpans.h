@@ -1,0 +1,35 @@
+// A closed session as spans: one for the session, with its glitches and changes as events,
+// and a child for each glitch.
+//
+// Not thread-safe.
+#pragma once
+
+#include <vector>
+
+#include "content/PayloadAttributes.h"
+#include "content/SessionContents.h"
+#include "otlp/RequestBody.h"
+
+namespace halyard::exporting {
+
+class SessionSpans {
+public:
+    // Borrows both.
+    SessionSpans(const Identity& identity, const Omission& omission)
+        : identity_(identity), omission_(omission), payload_(omission) {}
+
+    // Requires a closed session.
+    void add(otlp::RequestBody& body, const BookedSession& session,
+             const SessionContents& contents);
+
+private:
+    void addEvents(otlp::Writer& span, const SessionContents& contents);
+    void addFacts(otlp::Writer& span, const BookedSession& session);
+    std::string glitchSpan(const BookedSession& session, const GlitchFacts& glitch);
+
+    const Identity& identity_;
+    const Omission& omission_;
+    PayloadAttributes payload_;
+};
+
+} // namespace halyard::exporting
