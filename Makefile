@@ -76,6 +76,7 @@ test: deps
 	cmake --preset test
 	cmake --build --preset test --parallel $(JOBS)
 	scripts/fetch-axe.sh build/test/axe
+	scripts/fetch-otlp.sh build/test/otlp
 	$(CTEST) --preset test $(CTEST_FLAGS)
 
 check: deps
@@ -86,6 +87,7 @@ check: deps
 		cmake --preset $$preset; \
 		$$wrapper cmake --build --preset $$preset --parallel $(JOBS); \
 		scripts/fetch-axe.sh build/$$preset/axe; \
+		scripts/fetch-otlp.sh build/$$preset/otlp; \
 		$$wrapper $(CTEST) --preset $$preset $(CTEST_FLAGS); \
 	done
 	$(MAKE) fuzz

@@ -4,9 +4,9 @@ add_library(faulty_disk MODULE ${CMAKE_CURRENT_SOURCE_DIR}/daemon/faulty_disk.cp
 target_link_libraries(faulty_disk PRIVATE ${CMAKE_DL_LIBS})
 
 foreach(name requests bad_input neovim endurance drivers sinks configuration store_failures
-    library halyardctl bridge private_files idle_exit accounting consent)
+    library halyardctl bridge export private_files idle_exit accounting consent)
   add_test(NAME daemon.${name}
     COMMAND ${HALYARD_PYTHON} ${CMAKE_CURRENT_SOURCE_DIR}/daemon/test_${name}.py)
   set_tests_properties(daemon.${name} PROPERTIES LABELS daemon TIMEOUT 600
-    ENVIRONMENT "HALYARDD=$<TARGET_FILE:halyardd>;FAULTY_DISK_LIBRARY=$<TARGET_FILE:faulty_disk>;HALYARDCTL=$<TARGET_FILE:halyardctl>;HALYARD_PIPEWIRE=$<TARGET_FILE:halyard-pipewire>;GLITCH_PLAYER=$<TARGET_FILE:glitch_player>;EXAMPLE=$<TARGET_FILE:halyard_client_example>;PYTHONDONTWRITEBYTECODE=1")
+    ENVIRONMENT "HALYARDD=$<TARGET_FILE:halyardd>;FAULTY_DISK_LIBRARY=$<TARGET_FILE:faulty_disk>;HALYARDCTL=$<TARGET_FILE:halyardctl>;HALYARD_EXPORT=$<TARGET_FILE:halyard-export>;OTLP_MODULES=${CMAKE_BINARY_DIR}/otlp/node_modules;HALYARD_PIPEWIRE=$<TARGET_FILE:halyard-pipewire>;GLITCH_PLAYER=$<TARGET_FILE:glitch_player>;EXAMPLE=$<TARGET_FILE:halyard_client_example>;PYTHONDONTWRITEBYTECODE=1")
 endforeach()

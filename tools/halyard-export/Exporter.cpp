@@ -7,7 +7,6 @@
 #include "StoreAccess.h"
 #include "platform/Log.h"
 #include "send/Compression.h"
-#include "send/HttpReceiver.h"
 
 namespace halyard::exporting {
 namespace {
@@ -158,10 +157,7 @@ Outcome<void> Exporter::send(Signal signal, Batch& batch, Step& step) {
         return accept(signal, batch, answer, load.body.size());
     case Verdict::Dropped:
         step.hasMore = true;
-        batch.change.losses[Loss::Refused] += batch.body.count();
-        tell(signal,
-             fmt::format("{} records were given up: {}", batch.body.count(), wordsOf(answer)));
-        return place_.commit(signal, batch.change, world_.now());
+        return giveUp(signal, batch, answer);
     default:
         retryLater(signal, answer);
         step.isLeft = true;
@@ -170,10 +166,24 @@ Outcome<void> Exporter::send(Signal signal, Batch& batch, Step& step) {
     }
 }
 
+Outcome<void> Exporter::giveUp(Signal signal, Batch& batch, const Answer& answer) {
+    if (batch.countable() > 0) {
+        batch.change.losses[Loss::Refused] += batch.countable();
+        tell(signal, fmt::format("{} are given up: {} answers {}", nameOf(signal),
+                                 shownAddress(plan_.options.urls[static_cast<std::size_t>(signal)]),
+                                 answer.status));
+    }
+    auto committed = place_.commit(signal, batch.change, world_.now());
+    if (committed.ok()) {
+        collector_->arrived(signal);
+    }
+    return committed;
+}
+
 Outcome<void> Exporter::accept(Signal signal, Batch& batch, const Answer& answer,
                                std::size_t bytes) {
     const PartialSuccess partial = partialSuccessIn(answer.body);
-    const std::uint64_t rejected = std::min<std::uint64_t>(partial.rejected, batch.body.count());
+    const std::uint64_t rejected = std::min<std::uint64_t>(partial.rejected, batch.countable());
     if (rejected > 0) {
         batch.change.losses[Loss::Rejected] += rejected;
         tell(signal, fmt::format("the receiver rejected {} records: {}", rejected,

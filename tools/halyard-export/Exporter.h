@@ -74,6 +74,7 @@ private:
     reading::Outcome<void> send(Signal signal, Batch& batch, Step& step);
     reading::Outcome<void> accept(Signal signal, Batch& batch, const Answer& answer,
                                   std::size_t bytes);
+    reading::Outcome<void> giveUp(Signal signal, Batch& batch, const Answer& answer);
     void retryLater(Signal signal, const Answer& answer);
     void tell(Signal signal, const std::string& trouble);
     Load loadOf(const Batch& batch) const;

@@ -96,6 +96,17 @@ TEST_F(ExporterTest, WhatRetentionTookIsCountedAsLostAndTold) {
     EXPECT_EQ(attribute(point, "reason"), "removed");
 }
 
+TEST_F(ExporterTest, ALeapOfIdsIsNoLoss) {
+    message(1);
+    run();
+    store_.execute(fmt::format("INSERT INTO upload_message(id, category, type, payload, time) "
+                               "VALUES({}, 4, 1, '{{}}', {})",
+                               std::int64_t{1} << 40, kBegin + 2));
+    run();
+    EXPECT_EQ(receiver_.items(Signal::Logs).size(), 2U);
+    EXPECT_EQ(lost(Signal::Logs, Loss::Removed), 0U);
+}
+
 TEST_F(ExporterTest, WhatIsSentAgainHasTheSameIdentity) {
     message(1);
     receiver_.answerWith(503);
@@ -144,6 +155,19 @@ TEST_F(ExporterTest, OtherAnswersGiveTheDataUpAndAreCounted) {
     message(3);
     run();
     EXPECT_EQ(receiver_.items(Signal::Logs).size(), 3U);
+}
+
+TEST_F(ExporterTest, TheLossOfWhatTellsOfLossesIsNone) {
+    const auto session = store_.addSession("player", kBegin + 1, kBegin + 9);
+    message(2, glitch(1, 0.5), session, 4, 7);
+    for (int i = 0; i < 20; ++i) {
+        receiver_.answerWith(404);
+    }
+    EXPECT_FALSE(run().isLeft);
+    EXPECT_EQ(lost(Signal::Logs, Loss::Refused), 1U);
+    EXPECT_EQ(lost(Signal::Traces, Loss::Refused), 2U);
+    EXPECT_EQ(lost(Signal::Metrics, Loss::Refused), 1U);
+    EXPECT_LT(receiver_.requests.size(), 6U);
 }
 
 TEST_F(ExporterTest, APartialSuccessIsCountedAndNotRepeated) {

@@ -232,6 +232,17 @@ std::vector<std::pair<std::string, std::string>> pairsIn(std::string_view text) 
     return pairs;
 }
 
+std::string shownAddress(std::string url) {
+    url.erase(std::min(url.find_first_of("?#"), url.size()));
+    const std::size_t scheme = url.find("://");
+    const std::size_t host = scheme == std::string::npos ? 0 : scheme + 3;
+    const std::size_t user = url.rfind('@', url.find('/', host));
+    if (user != std::string::npos && user >= host) {
+        url.erase(host, user + 1 - host);
+    }
+    return url;
+}
+
 Outcome<void> checkIsPrivate(const std::string& path) {
     struct stat facts {};
     if (::stat(path.c_str(), &facts) != 0) {

@@ -55,6 +55,9 @@ reading::Outcome<Options> optionsFrom(const linux_::ExportSettings& settings,
 // "key=value,key=value", each percent-encoded; what is no pair is passed over.
 std::vector<std::pair<std::string, std::string>> pairsIn(std::string_view text);
 
+// An address without user, password, query and fragment: what may stand in a log.
+std::string shownAddress(std::string url);
+
 // A file of "name: value" lines, which nobody but its user may read.
 reading::Outcome<Options::Headers> readHeaders(const std::string& path);
 // The same demand on a file that is used by its name.

@@ -95,6 +95,12 @@ TEST_F(OptionsTest, SignalsThatAreNotWantedAreNotSent) {
     EXPECT_FALSE(options().isSent(Signal::Traces));
 }
 
+TEST_F(OptionsTest, AnAddressIsShownWithoutItsSecrets) {
+    EXPECT_EQ(shownAddress("https://u:p@host:4318/v1/logs?key=k#f"), "https://host:4318/v1/logs");
+    EXPECT_EQ(shownAddress("http://host/a@b"), "http://host/a@b");
+    EXPECT_EQ(shownAddress("http://a@b@host"), "http://host");
+}
+
 TEST_F(OptionsTest, OtherProtocolsAreRefused) {
     environment_ = {{"OTEL_EXPORTER_OTLP_PROTOCOL", "grpc"}};
     EXPECT_FALSE(read().ok());

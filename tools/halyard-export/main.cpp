@@ -6,6 +6,7 @@
 #include <cstdio>
 #include <exception>
 #include <fmt/core.h>
+#include <memory>
 #include <optional>
 #include <random>
 #include <string>
@@ -15,10 +16,10 @@
 
 #include "Exporter.h"
 #include "Places.h"
+#include "Plans.h"
 #include "PrintingReceiver.h"
 #include "Wait.h"
 #include "linux/config/Configuration.h"
-#include "linux/drivers/BuiltInChannels.h"
 #include "linux/system/LogWriter.h"
 #include "platform/Log.h"
 #include "platform/Platform.h"
@@ -47,19 +48,6 @@ double chance() {
     return std::uniform_real_distribution<double>(0, 1)(engine);
 }
 
-DriverNames driverNames(const linux_::Settings& settings) {
-    auto channels = settings.driverChannels;
-    auto builtIn = linux_::builtInChannels(linux_::SourceRoot());
-    channels.insert(channels.end(), std::make_move_iterator(builtIn.begin()),
-                    std::make_move_iterator(builtIn.end()));
-    return DriverNames(channels);
-}
-
-std::optional<std::string> deviceName(const linux_::Configuration& configuration) {
-    const Value name = configuration.value("device_name", kLogSubsystem);
-    return name.isString() ? std::optional(std::string(name.text())) : std::nullopt;
-}
-
 // What is settled, read again whenever a file of it changes.
 class Settled {
 public:
@@ -77,25 +65,21 @@ public:
         isGood_ = configuration_.reload() != linux_::Configuration::Outcome::Refused;
         return true;
     }
-    bool isConsentGiven() const { return isGood_ && configuration_.settings()->exporting.consent; }
     // While a request is under way: what refresh() would find.
     bool hasChanged() const { return configurationSignature(directory_) != signature_; }
 
     // Nothing is sent where something about it is wrong.
-    Exporter::Plan plan(const linux_::ExportSettings& exporting) const {
-        Exporter::Plan plan;
-        plan.deviceName = deviceName(configuration_);
-        plan.drivers = driverNames(*configuration_.settings());
-        auto options = optionsFrom(exporting, linux_::processEnvironment);
-        if (options.ok()) {
-            plan.options = std::move(options.value());
-        } else {
-            HY_LOG_ERROR(HYReportingPlatformCategory, "{}", options.failure().message());
+    Exporter::Plan plan() const {
+        std::string trouble;
+        Exporter::Plan plan =
+            planFor(*configuration_.settings(), linux_::processEnvironment, trouble);
+        if (!trouble.empty()) {
+            HY_LOG_ERROR(HYReportingPlatformCategory, "{}", trouble);
         }
         plan.options.consent = plan.options.consent && isGood_;
         return plan;
     }
-    linux_::ExportSettings exporting() const { return configuration_.settings()->exporting; }
+    const linux_::Configuration& configuration() const { return configuration_; }
 
 private:
     const std::filesystem::path directory_;
@@ -112,28 +96,20 @@ int complain(const Failure& failure) {
 int dryRun(const Places& places) {
     Settled settled(places.configuration);
     settled.refresh();
-    auto exporting = settled.exporting();
-    if (exporting.endpoint.empty()) {
-        exporting.endpoint = "http://nobody.invalid";
-    }
+    auto plan = planToShow(*settled.configuration().settings(), linux_::processEnvironment);
     auto place = ExportPlace::inMemory(places.own / ExportPlace::kFileName, now());
-    if (!place.ok()) {
-        return complain(place.failure());
+    if (!plan.ok() || !place.ok()) {
+        return complain(plan.ok() ? place.failure() : plan.failure());
     }
-    Exporter::Plan plan = settled.plan(exporting);
-    PrintingReceiver printer(stdout);
-    plan.receiver = &printer;
-    plan.ignoresConsent = !settled.isConsentGiven();
-    plan.options.consent = true;
-    plan.options.compress = false;
-    plan.options.maxBytesPerDay = INT64_MAX;
-    if (plan.ignoresConsent) {
+    if (plan.value().ignoresConsent) {
         fmt::print(stderr, "halyard-export: there is no consent, so nothing leaves; this would if "
                            "everything had been agreed to\n");
     }
+    PrintingReceiver printer(stdout);
+    plan.value().receiver = &printer;
     Exporter exporter(places.store / reading::StoreReader::kFileName, std::move(place.value()),
                       {now, chance, [] { return true; }});
-    exporter.follow(std::move(plan));
+    exporter.follow(std::move(plan.value()));
     Exporter::Step step;
     do {
         step = exporter.step();
@@ -155,11 +131,13 @@ int run(const Places& places, bool once) {
                       {now, chance, mayGoOn});
     std::unique_ptr<HttpReceiver> receiver;
     std::chrono::milliseconds delay{0};
+    bool canSend = false;
     double due = 0; // when to look at the store
     while (!wait.isEnded()) {
         if (settled.refresh()) {
-            Exporter::Plan plan = settled.plan(settled.exporting());
+            Exporter::Plan plan = settled.plan();
             delay = plan.options.delay;
+            canSend = plan.options.consent && plan.options.isAnythingSent();
             receiver = std::make_unique<HttpReceiver>(plan.options, mayGoOn);
             plan.receiver = receiver.get();
             exporter.follow(std::move(plan));
@@ -168,7 +146,7 @@ int run(const Places& places, bool once) {
         if (now() >= due) {
             const Exporter::Step step = exporter.step();
             if (once && !step.hasMore) {
-                return step.isLeft || !settled.isConsentGiven() ? kLeft : kDone;
+                return step.isLeft || !canSend ? kLeft : kDone;
             }
             due = step.hasMore ? 0 : step.next;
         }

@@ -71,6 +71,7 @@ private:
     // Commands about files.
     void addFiles();
     void addConsent();
+    void addExport();
     void addReport();
     void addWatch();
     // Commands about the store as a whole.
@@ -86,6 +87,7 @@ private:
     std::string file_;
     std::string watched_ = "messages";
     std::string consent_;
+    std::string export_;
     bool repair_ = false;
     SendOptions send_{};
     SessionOptions session_{};
@@ -106,6 +108,7 @@ CommandLine::CommandLine(Context& context) : context_(context) {
     addFiles();
     addCare();
     addConsent();
+    addExport();
     addReport();
 }
 
@@ -196,6 +199,20 @@ void CommandLine::addCare() {
         ->add_flag("--repair", repair_,
                    "Set a damaged store aside and save what can be read; without a daemon only");
     add("purge", "Removes everything that was collected", [this] { return runPurge(context_); });
+}
+
+void CommandLine::addExport() {
+    CLI::App* const of = add("export", "How far the export is, or what would leave now", [this] {
+        return export_ == "status" ? runExportStatus(context_) : runExportPreview(context_);
+    });
+    of->add_option("WHAT", export_, "status or preview")
+        ->type_name("")
+        ->required()
+        ->check([](const std::string& name) {
+            return name == "status" || name == "preview" ? "" : "status or preview";
+        });
+    of->add_option("--config", context_.configurationOption, "The daemon's configuration directory")
+        ->type_name("DIR");
 }
 
 void CommandLine::addConsent() {

@@ -21,6 +21,9 @@ constexpr std::size_t kMostSessions = 64;
 // Open sessions that are looked at again for one batch.
 constexpr std::size_t kMostOpen = 8192;
 constexpr std::size_t kMostSingles = 1024;
+// More rows than any store had: ids leap where the daemon makes room for rows that it may
+// still save from a damaged file.
+constexpr std::int64_t kLeap = std::int64_t{1} << 32;
 
 // A place in a table whose rows began anew, because a store was emptied or replaced, is
 // none. `time` is the table's column.
@@ -55,7 +58,7 @@ Outcome<Position> startIn(StoreReader& reader, const std::string& table, const c
 void passTo(Position& position, std::int64_t id, double time, const ConsentHistory& consent,
             PlaceChange& change) {
     const std::int64_t missing = id - position.id - 1;
-    if (position.id > 0 && missing > 0 &&
+    if (position.id > 0 && missing > 0 && missing < kLeap &&
         (consent.isGivenAt(position.time) || consent.isGivenAt(time))) {
         change.losses[Loss::Removed] += static_cast<std::uint64_t>(missing);
     }
@@ -335,7 +338,7 @@ Outcome<Batch> Collector::collectMetrics(StoreReader& reader, const ExportPlace&
         return singles.failure();
     }
     addTotals(place, metrics, now);
-    metrics.finish(batch.body);
+    batch.totals = metrics.finish(batch.body);
     return batch;
 }
 

@@ -36,6 +36,11 @@ struct Batch {
     otlp::RequestBody body;
     PlaceChange change;
     bool hasMore = false; // there is more to take now
+    // Of its items, those that only tell of losses. To count their loss as well would make
+    // another to tell of, and so on.
+    std::size_t totals = 0;
+
+    std::size_t countable() const { return body.count() - totals; }
 };
 
 // What decides over what leaves, and as what.
@@ -57,7 +62,7 @@ public:
 
     reading::Outcome<Batch> collect(Signal signal, reading::StoreReader& reader,
                                     const ExportPlace& place, double now);
-    // The batch of this signal that was taken last has arrived.
+    // The batch of this signal that was taken last has arrived, or was given up.
     void arrived(Signal signal);
 
 private:

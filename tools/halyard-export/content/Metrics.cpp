@@ -195,8 +195,10 @@ void Metrics::addTotal(std::string_view name, std::string_view description, std:
     addPoint(name, "{record}", Kind::CumulativeSum, description, bytes);
 }
 
-void Metrics::finish(RequestBody& body) {
+std::size_t Metrics::finish(RequestBody& body) {
+    std::size_t totals = 0;
     for (const auto& [key, series] : series_) {
+        totals += series.kind == Kind::CumulativeSum ? 1 : 0;
         std::string data = series.points;
         Writer writer(data);
         writer.add_enum(metric::kTemporality,
@@ -214,6 +216,7 @@ void Metrics::finish(RequestBody& body) {
     }
     series_.clear();
     bytes_ = 0;
+    return totals;
 }
 
 } // namespace halyard::exporting

@@ -42,8 +42,8 @@ public:
                   std::uint64_t value, Stretch stretch);
 
     std::size_t bytes() const { return bytes_; }
-    // One metric for each name and unit.
-    void finish(otlp::RequestBody& body);
+    // One metric for each name and unit. Returns how many of them are totals.
+    std::size_t finish(otlp::RequestBody& body);
 
 private:
     enum class Kind : std::uint8_t { DeltaSum, CumulativeSum, Histogram };

@@ -1,8 +1,8 @@
 #include "send/HttpReceiver.h"
 
 #include <algorithm>
+#include <array>
 #include <curl/curl.h>
-#include <fmt/format.h>
 #include <mutex>
 
 namespace halyard::exporting {
@@ -13,8 +13,6 @@ constexpr std::size_t kMostAnswer = 64 * 1024;
 // After which the connection is rather given up than read to its end.
 constexpr std::size_t kMostIgnored = 1024 * 1024;
 constexpr const char* kUserAgent = "User-Agent: OTel-OTLP-Exporter-halyard/" HALYARD_VERSION;
-
-using Text = std::unique_ptr<char, void (*)(void*)>;
 
 struct Taking {
     std::string* body;
@@ -63,24 +61,6 @@ struct HttpReceiver::Handle {
 
     CURL* curl = nullptr;
 };
-
-std::string shownAddress(const std::string& url) {
-    CURLU* const parts = curl_url();
-    const std::unique_ptr<CURLU, void (*)(CURLU*)> owner(parts, curl_url_cleanup);
-    if (parts == nullptr || curl_url_set(parts, CURLUPART_URL, url.c_str(), 0) != CURLUE_OK) {
-        return "(no address)";
-    }
-    for (const CURLUPart secret :
-         {CURLUPART_USER, CURLUPART_PASSWORD, CURLUPART_QUERY, CURLUPART_FRAGMENT}) {
-        (void)curl_url_set(parts, secret, nullptr, 0);
-    }
-    char* raw = nullptr;
-    if (curl_url_get(parts, CURLUPART_URL, &raw, 0) != CURLUE_OK) {
-        return "(no address)";
-    }
-    const Text text(raw, curl_free);
-    return text.get();
-}
 
 HttpReceiver::HttpReceiver(const Options& options, MayGoOn mayGoOn)
     : options_(options), mayGoOn_(std::move(mayGoOn)), handle_(std::make_unique<Handle>()) {}

@@ -34,7 +34,4 @@ private:
     std::unique_ptr<Handle> handle_; // keeps its connection from request to request
 };
 
-// Without user, password, query and fragment: what may stand in a log.
-std::string shownAddress(const std::string& url);
-
 } // namespace halyard::exporting

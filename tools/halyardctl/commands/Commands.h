@@ -43,6 +43,9 @@ Exit runSession(Context& context, const SessionOptions& options);
 
 enum class ConsentAction : std::uint8_t { Give, Withdraw, Show };
 Exit runConsent(Context& context, ConsentAction action);
+// How far the exporter is; what would leave now.
+Exit runExportStatus(Context& context);
+Exit runExportPreview(Context& context);
 
 Exit runCheck(Context& context, bool repair);
 Exit runPurge(Context& context);
