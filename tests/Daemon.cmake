@@ -3,7 +3,7 @@
 add_library(faulty_disk MODULE ${CMAKE_CURRENT_SOURCE_DIR}/daemon/faulty_disk.cpp)
 target_link_libraries(faulty_disk PRIVATE ${CMAKE_DL_LIBS})
 
-foreach(name requests bad_input neovim endurance drivers sinks configuration store_failures
+foreach(name requests bad_input hostile neovim endurance drivers sinks configuration store_failures
     library halyardctl bridge export private_files idle_exit accounting consent)
   add_test(NAME daemon.${name}
     COMMAND ${HALYARD_PYTHON} ${CMAKE_CURRENT_SOURCE_DIR}/daemon/test_${name}.py)

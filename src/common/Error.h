@@ -29,6 +29,7 @@ enum class IpcErrorCode : std::int64_t {
     BadArgument = 2,
     NotAllowed = 3,
     Unanswered = 4, // The reply was dropped without an answer.
+    Bounded = 5,    // A bound of the client's budget; the message names it.
 };
 
 } // namespace halyard

@@ -186,6 +186,8 @@ Result<void> LinuxPlatform::open(platform::ListenerDelegate* delegate) {
                                          [this](const Peer& peer) { return rightsOfPeer(peer); });
     listener_->setDelegate(delegate);
     removeUnfinished(directories_.state, directories_.logs); // Nobody else runs here.
+    listener_->setLimits(configuration_.configuration.settings()->clients);
+    listener_->onClientRelieved([this] { queues_->clientRelieved(); });
     listener_->onConnectionsChanged([this](std::size_t connections) {
         idleExit_.connectionsChanged(connections);
         freeMemory_.released(); // If somebody has left, which this need not know.
@@ -218,6 +220,7 @@ void LinuxPlatform::observeConfiguration() {
     configuration_.configuration.observe([this](const Settings& before, const Settings& after) {
         applySettings(after);
         idleExit_.setLimit(after.idleExit);
+        listener_->setLimits(after.clients);
         if (before.access.readers != after.access.readers) {
             keepFilesPrivate(after);
         }

@@ -6,6 +6,7 @@
 #include <memory>
 #include <string>
 
+#include "platform/ClientBudget.h"
 #include "protocol/Request.h"
 
 namespace halyard::platform {
@@ -26,6 +27,8 @@ public:
     virtual ~Connection() = default;
     virtual std::int32_t processIdentifier() const = 0;
     virtual std::string description() const = 0;
+    // What the peer's process may make the daemon keep. Never null.
+    virtual ClientBudgetPtr budget() const = 0;
     virtual void setExportedObject(std::shared_ptr<ExportedObject> object) = 0;
     virtual void setInterruptionHandler(std::function<void()> handler) = 0;
     virtual void setInvalidationHandler(std::function<void()> handler) = 0;

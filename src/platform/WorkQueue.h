@@ -36,6 +36,11 @@ public:
     // `first` is dropped, when the limit ran out before. Any thread.
     [[nodiscard]] virtual bool resume(Task first) = 0;
 
+    // For a task that would take long: the rest of it, as a task that runs before
+    // anything else of the same client, once others have had their turn. Requires that
+    // it is called from a task of this queue, as the last that it does, once.
+    virtual void continueWith(Task rest) = 0;
+
     // The queue whose task the calling thread is running, innermost; null when it
     // runs none.
     static const SerialQueue* current();

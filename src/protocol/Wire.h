@@ -46,6 +46,8 @@ public:
     // frame.
     [[nodiscard]] Outcome scan(std::string_view stream);
     std::size_t frameLength() const { return position_; }
+    // Of all containers so far.
+    std::size_t elements() const { return elements_; }
     void reset();
 
 private:

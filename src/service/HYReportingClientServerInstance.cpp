@@ -32,8 +32,17 @@ void uncountLost(HYReportingServiceDelegateProtocol& delegate) {
     }
 }
 
+// Of a client that has gone: how many are stopped before others have their turn.
+constexpr std::size_t kLossesPerStep = 32;
+
 void mark(std::uint32_t code) {
     platform::current().traceMarks->mark(code, 0, 0, 0, 0);
+}
+
+void answer(const ErrorReply& reply, const MaybeError& error) {
+    if (reply) {
+        reply(error);
+    }
 }
 
 void logActiveSessions(const HYReportingServiceDelegateProtocol& delegate) {
@@ -48,15 +57,17 @@ void logActiveSessions(const HYReportingServiceDelegateProtocol& delegate) {
 
 std::shared_ptr<HYReportingClientServerInstance>
 HYReportingClientServerInstance::initWithPID(std::int32_t pid, std::weak_ptr<Delegate> delegate,
-                                             std::shared_ptr<platform::SerialQueue> serviceQueue) {
-    return std::shared_ptr<HYReportingClientServerInstance>(
-        new HYReportingClientServerInstance(pid, std::move(delegate), std::move(serviceQueue)));
+                                             std::shared_ptr<platform::SerialQueue> serviceQueue,
+                                             platform::ClientBudgetPtr budget) {
+    return std::shared_ptr<HYReportingClientServerInstance>(new HYReportingClientServerInstance(
+        pid, std::move(delegate), std::move(serviceQueue), std::move(budget)));
 }
 
 HYReportingClientServerInstance::HYReportingClientServerInstance(
     std::int32_t pid, std::weak_ptr<Delegate> delegate,
-    std::shared_ptr<platform::SerialQueue> serviceQueue)
-    : pid_(pid), delegate_(std::move(delegate)), serviceQueue_(std::move(serviceQueue)) {
+    std::shared_ptr<platform::SerialQueue> serviceQueue, platform::ClientBudgetPtr budget)
+    : pid_(pid), delegate_(std::move(delegate)), serviceQueue_(std::move(serviceQueue)),
+      budget_(std::move(budget)) {
     HY_LOG_DEFAULT(HYReportingClientCategory, "new client with pid {}", pid_);
 }
 
@@ -64,29 +75,41 @@ HYReportingClientServerInstance::~HYReportingClientServerInstance() {
     HY_LOG_DEBUG(HYReportingClientCategory, "dealloc {} from the server client list", pid_);
 }
 
-template <class Body> void HYReportingClientServerInstance::onServiceQueue(Body body) {
-    serviceQueue_->async([weak = weak_from_this(), body = std::move(body)]() mutable {
+template <class Body> platform::Task HYReportingClientServerInstance::taskOf(Body body) {
+    return [weak = weak_from_this(), body = std::move(body)]() mutable {
         const auto self = weak.lock();
         const auto delegate = self != nullptr ? self->delegate_.lock() : nullptr;
         if (delegate != nullptr) {
+            const platform::BudgetScope pays(self->budget_);
             body(*self, *delegate);
         }
-    });
+    };
+}
+
+template <class Body> void HYReportingClientServerInstance::onServiceQueue(Body body) {
+    serviceQueue_->async(taskOf(std::move(body)));
+}
+
+template <class Body> void HYReportingClientServerInstance::continueOnServiceQueue(Body body) {
+    serviceQueue_->continueWith(taskOf(std::move(body)));
 }
 
 void HYReportingClientServerInstance::createReportingSession(std::int64_t reporterID,
                                                              BoolReply reply) {
     onServiceQueue([reporterID, reply = std::move(reply)](auto& self, Delegate& delegate) {
-        self.create(delegate, reporterID);
-        reply(std::nullopt, true);
+        const MaybeError error = self.create(delegate, reporterID);
+        reply(error, !error);
     });
 }
 
-void HYReportingClientServerInstance::create(Delegate& delegate, std::int64_t reporterID) {
+MaybeError HYReportingClientServerInstance::create(Delegate& delegate, std::int64_t reporterID) {
     HY_ASSERT_ON_QUEUE(serviceQueue_);
     HY_LOG_DEBUG(HYReportingClientCategory, "creating session for reporter {}", reporterID);
     mark(kCreateMark);
     const auto session = HYReportingSession::initWithID(reporterID, {pid_});
+    if (const auto bound = session->chargeTo(budget_)) {
+        return platform::boundReached(*bound);
+    }
     auto replaced = session;
     {
         const MutexLock lock(mapMutex_);
@@ -100,6 +123,7 @@ void HYReportingClientServerInstance::create(Delegate& delegate, std::int64_t re
     }
     session->setRelayReportingEnabled(mayUpload(delegate.activeSessionCount()));
     HY_LOG_DEFAULT(HYReportingClientCategory, "session created for reporter {}", reporterID);
+    return std::nullopt;
 }
 
 void HYReportingClientServerInstance::setServiceType(AudioServiceType type, std::int64_t reporterID,
@@ -140,10 +164,13 @@ void HYReportingClientServerInstance::setConfiguration(Dictionary configuration,
     onServiceQueue([configuration = std::move(configuration), reporterID,
                     reply = std::move(reply)](auto& self, Delegate& delegate) {
         HY_LOG_DEBUG(HYReportingClientCategory, "setting configuration");
+        MaybeError error;
         if (const auto session = self.findReportingSessionForID(delegate, reporterID, false)) {
-            session->updateConfigurationWithContentsOfConfiguration(configuration);
+            const auto bound =
+                session->updateConfigurationWithContentsOfConfiguration(configuration);
+            error = bound ? MaybeError(platform::boundReached(*bound)) : std::nullopt;
         }
-        reply(std::nullopt, true);
+        reply(error, !error);
     });
 }
 
@@ -188,25 +215,33 @@ void HYReportingClientServerInstance::sendMessage(
     auto processName = HYReportingUtilityIsInternalBuild()
                            ? HYReportingUtilityProcessNameForPID(pid_)
                            : std::nullopt;
-    onServiceQueue([message = Message{std::move(message), category, type},
-                    processName = std::move(processName), reporterIDs = std::move(reporterIDs),
+    onServiceQueue([fanOut = MessageFanOut({std::move(message), category, type},
+                                           std::move(reporterIDs), std::move(processName)),
                     reply = std::move(reply)](auto& self, Delegate& delegate) mutable {
-        const MaybeError error = self.send(delegate, std::move(message), reporterIDs, processName);
-        if (reply) {
-            reply(error);
+        if (self.send(delegate, fanOut)) {
+            answer(reply, fanOut.error());
+        } else {
+            self.sendRest(std::make_shared<MessageFanOut>(std::move(fanOut)), std::move(reply));
         }
     });
 }
 
-MaybeError
-HYReportingClientServerInstance::send(Delegate& delegate, Message message,
-                                      const std::optional<std::vector<std::int64_t>>& reporterIDs,
-                                      const std::optional<std::string>& processName) {
+bool HYReportingClientServerInstance::send(Delegate& delegate, MessageFanOut& fanOut) const {
     HY_ASSERT_ON_QUEUE(serviceQueue_);
-    MessageFanOut fanOut(delegate, std::move(message), processName);
-    return fanOut.route(reporterIDs, [&](std::int64_t reporterID) {
-        return findReportingSessionForID(delegate, reporterID, true);
-    });
+    return fanOut.advance(delegate,
+                          [this](std::int64_t reporterID) { return ownSession(reporterID); });
+}
+
+void HYReportingClientServerInstance::sendRest(std::shared_ptr<MessageFanOut> fanOut,
+                                               ErrorReply reply) {
+    continueOnServiceQueue(
+        [fanOut = std::move(fanOut), reply = std::move(reply)](auto& self, Delegate& delegate) {
+            if (self.send(delegate, *fanOut)) {
+                answer(reply, fanOut->error());
+            } else {
+                self.sendRest(fanOut, reply);
+            }
+        });
 }
 
 void HYReportingClientServerInstance::stopReportingSessionForID(std::int64_t reporterID,
@@ -317,24 +352,38 @@ void HYReportingClientServerInstance::leave(Delegate& delegate) {
                      [this](const auto& client) { return client.get() == this; })) {
         return;
     }
-    SessionMap sessions;
-    {
-        const MutexLock lock(mapMutex_);
-        sessions = sessions_;
-    }
-    for (const auto& [reporterID, session] : sessions) {
+    for (std::size_t i = 0; i < kLossesPerStep; ++i) {
+        const auto session = takeFirstSession();
+        if (session == nullptr) {
+            break;
+        }
         if (session->started()) {
             session->stop(platform::UploadEnding::Disconnected);
             uncountLost(delegate);
         }
         retire(delegate, *session);
     }
-    {
-        const MutexLock lock(mapMutex_);
-        sessions_.clear();
+    if (hasSessions()) {
+        continueOnServiceQueue([](auto& self, Delegate& again) { self.leave(again); });
+        return;
     }
     delegate.removeClient(*this);
     HY_LOG_DEFAULT(HYReportingClientCategory, "removing {} from the server client list", pid_);
+}
+
+std::shared_ptr<HYReportingSession> HYReportingClientServerInstance::takeFirstSession() {
+    const MutexLock lock(mapMutex_);
+    if (sessions_.empty()) {
+        return nullptr;
+    }
+    auto session = std::move(sessions_.begin()->second);
+    sessions_.erase(sessions_.begin());
+    return session;
+}
+
+bool HYReportingClientServerInstance::hasSessions() const {
+    const MutexLock lock(mapMutex_);
+    return !sessions_.empty();
 }
 
 std::optional<platform::WallTime> HYReportingClientServerInstance::clientStartDate() const {

@@ -23,16 +23,19 @@
 
 namespace halyard {
 
+class MessageFanOut;
+
 class HYReportingClientServerInstance final
     : public HYReportingServiceProtocol,
       public std::enable_shared_from_this<HYReportingClientServerInstance> {
 public:
     using SessionMap = std::map<std::int64_t, std::shared_ptr<HYReportingSession>>;
 
-    // The service object is held weakly, the queue shared.
+    // The service object is held weakly, the queue and the process's budget shared.
     static std::shared_ptr<HYReportingClientServerInstance>
     initWithPID(std::int32_t pid, std::weak_ptr<HYReportingServiceDelegateProtocol> delegate,
-                std::shared_ptr<platform::SerialQueue> serviceQueue);
+                std::shared_ptr<platform::SerialQueue> serviceQueue,
+                platform::ClientBudgetPtr budget);
     ~HYReportingClientServerInstance() override;
 
     void createReportingSession(std::int64_t reporterID, BoolReply reply) override;
@@ -78,20 +81,27 @@ private:
     using Delegate = HYReportingServiceDelegateProtocol;
 
     HYReportingClientServerInstance(std::int32_t pid, std::weak_ptr<Delegate> delegate,
-                                    std::shared_ptr<platform::SerialQueue> serviceQueue);
+                                    std::shared_ptr<platform::SerialQueue> serviceQueue,
+                                    platform::ClientBudgetPtr budget);
 
-    // Queues body(*this, delegate) on the service work queue.
+    // body(*this, delegate) as a task of the service work queue; queues it there; has
+    // it go on with what the task at hand has left, once others had their turn.
+    template <class Body> platform::Task taskOf(Body body);
     template <class Body> void onServiceQueue(Body body);
+    template <class Body> void continueOnServiceQueue(Body body);
 
     // The bodies of the requests, on the service work queue.
-    void create(Delegate& delegate, std::int64_t reporterID);
+    MaybeError create(Delegate& delegate, std::int64_t reporterID);
     void start(Delegate& delegate, std::int64_t reporterID, const BoolReply& reply);
     void stop(Delegate& delegate, std::int64_t reporterID);
     void destroy(Delegate& delegate, std::int64_t reporterID);
-    MaybeError send(Delegate& delegate, Message message,
-                    const std::optional<std::vector<std::int64_t>>& reporterIDs,
-                    const std::optional<std::string>& processName);
+    // Takes a step; true when it was the last.
+    bool send(Delegate& delegate, MessageFanOut& fanOut) const;
+    void sendRest(std::shared_ptr<MessageFanOut> fanOut, ErrorReply reply);
+    // In steps, since there may be many.
     void leave(Delegate& delegate);
+    std::shared_ptr<HYReportingSession> takeFirstSession() HY_EXCLUDES(mapMutex_);
+    bool hasSessions() const HY_EXCLUDES(mapMutex_);
     // For a session that leaves the map: answers the start that it holds.
     static void retire(Delegate& delegate, HYReportingSession& session);
 
@@ -102,6 +112,7 @@ private:
     const std::int32_t pid_;
     const std::weak_ptr<Delegate> delegate_;
     const std::shared_ptr<platform::SerialQueue> serviceQueue_;
+    const platform::ClientBudgetPtr budget_;
 
     mutable Mutex identityMutex_;
     std::optional<platform::WallTime> startDate_ HY_GUARDED_BY(identityMutex_);

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <chrono>
+#include <fmt/format.h>
 #include <utility>
 
 #include "platform/Clock.h"
@@ -106,7 +107,8 @@ bool HYReportingServiceDelegate::shouldAcceptNewConnection(
     Client client;
     {
         const MutexLock lock(monitor_);
-        client = HYReportingClientServerInstance::initWithPID(pid, weak_from_this(), serviceQueue_);
+        client = HYReportingClientServerInstance::initWithPID(pid, weak_from_this(), serviceQueue_,
+                                                              connection->budget());
     }
     // The dispatcher is the client object's owner until the connection goes.
     connection->setExportedObject(
@@ -181,21 +183,52 @@ void HYReportingServiceDelegate::removeClient(const HYReportingClientServerInsta
 
 HYReportingServiceDelegate::Session
 HYReportingServiceDelegate::findReportingSessionForID(std::int64_t reporterID) const {
+    SessionLookups lookups;
+    Session session = findReportingSessionForID(reporterID, lookups);
+    tell(lookups);
+    return session;
+}
+
+HYReportingServiceDelegate::Session
+HYReportingServiceDelegate::findReportingSessionForID(std::int64_t reporterID,
+                                                      SessionLookups& lookups) const {
     if (reporterID == 0 || !reportingEnabled_) {
         return nullptr;
     }
     const MutexLock lock(monitor_);
     for (const Client& client : clients_) {
         if (auto session = client->ownSession(reporterID)) {
-            HY_LOG_INFO(HYReportingServiceDelegateCategory,
-                        "found reporting session {} for client {}", reporterID,
-                        client->processIdentifier());
+            lookups.addFound(reporterID, client->processIdentifier());
             return session;
         }
     }
-    HY_LOG_ERROR(HYReportingServiceDelegateCategory, "failed to find reporting session {}",
-                 reporterID);
+    lookups.addFailed(reporterID);
     return nullptr;
+}
+
+// A line for each, or one for many.
+void HYReportingServiceDelegate::tell(const SessionLookups& lookups) const {
+    if (lookups.foundCount > kNamedInLog) {
+        HY_LOG_INFO(HYReportingServiceDelegateCategory,
+                    "found reporting session {} for client {} and {} more",
+                    lookups.found.front().reporterID, lookups.found.front().pid,
+                    lookups.foundCount - 1);
+    } else {
+        for (const auto& [reporterID, pid] : lookups.found) {
+            HY_LOG_INFO(HYReportingServiceDelegateCategory,
+                        "found reporting session {} for client {}", reporterID, pid);
+        }
+    }
+    if (lookups.failedCount > kNamedInLog) {
+        HY_LOG_ERROR(HYReportingServiceDelegateCategory,
+                     "failed to find reporting session {} and {} more",
+                     fmt::join(lookups.failed, ", "), lookups.failedCount - lookups.failed.size());
+    } else {
+        for (const std::int64_t reporterID : lookups.failed) {
+            HY_LOG_ERROR(HYReportingServiceDelegateCategory, "failed to find reporting session {}",
+                         reporterID);
+        }
+    }
 }
 
 void HYReportingServiceDelegate::setActiveSessionCount(std::int64_t count) {

@@ -43,6 +43,9 @@ public:
     bool isReportingEnabled() const override { return reportingEnabled_; }
     std::vector<Session> getAllActiveReportingSessions() const override;
     Session findReportingSessionForID(std::int64_t reporterID) const override;
+    Session findReportingSessionForID(std::int64_t reporterID,
+                                      SessionLookups& lookups) const override;
+    void tell(const SessionLookups& lookups) const override;
     void sessionRetired(const HYReportingSession& session) override;
     platform::DriverSnapshotRef getSnapShot() override;
     void sendDriverLogsForSession(const Session& session) override;

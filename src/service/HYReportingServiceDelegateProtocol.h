@@ -18,6 +18,32 @@ class HYReportingClientServerInstance;
 class HYReportingSession;
 class MessageSinks;
 
+// What lines of the log name of a list; of the rest they have the number.
+inline constexpr std::size_t kNamedInLog = 16;
+
+// What came of looking for sessions of other clients, for lines of the log.
+struct SessionLookups {
+    struct Found {
+        std::int64_t reporterID;
+        std::int32_t pid; // of the client that holds it
+    };
+    void addFound(std::int64_t reporterID, std::int32_t pid) {
+        if (++foundCount <= kNamedInLog) {
+            found.push_back({reporterID, pid});
+        }
+    }
+    void addFailed(std::int64_t reporterID) {
+        if (++failedCount <= kNamedInLog) {
+            failed.push_back(reporterID);
+        }
+    }
+
+    std::vector<Found> found; // the first of them
+    std::vector<std::int64_t> failed;
+    std::size_t foundCount = 0;
+    std::size_t failedCount = 0;
+};
+
 // All on the service work queue, but for findReportingSessionForID (any thread).
 class HYReportingServiceDelegateProtocol {
 public:
@@ -32,6 +58,10 @@ public:
     virtual bool isReportingEnabled() const = 0;
     virtual std::vector<Session> getAllActiveReportingSessions() const = 0;
     virtual Session findReportingSessionForID(std::int64_t reporterID) const = 0;
+    // The same for one of many: what is to be told is noted, and told later.
+    virtual Session findReportingSessionForID(std::int64_t reporterID,
+                                              SessionLookups& lookups) const = 0;
+    virtual void tell(const SessionLookups& lookups) const = 0;
     // A session has left its client's map.
     virtual void sessionRetired(const HYReportingSession& session) = 0;
     // The driver statistics as they are now.

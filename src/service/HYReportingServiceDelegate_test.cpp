@@ -265,8 +265,8 @@ TEST_F(HYReportingServiceDelegateTest, WhatAClientAskedBeforeItWentIsStillDone) 
 
 TEST_F(HYReportingServiceDelegateTest, RemovingAStrangerIsNoError) {
     const Peer peer = connect(100);
-    const auto stranger =
-        HYReportingClientServerInstance::initWithPID(100, service_, service_->serviceQueue());
+    const auto stranger = HYReportingClientServerInstance::initWithPID(
+        100, service_, service_->serviceQueue(), nullptr);
     onServiceQueue([&] { service_->removeClient(*stranger); });
     EXPECT_THAT(service_->getAllClients(), SizeIs(1));
 }

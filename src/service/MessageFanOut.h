@@ -1,8 +1,11 @@
 // Routes one client message to the sessions concerned and to the four sinks.
 //
-// Runs on the service work queue, so sessions see one message at a time, in the
-// order of arrival. Borrows all that it is given but the message; lives for that
-// one message.
+// In steps: a message for thousands of sessions takes longer than others may wait, so
+// whoever has it runs it as tasks of the service work queue, in the order of arrival of
+// messages as far as each session sees it. What it makes the daemon keep and copy is
+// looked at before any of it is made.
+//
+// Borrows nothing; lives for that one message.
 #pragma once
 
 #include <cstdint>
@@ -22,34 +25,47 @@ namespace halyard {
 
 class MessageFanOut {
 public:
+    using Delegate = HYReportingServiceDelegateProtocol;
     using Session = std::shared_ptr<HYReportingSession>;
-    using Lookup = std::function<Session(std::int64_t reporterID)>;
+    using ReporterIDs = std::optional<std::vector<std::int64_t>>;
+    // The sender's own sessions.
+    using OwnLookup = std::function<Session(std::int64_t reporterID)>;
 
-    // The name is that of the sender's process, where issue capture will want it.
-    MessageFanOut(HYReportingServiceDelegateProtocol& delegate, Message message,
-                  const std::optional<std::string>& processName)
-        : delegate_(delegate), message_(std::move(message)), processName_(processName) {}
+    // Without a list the message goes to every started session or, where there is
+    // none, out on its own; unknown reporter IDs are skipped silently. The name is
+    // that of the sender's process, where issue capture will want it.
+    MessageFanOut(Message message, ReporterIDs reporterIDs, std::optional<std::string> processName)
+        : message_(std::move(message)), reporterIDs_(std::move(reporterIDs)),
+          processName_(std::move(processName)) {}
 
-    // Without a list the message goes to every started session or, where there
-    // is none, out on its own. The error is that of a disabled service; unknown
-    // reporter IDs are skipped silently. Call it once: the message goes.
-    MaybeError route(const std::optional<std::vector<std::int64_t>>& reporterIDs,
-                     const Lookup& findAcrossAllClients);
+    // Takes a step; true when it was the last. The first one tells of a disabled
+    // service or a bound by error().
+    [[nodiscard]] bool advance(Delegate& delegate, const OwnLookup& findOwn);
+    const MaybeError& error() const { return error_; }
 
 private:
-    void sendToAddressed(const std::vector<std::int64_t>& reporterIDs,
-                         const Lookup& findAcrossAllClients);
-    void broadcast() const;
-    void sendStandalone() const;
-    void offerToSinks(const Session& session) const;
+    enum class Stage { Begin, FindSessions, Offer };
 
-    HYReportingServiceDelegateProtocol& delegate_;
+    bool begin(Delegate& delegate);
+    bool findSessions(Delegate& delegate, const OwnLookup& findOwn);
+    Session find(std::int64_t reporterID, const Delegate& delegate, const OwnLookup& findOwn);
+    // Whether all that the message would leave and take is within bounds.
+    bool isAllowed();
+    bool offerToSome(Delegate& delegate);
+    void offer(Delegate& delegate, const Session& session, bool last);
+    void offerToSinks(Delegate& delegate, const Session& session) const;
+    void sendStandalone(Delegate& delegate) const;
+
     Message message_;
-    const std::optional<std::string>& processName_;
+    ReporterIDs reporterIDs_;
+    std::optional<std::string> processName_;
+    Stage stage_ = Stage::Begin;
+    MaybeError error_;
+    std::size_t bytes_ = 0; // of the message
+    std::size_t next_ = 0;  // of the IDs, then of the sessions
+    std::vector<Session> sessions_;
+    SessionLookups lookups_;
 };
-
-// What lines of the log name of a list; of the rest they have the number.
-inline constexpr std::size_t kNamedInLog = 16;
 
 // A list of session descriptions, for log lines, of `count` sessions of which these
 // come first.

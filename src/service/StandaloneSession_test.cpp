@@ -32,6 +32,10 @@ public:
     bool isReportingEnabled() const override { return true; }
     std::vector<Session> getAllActiveReportingSessions() const override { return {}; }
     Session findReportingSessionForID(std::int64_t) const override { return nullptr; }
+    Session findReportingSessionForID(std::int64_t, SessionLookups&) const override {
+        return nullptr;
+    }
+    void tell(const SessionLookups&) const override {}
     void sessionRetired(const HYReportingSession&) override {}
     platform::DriverSnapshotRef getSnapShot() override { return nullptr; }
     void sendDriverLogsForSession(const Session&) override {}
@@ -48,8 +52,8 @@ public:
 class StandaloneSessionTest : public ::testing::Test {
 protected:
     void broadcast() {
-        MessageFanOut(service_, {{{"n", 1}}, kAudioEventCategoryPlayback, 1}, sender_)
-            .route(std::nullopt, [](std::int64_t) { return nullptr; });
+        MessageFanOut fanOut({{{"n", 1}}, kAudioEventCategoryPlayback, 1}, std::nullopt, sender_);
+        EXPECT_TRUE(fanOut.advance(service_, [](std::int64_t) { return nullptr; }));
     }
 
     testing::TestPlatform platform_;

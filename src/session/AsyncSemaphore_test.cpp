@@ -121,6 +121,7 @@ public:
         timeout = std::move(onTimeout);
     }
     bool resume(platform::Task) override { return false; }
+    void continueWith(platform::Task) override {}
 
     platform::Task timeout;
 };

@@ -3,6 +3,7 @@
 #include <fmt/format.h>
 #include <utility>
 
+#include "common/ValueSize.h"
 #include "platform/Clock.h"
 #include "platform/Files.h"
 #include "platform/HYReportingUtilityDevice.h"
@@ -25,6 +26,8 @@ constexpr std::uint32_t kMessageMark = 0x21044838;
 
 constexpr std::uint32_t kLogsMode = 0777;
 constexpr AudioEventCategory kSummaryCategory = 0xFFFFFFFF;
+// What a session takes without its configuration and its messages.
+constexpr std::size_t kSessionBytes = 1536;
 // Of an application's name, where lines of the log describe a session.
 constexpr std::size_t kLongestName = 256;
 constexpr const char* kHostApplicationKey = "HostApplicationDisplayID";
@@ -51,7 +54,25 @@ HYReportingSession::HYReportingSession(std::int64_t reporterID,
     mark(kCreatedMark);
 }
 
+std::optional<platform::ClientBound> HYReportingSession::chargeTo(platform::ClientBudgetPtr owner) {
+    if (!owner->addSession()) {
+        return platform::ClientBound::Sessions;
+    }
+    owner_ = std::move(owner);
+    hasPlace_ = true;
+    ownBytes_ = platform::Allotment(owner_);
+    {
+        const MutexLock lock(mutex_);
+        configurationBytes_ = platform::Allotment(owner_);
+    }
+    return ownBytes_.resize(kSessionBytes) ? std::nullopt
+                                           : std::optional(platform::ClientBound::Memory);
+}
+
 HYReportingSession::~HYReportingSession() {
+    if (hasPlace_) {
+        owner_->removeSession();
+    }
     mark(kDestroyedMark);
     HY_LOG_INFO(HYReportingSessionCategory, "deallocing this session {}", reporterID_);
 }
@@ -87,12 +108,23 @@ void HYReportingSession::setConfiguration(const Dictionary* configuration) {
     }
 }
 
-void HYReportingSession::updateConfigurationWithContentsOfConfiguration(const Dictionary& update) {
+std::optional<platform::ClientBound>
+HYReportingSession::updateConfigurationWithContentsOfConfiguration(const Dictionary& update) {
     const MutexLock lock(mutex_);
+    Dictionary merged = configuration_;
     if (const Value* application = update.find(kClientApplicationKey)) {
-        configuration_.set(kHostApplicationKey, *application);
+        merged.set(kHostApplicationKey, *application);
     }
-    configuration_.merge(update); // Kept: the client's own key stays as well.
+    merged.merge(update); // Kept: the client's own key stays as well.
+    const std::size_t bytes = bytesOf(merged);
+    if (owner_ != nullptr && bytes > owner_->limits().configuration) {
+        return platform::ClientBound::Configuration;
+    }
+    if (!configurationBytes_.resize(bytes)) {
+        return platform::ClientBound::Memory;
+    }
+    configuration_ = std::move(merged);
+    return std::nullopt;
 }
 
 HYReportingSession::TransactionCompleteBlock
@@ -118,8 +150,11 @@ void HYReportingSession::start() {
         HY_LOG_INFO(HYReportingSessionCategory, "{} is already started", reporterID_);
         return;
     }
-    batch_.start({.keepsMessages = HYReportingUtilityIsInternalBuild(),
-                  .minimumPlaytime = HYReportingUtilityVolumeMinimumPlayingTime(serviceType())});
+    batch_.start(
+        {.keepsMessages = HYReportingUtilityIsInternalBuild(),
+         .minimumPlaytime = HYReportingUtilityVolumeMinimumPlayingTime(serviceType()),
+         .summaryBytes = (owner_ != nullptr ? owner_->limits() : platform::ClientLimits{}).summary,
+         .owner = owner_});
     mark(kStartMark);
     if (relayReportingEnabled()) {
         upload_.start(shared_from_this());

@@ -19,6 +19,7 @@
 #include "common/HYReportingUtility.h"
 #include "common/Mutex.h"
 #include "common/Value.h"
+#include "platform/ClientBudget.h"
 #include "platform/Clock.h"
 #include "platform/HWReport.h"
 #include "platform/QueueCheck.h"
@@ -46,6 +47,11 @@ public:
     initWithID(std::int64_t reporterID, std::vector<std::int32_t> processIdentifiers);
     ~HYReportingSession() override;
 
+    // Has the owner's budget pay for the session and for what it keeps of the owner's;
+    // nobody does before. The bound that refuses it; none when it fits. Called once,
+    // before anything else.
+    [[nodiscard]] std::optional<platform::ClientBound> chargeTo(platform::ClientBudgetPtr owner);
+
     // For lines of the log: of a long application name only the beginning.
     std::string description() const;
 
@@ -61,12 +67,18 @@ public:
     // Merges; null is ignored. Never removes a key.
     void setConfiguration(const Dictionary* configuration) HY_EXCLUDES(mutex_);
     // The merge for clients: also takes "VQHostApplicationDisplayID" as the
-    // application's name.
-    void updateConfigurationWithContentsOfConfiguration(const Dictionary& update)
-        HY_EXCLUDES(mutex_);
+    // application's name. The bound that it would pass, and then nothing has changed;
+    // none when it is done.
+    std::optional<platform::ClientBound>
+    updateConfigurationWithContentsOfConfiguration(const Dictionary& update) HY_EXCLUDES(mutex_);
 
     // A client's message, which sendMessage takes for one of the daemon's own.
     void offer(Dictionary message, AudioEventCategory category, AudioEventType type);
+    // What an offered message of `bytes` would add to what the session keeps.
+    std::size_t growthBy(AudioEventCategory category, AudioEventType type,
+                         std::size_t bytes) const {
+        return batch_.growthBy(category, type, bytes);
+    }
 
     // Batches the message unless it repeats its predecessor and, with relay
     // reporting enabled, hands it on to the relay queue. `sync` is ignored: every
@@ -137,6 +149,11 @@ private:
     void sendVolumeEvents();
     void sendSummaryEvent();
 
+    // Who pays for the session, if anybody; and its place among the owner's sessions.
+    platform::ClientBudgetPtr owner_;
+    bool hasPlace_ = false;
+    platform::Allotment ownBytes_;
+
     // Where sessions are made and, but for what is for any thread, used.
     const platform::SameQueue onServiceQueue_;
 
@@ -150,6 +167,7 @@ private:
 
     mutable Mutex mutex_;
     Dictionary configuration_ HY_GUARDED_BY(mutex_);
+    platform::Allotment configurationBytes_ HY_GUARDED_BY(mutex_);
     TransactionCompleteBlock transactionCompleteBlock_ HY_GUARDED_BY(mutex_);
     platform::DriverSnapshotRef driverSnapShot_ HY_GUARDED_BY(mutex_);
 };

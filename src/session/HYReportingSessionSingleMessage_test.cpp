@@ -76,5 +76,20 @@ TEST_F(SingleMessageTest, AFailureIsLoggedAndReplied) {
     EXPECT_THAT(replies, ElementsAre(platform_.relayReporting.failure));
 }
 
+TEST_F(SingleMessageTest, CountsAmongWhatItsClientHasOnItsWay) {
+    const auto client =
+        std::make_shared<platform::ClientBudget>(std::make_shared<platform::SharedLimits>());
+    {
+        const platform::BudgetScope pays(client);
+        for (int i = 0; i < 20; ++i) {
+            HYReportingSession::sendSingleMessage({{"text", std::string(900'000, 'x')}}, 1, 1,
+                                                  kAudioServiceTypeGeneric, {}, nullptr);
+        }
+    }
+    EXPECT_TRUE(client->isBacklogged());
+    platform_.queues.advance(std::chrono::seconds(1));
+    EXPECT_FALSE(client->isBacklogged());
+}
+
 } // namespace
 } // namespace halyard

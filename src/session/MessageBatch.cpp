@@ -3,8 +3,12 @@
 #include <algorithm>
 #include <array>
 
+#include "common/ValueSize.h"
+
 namespace halyard {
 namespace {
+
+constexpr std::size_t kKindBytes = 256; // beside the message
 
 constexpr std::array<std::string_view, 3> kComparisonExcludedKeys = {
     "processuptime_ms", "systemuptime_sec", "hyreporting_timestamp"};
@@ -63,18 +67,48 @@ bool MessageBatch::addUnlessRedundant(AudioEventCategory category, AudioEventTyp
     const auto [kind, known] = kindOf(category, type);
     if (known) {
         const bool isError = category == kAudioEventCategoryError || type == kAudioEventTypeError;
-        if (!isError && equalButForTimeStamps(message, kind->second.last)) {
+        if (!isError && kind->second.lastKept &&
+            equalButForTimeStamps(message, kind->second.last)) {
             return true;
         }
     }
     kind->second.count += 1;
-    kind->second.last = message;
+    keepLast(kind->second, message);
     if (keepsMessages_) {
-        entries_.push_back({&kind->first, kind->second.count, message});
+        keepEntry(kind->first, kind->second, message);
     }
     volumes_.take(message);
-    summary_.take(message);
+    summary_.take(message, sender());
     return false;
+}
+
+const platform::ClientBudgetPtr& MessageBatch::sender() const {
+    const auto& current = platform::ClientBudget::current();
+    return current != nullptr ? current : owner_;
+}
+
+std::size_t MessageBatch::growthBy(AudioEventCategory category, AudioEventType type,
+                                   std::size_t bytes) {
+    const std::size_t kept = kindOf(category, type).first->second.room.bytes();
+    return kKindBytes + bytes > kept ? kKindBytes + bytes - kept : 0;
+}
+
+void MessageBatch::keepLast(Kind& kind, const Dictionary& message) {
+    const std::size_t bytes = kKindBytes + bytesOf(message);
+    if (!kind.room.isOf(sender())) {
+        kind.room = platform::Allotment(sender());
+    }
+    kind.lastKept = kind.room.resize(bytes);
+    kind.last = kind.lastKept ? message : Dictionary();
+}
+
+// One that finds no room is missing in the file of internal builds, and nowhere else.
+void MessageBatch::keepEntry(const std::string& base, const Kind& kind, const Dictionary& message) {
+    platform::Allotment room(sender());
+    if (room.resize(sizeof(Entry) + bytesOf(message))) {
+        entries_.push_back({&base, kind.count, message});
+        entriesRoom_.push_back(std::move(room));
+    }
 }
 
 std::optional<platform::Repeats> MessageBatch::noteRepeat(AudioEventCategory category,

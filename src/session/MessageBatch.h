@@ -24,6 +24,7 @@
 
 #include "common/HYReportingUtility.h"
 #include "common/Value.h"
+#include "platform/ClientBudget.h"
 #include "platform/RelayReporting.h"
 #include "session/SessionEvents.h"
 
@@ -34,6 +35,8 @@ public:
     struct Options {
         bool keepsMessages = true;
         double minimumPlaytime = 0.5; // seconds; see VolumeStretches
+        std::size_t summaryBytes = platform::ClientLimits{}.summary;
+        platform::ClientBudgetPtr owner{}; // pays for what no client sent; may be null
     };
     struct Entry {
         const std::string* base; // "Category_Type"; owned by the batch
@@ -45,11 +48,14 @@ public:
     };
 
     MessageBatch() : MessageBatch(Options{}) {}
-    explicit MessageBatch(Options options)
-        : keepsMessages_(options.keepsMessages), volumes_(options.minimumPlaytime) {}
+    explicit MessageBatch(const Options& options)
+        : keepsMessages_(options.keepsMessages), owner_(options.owner),
+          volumes_(options.minimumPlaytime), summary_(options.summaryBytes) {}
     MessageBatch(const MessageBatch&) = delete; // entries point into kinds_
     MessageBatch& operator=(const MessageBatch&) = delete;
 
+    // What a message of `bytes` would add to what is kept of its kind.
+    std::size_t growthBy(AudioEventCategory category, AudioEventType type, std::size_t bytes);
     // Accepts the message unless it is redundant. True when it was.
     [[nodiscard]] bool addUnlessRedundant(AudioEventCategory category, AudioEventType type,
                                           const Dictionary& message);
@@ -72,13 +78,16 @@ public:
     const std::vector<Dictionary>& volumeEvents() const { return volumes_.events(); }
     // Hands the summary over: asked again it starts anew.
     std::optional<Dictionary> takeSummary(AudioServiceType serviceType) {
+        summary_.omit(volumes_.takeOmitted());
         return summary_.finish(serviceType);
     }
 
 private:
     struct Kind {
         std::uint32_t count = 0;
-        Dictionary last; // the newest accepted message
+        Dictionary last;       // the newest accepted message
+        bool lastKept = false; // There was room for it; else nothing repeats it.
+        platform::Allotment room;
         platform::Repeats repeats;
     };
 
@@ -86,8 +95,13 @@ private:
 
     // The kind of these, and whether it was there before.
     std::pair<Kinds::iterator, bool> kindOf(AudioEventCategory category, AudioEventType type);
+    // Who pays for what the message at hand leaves.
+    const platform::ClientBudgetPtr& sender() const;
+    void keepLast(Kind& kind, const Dictionary& message);
+    void keepEntry(const std::string& base, const Kind& kind, const Dictionary& message);
 
     const bool keepsMessages_;
+    const platform::ClientBudgetPtr owner_;
     // Bounded by the names that categories and types can have (a few thousand).
     Kinds kinds_;
     // The newest message's: the next one is often of the same.
@@ -95,6 +109,7 @@ private:
     AudioEventCategory lastCategory_ = 0;
     AudioEventType lastType_ = 0;
     std::vector<Entry> entries_;
+    std::vector<platform::Allotment> entriesRoom_;
     VolumeStretches volumes_;
     SummaryTexts summary_;
 };

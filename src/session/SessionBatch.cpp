@@ -39,6 +39,12 @@ SessionBatch::Verdict SessionBatch::createMessageIdentifierWithCategory(AudioEve
     return {true, batch_->noteRepeat(category, type, now)};
 }
 
+std::size_t SessionBatch::growthBy(AudioEventCategory category, AudioEventType type,
+                                   std::size_t bytes) const {
+    const MutexLock lock(mutex_);
+    return batch_ != nullptr ? batch_->growthBy(category, type, bytes) : 0;
+}
+
 std::vector<platform::Repeats> SessionBatch::takeAllRepeats() {
     const MutexLock lock(mutex_);
     return batch_ != nullptr ? batch_->takeAllRepeats() : std::vector<platform::Repeats>();

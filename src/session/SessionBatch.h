@@ -42,6 +42,9 @@ public:
                                                               AudioEventType type,
                                                               const Dictionary& message)
         HY_EXCLUDES(mutex_);
+    // What a message of `bytes` would add to what is kept; 0 without a batch.
+    std::size_t growthBy(AudioEventCategory category, AudioEventType type, std::size_t bytes) const
+        HY_EXCLUDES(mutex_);
     // Those that nothing has put an end to.
     std::vector<platform::Repeats> takeAllRepeats() HY_EXCLUDES(mutex_);
     // Redundant messages of all batches.

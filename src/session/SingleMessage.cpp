@@ -1,8 +1,11 @@
 #include "session/SingleMessage.h"
 
 #include <chrono>
+#include <memory>
 #include <utility>
 
+#include "common/ValueSize.h"
+#include "platform/ClientBudget.h"
 #include "platform/Log.h"
 #include "platform/Platform.h"
 #include "platform/Random.h"
@@ -20,6 +23,7 @@ constexpr std::uint32_t kMessageMark = 0x21044838;
 constexpr std::int64_t kSingleMessageSessionID = -1;
 // Kept: the spread of alarms stands in their log line only; the delay is the same for all.
 constexpr std::uint32_t kAlarmSpreadSeconds = 60;
+constexpr std::size_t kWaitingBytes = 512; // beside the message
 constexpr std::chrono::nanoseconds kSingleMessageDelay{1'000'000'000};
 
 MaybeError upload(const Message& message, AudioServiceType serviceType) {
@@ -54,6 +58,31 @@ MaybeError upload(const Message& message, AudioServiceType serviceType) {
     return error;
 }
 
+// A message that waits for its second counts among what its client has on its way, and
+// is the client's when it is delivered.
+class Waiting {
+public:
+    explicit Waiting(const Message& message)
+        : client_(ClientBudget::current()), bytes_(bytesOf(message.payload) + kWaitingBytes) {
+        if (client_ != nullptr) {
+            client_->begin(ClientBudget::Work::Singles, bytes_);
+        }
+    }
+    ~Waiting() {
+        if (client_ != nullptr) {
+            client_->end(ClientBudget::Work::Singles, 1, bytes_);
+        }
+    }
+    Waiting(const Waiting&) = delete;
+    Waiting& operator=(const Waiting&) = delete;
+
+    const ClientBudgetPtr& client() const { return client_; }
+
+private:
+    const ClientBudgetPtr client_;
+    const std::size_t bytes_;
+};
+
 void deliver(const Message& message, AudioServiceType serviceType, const SendReply& reply) {
     current().traceMarks->mark(kMessageMark, 0, 0, 0, 0);
     HY_LOG_DEBUG(HYReportingSessionCategory, "sending single message");
@@ -71,8 +100,11 @@ void sendSingleMessage(Message message, AudioServiceType serviceType, SendReply 
         serviceType == kAudioServiceTypeAlarms ? current().random->uniform(kAlarmSpreadSeconds) : 0;
     HY_LOG_DEBUG(HYReportingSessionCategory, "sending single message after delta {} for service {}",
                  delta, serviceType);
+    const auto waiting = std::make_shared<const Waiting>(message);
     current().queues->backgroundQueue().asyncAfter(
-        kSingleMessageDelay, [message = std::move(message), serviceType, reply = std::move(reply)] {
+        kSingleMessageDelay,
+        [message = std::move(message), serviceType, reply = std::move(reply), waiting] {
+            const BudgetScope pays(waiting->client());
             deliver(message, serviceType, reply);
         });
 }

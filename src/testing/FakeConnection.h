@@ -26,6 +26,7 @@ public:
 
     std::int32_t processIdentifier() const override { return pid_; }
     std::string description() const override { return "peer " + std::to_string(pid_); }
+    platform::ClientBudgetPtr budget() const override { return clientBudget; }
     void setExportedObject(std::shared_ptr<platform::ExportedObject> object) override {
         exportedBeforeResume = resumed == 0;
         exported = std::move(object);
@@ -62,6 +63,8 @@ public:
     std::function<void()> invalidationHandler;
     int resumed = 0;
     bool exportedBeforeResume = false;
+    std::shared_ptr<platform::SharedLimits> limits = std::make_shared<platform::SharedLimits>();
+    platform::ClientBudgetPtr clientBudget = std::make_shared<platform::ClientBudget>(limits);
 
 private:
     class Recorder final : public protocol::Responder {

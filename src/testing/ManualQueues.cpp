@@ -37,6 +37,10 @@ public:
         return true;
     }
 
+    void continueWith(platform::Task rest) override {
+        owner_.ready_.push_front({shared_from_this(), std::move(rest)});
+    }
+
     void run(const platform::Task& task) {
         const Running running(*this);
         running_ = true;

@@ -135,6 +135,21 @@ void readIds(TomlReader& reader, const NamedNode& at, Access& into) {
     reader.readIds(at, into.*list);
 }
 
+template <std::size_t platform::ClientLimits::*limit>
+void readLimitBytes(TomlReader& reader, const NamedNode& at, platform::ClientLimits& into) {
+    reader.readSize(at, 0, into.*limit);
+}
+
+template <std::size_t platform::ClientLimits::*limit>
+void readLimitCount(TomlReader& reader, const NamedNode& at, platform::ClientLimits& into) {
+    const auto count = at.node.value_exact<std::int64_t>();
+    if (count && *count > 0) {
+        into.*limit = static_cast<std::size_t>(*count);
+    } else {
+        reader.fail(at.node, fmt::format("{} must be a number, 1 or more", at.name));
+    }
+}
+
 constexpr Key<Settings> kAnalyticsKeys[] = {{"wanted", &readInto<&Settings::wantedEvents>}};
 constexpr Key<Settings> kLogKeys[] = {{"level", &readLevel}};
 constexpr Key<Settings> kServiceKeys[] = {{"idle_exit", &readIdleExit}};
@@ -146,6 +161,13 @@ constexpr Key<StoreLimits> kStoreKeys[] = {
     {"max_bytes", &readMaxBytes}, {"max_age", &readMaxAge}, {"sync_interval", &readSyncInterval}};
 constexpr Key<SessionValues> kSessionsKeys[] = {{"upload_limit", &readUploadLimit},
                                                 {"recount", &readInto<&SessionValues::recount>}};
+using Limits = platform::ClientLimits;
+constexpr Key<Limits> kLimitsKeys[] = {{"memory", &readLimitBytes<&Limits::memory>},
+                                       {"sessions", &readLimitCount<&Limits::sessions>},
+                                       {"connections", &readLimitCount<&Limits::connections>},
+                                       {"configuration", &readLimitBytes<&Limits::configuration>},
+                                       {"summary", &readLimitBytes<&Limits::summary>},
+                                       {"copies", &readLimitBytes<&Limits::copies>}};
 
 // A section whose keys are the settings' own, and one that is a value among them.
 template <auto& keys> void readKeys(TomlReader& reader, const NamedNode& at, Settings& into) {
@@ -165,6 +187,7 @@ constexpr Key<Settings> kSections[] = {
     {"access", &readPart<&Settings::access, kAccessKeys>},
     {"store", &readPart<&Settings::store, kStoreKeys>},
     {"sessions", &readPart<&Settings::sessions, kSessionsKeys>},
+    {"limits", &readPart<&Settings::clients, kLimitsKeys>},
     {"log", &readKeys<kLogKeys>},
     {"service", &readKeys<kServiceKeys>},
     {"drivers", &readDrivers},

@@ -20,6 +20,7 @@
 #include "linux/drivers/DriverChannel.h"
 #include "linux/net/Peer.h"
 #include "linux/store/StoreLimits.h"
+#include "platform/ClientBudget.h"
 #include "platform/SessionRules.h"
 
 namespace halyard::linux_ {
@@ -33,6 +34,7 @@ struct Settings {
     std::vector<std::string> wantedEvents{"com.kestrel.halyard.*"}; // shell patterns
     Access access;
     StoreLimits store;
+    platform::ClientLimits clients;
     platform::SessionRules::Values sessions;
     LogLevel logLevel = LogLevel::Info;
     std::optional<std::chrono::seconds> idleExit; // none: never

@@ -332,5 +332,16 @@ TEST(SettingsTest, TheSyncIntervalIsBetween50MillisecondsAnd10Minutes) {
     }
 }
 
+TEST(SettingsTest, LimitsOfClients) {
+    const platform::ClientLimits limits =
+        settings("[limits]\nmemory = \"1GiB\"\nsessions = 7\nconnections = 8\n"
+                 "configuration = 4096\nsummary = \"1MiB\"\ncopies = 0")
+            .clients;
+    EXPECT_EQ(limits, (platform::ClientLimits{std::size_t{1} << 30, 7, 8, 4096, 1 << 20, 0}));
+    EXPECT_EQ(mistake("limits.sessions = 0"), "1:19: limits.sessions must be a number, 1 or more");
+    EXPECT_EQ(mistake("limits.copies = \"much\""),
+              "1:17: limits.copies must be a size such as \"256MiB\" or a number of bytes");
+}
+
 } // namespace
 } // namespace halyard::linux_

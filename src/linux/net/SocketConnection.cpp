@@ -17,6 +17,10 @@ using protocol::FrameScanner;
 using protocol::Method;
 
 constexpr std::size_t kKeptCapacity = 4096;
+// What a connection takes that has nothing to do.
+constexpr std::size_t kConnectionBytes = 2048;
+// What an element takes beside its bytes, once it is decoded; a list of one has most.
+constexpr std::size_t kElementBytes = 56;
 
 bool needsAdministrator(Method method) {
     return method == Method::KillService || method == Method::AdminPostNotification ||
@@ -43,18 +47,29 @@ void dropSpareCapacity(std::string& text) {
     }
 }
 
+// Small ones are a connection's own.
+std::size_t chargedFor(const std::string& text) {
+    return text.capacity() > kKeptCapacity ? text.capacity() : 0;
+}
+
 } // namespace
 
 // Counts the requests of one read until all their work is done.
 class SocketConnection::ReadCharge final : public Charge {
 public:
     explicit ReadCharge(std::shared_ptr<SocketConnection> connection)
-        : connection_(std::move(connection)) {}
-    ~ReadCharge() override { connection_->workDone(requests_, bytes_); }
+        : Charge(connection->budget_), connection_(std::move(connection)) {}
+    ~ReadCharge() override {
+        client()->end(platform::ClientBudget::Work::Requests, requests_, memory_);
+        connection_->workDone(requests_, bytes_);
+    }
 
-    void add(std::size_t bytes) {
+    // `memory` is what it takes once it is decoded.
+    void add(std::size_t bytes, std::size_t memory) {
+        client()->begin(platform::ClientBudget::Work::Requests, memory);
         ++requests_;
         bytes_ += bytes;
+        memory_ += memory;
         connection_->unprocessedRequests_.fetch_add(1);
         connection_->unprocessedBytes_.fetch_add(bytes);
     }
@@ -63,6 +78,7 @@ private:
     const std::shared_ptr<SocketConnection> connection_;
     std::size_t requests_ = 0;
     std::size_t bytes_ = 0;
+    std::size_t memory_ = 0;
 };
 
 // Sends the answer to one request back, if its connection is still there.
@@ -101,10 +117,17 @@ void ListenerShared::remove(const std::shared_ptr<SocketConnection>& connection,
 }
 
 SocketConnection::SocketConnection(asio::local::stream_protocol::socket socket, Peer peer,
-                                   PeerRights rights, ListenerShared& shared)
-    : socket_(std::move(socket)), peer_(std::move(peer)), rights_(rights), shared_(shared) {}
+                                   PeerRights rights, platform::ClientBudgetPtr budget,
+                                   ListenerShared& shared)
+    : socket_(std::move(socket)), peer_(std::move(peer)), rights_(rights),
+      budget_(std::move(budget)), ownBytes_(budget_), shared_(shared), pendingBytes_(budget_),
+      outBytes_(budget_) {
+    (void)ownBytes_.resize(kConnectionBytes);
+}
 
-SocketConnection::~SocketConnection() = default;
+SocketConnection::~SocketConnection() {
+    budget_->removeConnection();
+}
 
 std::string SocketConnection::description() const {
     return peer_.description();
@@ -129,17 +152,18 @@ void SocketConnection::resume() {
 bool SocketConnection::mayRead() const {
     return unprocessedRequests_.load() < kMaxUnprocessedRequests &&
            unprocessedBytes_.load() < kMaxUnprocessedBytes &&
-           (unsentBytes_.load() <= kUnsentPause || finishing_) && !shared_.pressure.isOn();
+           (unsentBytes_.load() <= kUnsentPause || finishing_) && !budget_->isBusy() &&
+           !shared_.pressure.isOn();
 }
 
 // How a connection stops reading and goes on.
 //
-// Whether it may read depends on four things that end on four threads: its
-// charges (on whichever worker lets go of the last one), its unsent answers
-// (here, or where an answer is made), the pressure (the store's thread, the
-// background one). None of them knows how the others stand. So there is one
-// question, mayRead(), that is asked again each time one of them has ended, and
-// never an answer that is kept.
+// Whether it may read depends on five things that end on five threads: its
+// charges and those of its process (on whichever worker lets go of the last one),
+// its unsent answers (here, or where an answer is made), what its process has on its
+// way to the disk, the pressure (the store's thread, the background one). None of them knows how
+// the others stand. So there is one question, mayRead(), that is asked again each time one of them
+// has ended, and never an answer that is kept.
 //
 // What must not happen is that the last one ends between the question and the
 // pause, so that nobody asks again. Hence `paused_` is set first and the question
@@ -189,12 +213,17 @@ void SocketConnection::waitReadable() {
                        [self = shared_from_this()](const asio::error_code& error) {
                            self->waiting_ = false;
                            if (!error && !self->ended_) {
-                               self->readAvailable();
+                               self->waiting_ = true; // for its turn
+                               self->shared_.turns.ask(self);
                            }
                        });
 }
 
 void SocketConnection::readAvailable() {
+    waiting_ = false;
+    if (ended_) {
+        return;
+    }
     if (!mayRead()) {
         readIfAllowed();
         return;
@@ -219,8 +248,15 @@ void SocketConnection::readAvailable() {
         if (pending_.empty()) {
             dropSpareCapacity(pending_);
         }
+        chargePending();
     }
     readIfAllowed();
+}
+
+void SocketConnection::chargePending() {
+    if (!ended_ && !pendingBytes_.resize(chargedFor(pending_))) {
+        breakOff(platform::boundReached(platform::ClientBound::Memory).message);
+    }
 }
 
 std::size_t SocketConnection::takeFrames(std::string_view stream) {
@@ -244,9 +280,10 @@ std::size_t SocketConnection::takeFrames(std::string_view stream) {
             break;
         }
         const std::size_t length = scanner_.frameLength();
+        const std::size_t memory = length + scanner_.elements() * kElementBytes;
         scanner_.reset();
         taken += length;
-        if (!takeFrame(rest.substr(0, length), charge)) {
+        if (!takeFrame(rest.substr(0, length), memory, charge)) {
             breakOff("a frame that is no MessagePack-RPC request");
             break;
         }
@@ -254,7 +291,7 @@ std::size_t SocketConnection::takeFrames(std::string_view stream) {
     return taken;
 }
 
-bool SocketConnection::takeFrame(std::string_view frame,
+bool SocketConnection::takeFrame(std::string_view frame, std::size_t memory,
                                  const std::shared_ptr<ReadCharge>& charge) {
     auto call = shared_.decoder.decode(frame);
     if (!call) {
@@ -272,7 +309,7 @@ bool SocketConnection::takeFrame(std::string_view frame,
                                             protocol::methodName(*call->method), peer_.uid)});
         return true;
     }
-    charge->add(frame.size());
+    charge->add(frame.size(), memory);
     protocol::Reply reply;
     if (call->messageID) {
         reply =
@@ -298,9 +335,10 @@ void SocketConnection::send(std::string_view bytes) {
     }
     out_ += bytes;
     unsentBytes_.store(out_.size());
-    if (out_.size() > kMaxUnsentBytes) {
+    if (out_.size() > kMaxUnsentBytes || !outBytes_.resize(chargedFor(out_))) {
+        const bool complete = out_.size() <= kMaxUnsentBytes;
         asio::post(socket_.get_executor(),
-                   [self = shared_from_this()] { self->closeUnlessLeft(); });
+                   [self = shared_from_this(), complete] { self->closeUnlessLeft(complete); });
     } else if (!writeScheduled_) {
         writeScheduled_ = true;
         asio::post(socket_.get_executor(), [self = shared_from_this()] { self->writeSome(); });
@@ -322,6 +360,7 @@ SocketConnection::Written SocketConnection::writeOnce() {
     writeScheduled_ = !out_.empty();
     if (out_.empty()) {
         dropSpareCapacity(out_);
+        (void)outBytes_.resize(chargedFor(out_)); // Which is less.
     }
     return out_.empty() ? Written::All : Written::Some;
 }
@@ -351,14 +390,16 @@ void SocketConnection::stopAnswering() {
     const MutexLock lock(outMutex_);
     deaf_ = true;
     out_ = std::string();
+    (void)outBytes_.resize(0);
     unsentBytes_.store(0);
 }
 
-void SocketConnection::closeUnlessLeft() {
+// Answers for which there is no room may go at once, if none has been dropped.
+void SocketConnection::closeUnlessLeft(bool complete) {
     writeSome();
     if (finishing_) {
         stopAnswering(); // What can still come is little, and is not held up by this.
-    } else if (ending_ != Ending::Broken) {
+    } else if (ending_ != Ending::Broken && !(complete && unsentBytes_.load() == 0)) {
         breakOff("answers left lying");
     }
 }
@@ -406,6 +447,7 @@ void SocketConnection::end(Ending ending) {
         return;
     }
     const auto self = shared_from_this();
+    const ChargeScope scope(std::make_shared<Charge>(budget_)); // Behind what it asked for.
     stopAnswering();
     asio::error_code ignored;
     socket_.close(ignored);

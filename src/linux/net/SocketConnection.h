@@ -6,7 +6,9 @@
 //  - while its requests that are not processed number more than 1,024 or measure
 //    more than 4 MiB,
 //  - while the peer leaves answers lying, and closes when they pass 4 MiB,
+//  - while more of its process's work is on its way than one client may have,
 //  - while the whole daemon is under pressure.
+// Clients are read in turns (see ReadTurns), however many connections each has.
 //
 // A peer that takes no more answers has usually left; what it wrote before is
 // still read and done. One that breaks the protocol loses this connection and
@@ -26,6 +28,7 @@
 #include "common/Mutex.h"
 #include "linux/net/Peer.h"
 #include "linux/net/ProcessList.h"
+#include "linux/net/ReadTurns.h"
 #include "linux/queues/Charge.h"
 #include "linux/queues/Pressure.h"
 #include "platform/Listener.h"
@@ -47,7 +50,8 @@ class SocketConnection;
 
 // What the connections of one listener share; on the io_context's thread.
 struct ListenerShared {
-    explicit ListenerShared(Pressure& p) : pressure(p), buffer(kReadSize, '\0') {}
+    ListenerShared(Pressure& p, asio::io_context& context)
+        : pressure(p), buffer(kReadSize, '\0'), turns(context) {}
 
     static constexpr std::size_t kReadSize = 64 * 1024;
 
@@ -57,6 +61,7 @@ struct ListenerShared {
     std::unordered_set<std::shared_ptr<SocketConnection>> connections;
     std::function<void(std::size_t connections)> connectionsChanged; // may be none
     ListenerCounters counters;
+    ReadTurns turns;
     ProcessList processes; // of the connections; any thread
 
     void add(const std::shared_ptr<SocketConnection>& connection, std::int32_t pid);
@@ -72,12 +77,14 @@ public:
     // More unsent bytes than this, and the peer is not read from.
     static constexpr std::size_t kUnsentPause = 64 * 1024;
 
+    // Requires that the budget has taken the connection.
     SocketConnection(asio::local::stream_protocol::socket socket, Peer peer, PeerRights rights,
-                     ListenerShared& shared);
+                     platform::ClientBudgetPtr budget, ListenerShared& shared);
     ~SocketConnection() override;
 
     std::int32_t processIdentifier() const override { return peer_.pid; }
     std::string description() const override;
+    platform::ClientBudgetPtr budget() const override { return budget_; }
     void setExportedObject(std::shared_ptr<platform::ExportedObject> object) override;
     void setInterruptionHandler(std::function<void()> handler) override;
     void setInvalidationHandler(std::function<void()> handler) override;
@@ -90,6 +97,7 @@ public:
     // What it has written and nobody has read.
     std::size_t unreadBytes();
     void readIfAllowed();
+    void readAvailable();
 
     // Any thread.
     void send(std::string_view bytes) HY_EXCLUDES(outMutex_);
@@ -105,21 +113,25 @@ private:
     // Whether it may not; then somebody calls readIfAllowed() once it may again.
     bool pausesReading();
     void waitReadable();
-    void readAvailable();
+    // Breaks off when the budget has no room for a frame that has not come in whole.
+    void chargePending();
     // Takes the frames at the front of `stream`; returns how many bytes they had.
     std::size_t takeFrames(std::string_view stream);
-    bool takeFrame(std::string_view frame, const std::shared_ptr<ReadCharge>& charge);
+    bool takeFrame(std::string_view frame, std::size_t memory,
+                   const std::shared_ptr<ReadCharge>& charge);
     void refuseCall(const protocol::Call& call, MaybeError error);
     Written writeOnce() HY_EXCLUDES(outMutex_);
     void writeSome();
     void stopAnswering() HY_EXCLUDES(outMutex_);
-    void closeUnlessLeft();
+    void closeUnlessLeft(bool complete);
     void breakOff(std::string_view why);
     void end(Ending ending);
 
     asio::local::stream_protocol::socket socket_;
     const Peer peer_;
     const PeerRights rights_;
+    const platform::ClientBudgetPtr budget_;
+    platform::Allotment ownBytes_;
     ListenerShared& shared_;
 
     std::shared_ptr<platform::ExportedObject> exported_;
@@ -127,7 +139,8 @@ private:
     std::function<void()> invalidationHandler_;
 
     protocol::FrameScanner scanner_;
-    std::string pending_;     // The bytes of frames that wait to be taken.
+    std::string pending_; // The bytes of frames that wait to be taken.
+    platform::Allotment pendingBytes_;
     bool framesWait_ = false; // They do not wait for more bytes.
     bool waiting_ = false;
     bool ended_ = false;
@@ -141,6 +154,7 @@ private:
 
     Mutex outMutex_;
     std::string out_ HY_GUARDED_BY(outMutex_);
+    platform::Allotment outBytes_ HY_GUARDED_BY(outMutex_);
     bool writeScheduled_ HY_GUARDED_BY(outMutex_) = false;
     bool deaf_ HY_GUARDED_BY(outMutex_) = false; // The peer takes no more answers.
     std::atomic<std::size_t> unsentBytes_{0};

@@ -98,8 +98,9 @@ std::optional<int> inheritedSocket(std::string_view name) {
 SocketListener::SocketListener(asio::io_context& context, Pressure& pressure, int listeningSocket,
                                Authorizer authorizer)
     : context_(context), acceptor_(context, asio::local::stream_protocol(), listeningSocket),
-      retry_(context), authorizer_(std::move(authorizer)), shared_(pressure) {
+      retry_(context), authorizer_(std::move(authorizer)), shared_(pressure, context) {
     raiseDescriptorLimit();
+    onClientRelieved(nullptr);
     pressure.setReliefHandler([this] { asio::post(context_, [this] { resumeReading(); }); });
     shared_.connectionsChanged = [this](std::size_t connections) { tellConnections(connections); };
 }
@@ -168,8 +169,16 @@ void SocketListener::accepted(asio::local::stream_protocol::socket socket) {
         return;
     }
     refusedUid_.reset();
+    auto budget = budgets_.of(peer);
+    if (!budget->addConnection()) {
+        refuseAnother(peer);
+        return;
+    }
+    crowdedPid_.reset();
     ++shared_.counters.accepted;
-    auto connection = std::make_shared<SocketConnection>(std::move(socket), peer, rights, shared_);
+    const ChargeScope scope(std::make_shared<Charge>(budget)); // Its first work comes first.
+    auto connection = std::make_shared<SocketConnection>(std::move(socket), peer, rights,
+                                                         std::move(budget), shared_);
     shared_.add(connection, peer.pid);
     if (delegate_ == nullptr || !delegate_->shouldAcceptNewConnection(connection)) {
         connection->close();
@@ -182,6 +191,25 @@ void SocketListener::refuse(const Peer& peer) {
         refusedUid_ = peer.uid;
         HY_LOG_ERROR(HYReportingPlatformCategory, "refusing connections of {}", peer.description());
     }
+}
+
+void SocketListener::refuseAnother(const Peer& peer) {
+    ++shared_.counters.refused;
+    if (crowdedPid_ != peer.pid) {
+        crowdedPid_ = peer.pid;
+        HY_LOG_ERROR(HYReportingPlatformCategory, "refusing more connections of {}: {}",
+                     peer.description(),
+                     platform::boundReached(platform::ClientBound::Connections).message);
+    }
+}
+
+void SocketListener::onClientRelieved(std::function<void()> relieved) {
+    budgets_.onRelief([this, relieved = std::move(relieved)] {
+        asio::post(context_, [this] { resumeReading(); });
+        if (relieved) {
+            relieved();
+        }
+    });
 }
 
 void SocketListener::resumeReading() {

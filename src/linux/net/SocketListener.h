@@ -16,6 +16,7 @@
 #include <vector>
 
 #include "common/Result.h"
+#include "linux/net/ClientBudgets.h"
 #include "linux/net/Peer.h"
 #include "linux/net/SocketConnection.h"
 #include "linux/queues/Pressure.h"
@@ -55,6 +56,12 @@ public:
     // What was written to the connections and nobody has read.
     std::size_t unreadBytes();
 
+    // Any thread. What one client process may make the daemon keep.
+    void setLimits(const platform::ClientLimits& limits) { budgets_.setLimits(limits); }
+    // Called on any thread when a client whose work had piled up may go on; it is read
+    // from again by itself.
+    void onClientRelieved(std::function<void()> relieved);
+
     // Any thread.
     std::vector<std::int32_t> connectedProcesses() const { return shared_.processes.pids(); }
     const ListenerCounters& counters() const { return shared_.counters; }
@@ -65,6 +72,7 @@ private:
     void acceptFailed(const asio::error_code& error);
     void answerLeaver(bool stopped);
     void refuse(const Peer& peer);
+    void refuseAnother(const Peer& peer);
     void resumeReading();
     void tellConnections(std::size_t connections);
 
@@ -73,8 +81,10 @@ private:
     asio::steady_timer retry_;
     const Authorizer authorizer_;
     platform::ListenerDelegate* delegate_ = nullptr;
+    ClientBudgets budgets_;
     ListenerShared shared_;
     std::optional<std::uint32_t> refusedUid_; // The episode that has been logged.
+    std::optional<std::int32_t> crowdedPid_;  // The same for too many of a process.
     bool acceptFailureLogged_ = false;
     std::function<void(bool)> leaver_;
     std::function<void(std::size_t)> connectionsChanged_; // may be none

@@ -13,6 +13,8 @@ namespace {
 constexpr std::size_t kKeptCapacity = 16;
 // Tasks after which the queues they submitted to are let go, whatever follows.
 constexpr std::size_t kTasksPerWakeUp = 64;
+// Tasks after which the worker's other queues have their turn.
+constexpr std::size_t kTasksPerTurn = 512;
 
 } // namespace
 
@@ -40,6 +42,14 @@ void WakeUpScope::flush() {
     queues_.clear();
 }
 
+void WakeableQueue::wakeSoon(WakeableQueue& queue) {
+    if (WakeUpScope* const scope = WakeUpScope::current()) {
+        scope->queues_.push_back(queue.shared_from_this());
+    } else {
+        queue.wakeWorker();
+    }
+}
+
 BlockingSection::BlockingSection() : interrupted_(std::exchange(WakeUpScope::current(), nullptr)) {
     for (WakeUpScope* scope = interrupted_; scope != nullptr; scope = scope->outer_) {
         scope->flush();
@@ -57,22 +67,18 @@ void PooledSerialQueue::async(platform::Task task) {
 }
 
 void PooledSerialQueue::asyncAfter(std::chrono::nanoseconds delay, platform::Task task) {
-    timer_(delay, [self = shared_from_this(), task = std::move(task)] { self->async(task); });
+    timer_(delay, [self = shared(), task = std::move(task)] { self->async(task); });
 }
 
 void PooledSerialQueue::scheduleLocked() {
     if (!scheduled_ && !suspended_) {
         scheduled_ = true;
-        if (WakeUpScope* const scope = WakeUpScope::current()) {
-            scope->queues_.push_back(shared_from_this());
-        } else {
-            wakeWorker();
-        }
+        wakeSoon(*this);
     }
 }
 
 void PooledSerialQueue::wakeWorker() {
-    worker_.post([self = shared_from_this()] { self->drain(); });
+    worker_.post([self = shared()] { self->drain(); });
 }
 
 void PooledSerialQueue::suspend(std::chrono::nanoseconds limit, platform::Task onTimeout) {
@@ -84,7 +90,7 @@ void PooledSerialQueue::suspend(std::chrono::nanoseconds limit, platform::Task o
         suspendCalled_ = true;
         wait = ++waits_;
     }
-    timer_(limit, [self = shared_from_this(), wait, onTimeout = std::move(onTimeout)] {
+    timer_(limit, [self = shared(), wait, onTimeout = std::move(onTimeout)] {
         (void)self->resumeWait(wait, onTimeout);
     });
 }
@@ -109,6 +115,10 @@ bool PooledSerialQueue::resumeWait(std::uint64_t wait, platform::Task first) {
     return true;
 }
 
+void PooledSerialQueue::continueWith(platform::Task rest) {
+    rest_ = Item{std::move(rest), currentCharge()};
+}
+
 bool PooledSerialQueue::isIdle() const {
     const MutexLock lock(mutex_);
     return items_.empty() && !scheduled_ && !suspended_;
@@ -125,9 +135,13 @@ void PooledSerialQueue::drain() {
         const MutexLock lock(mutex_);
         if (ran < items.size()) {
             // If it has been resumed meanwhile, what it resumed with goes first.
-            const auto at = items_.begin() + (suspended_ ? 0 : 1);
+            const auto at = items_.begin() + (suspended_ || !suspendCalled_ ? 0 : 1);
             items_.insert(at, std::make_move_iterator(items.begin() + std::ptrdiff_t(ran)),
                           std::make_move_iterator(items.end()));
+        }
+        if (rest_) {
+            items_.insert(items_.begin(), std::move(*rest_));
+            rest_.reset();
         }
         scheduled_ = false;
         if (!items_.empty()) {
@@ -144,7 +158,7 @@ std::size_t PooledSerialQueue::runUntilSuspended(std::vector<Item>& items) {
     const Running running(*this);
     WakeUpScope wakeUps;
     std::size_t ran = 0;
-    while (ran < items.size() && !suspendCalled_) {
+    while (ran < items.size() && ran < kTasksPerTurn && !suspendCalled_ && !rest_) {
         if (ran % kTasksPerWakeUp == 0) {
             wakeUps.flush();
         }

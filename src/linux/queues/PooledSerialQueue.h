@@ -8,6 +8,7 @@
 #include <cstdint>
 #include <functional>
 #include <memory>
+#include <optional>
 #include <vector>
 
 #include "common/Mutex.h"
@@ -17,7 +18,16 @@
 
 namespace halyard::linux_ {
 
-class PooledSerialQueue;
+// A queue that runs on a worker's thread once it has been woken.
+class WakeableQueue : public platform::SerialQueue,
+                      public std::enable_shared_from_this<WakeableQueue> {
+protected:
+    friend class WakeUpScope;
+
+    virtual void wakeWorker() = 0;
+    // At the end of the calling thread's scope; at once outside of any.
+    static void wakeSoon(WakeableQueue& queue);
+};
 
 // While one lives, queues that the thread submits to are not run before the
 // scope ends: they find all of what it submitted, where each task by itself
@@ -35,17 +45,16 @@ public:
 
 private:
     friend class BlockingSection;
-    friend class PooledSerialQueue;
+    friend class WakeableQueue;
 
     // The calling thread's innermost scope; null outside of any.
     static WakeUpScope*& current();
 
     WakeUpScope* const outer_;
-    std::vector<std::shared_ptr<PooledSerialQueue>> queues_;
+    std::vector<std::shared_ptr<WakeableQueue>> queues_;
 };
 
-class PooledSerialQueue final : public platform::SerialQueue,
-                                public std::enable_shared_from_this<PooledSerialQueue> {
+class PooledSerialQueue final : public WakeableQueue {
 public:
     // Runs a task once a time has passed; see Queues.
     using Timer = std::function<void(std::chrono::nanoseconds, platform::Task)>;
@@ -58,6 +67,7 @@ public:
     void suspend(std::chrono::nanoseconds limit, platform::Task onTimeout) override
         HY_EXCLUDES(mutex_);
     bool resume(platform::Task first) override HY_EXCLUDES(mutex_);
+    void continueWith(platform::Task rest) override HY_EXCLUDES(mutex_);
 
     // Nothing runs and nothing waits, also not for the end of a suspension.
     bool isIdle() const HY_EXCLUDES(mutex_);
@@ -68,13 +78,15 @@ private:
         ChargePtr charge;
     };
 
-    friend class WakeUpScope;
-
+    std::shared_ptr<PooledSerialQueue> shared() {
+        return std::static_pointer_cast<PooledSerialQueue>(shared_from_this());
+    }
     bool resumeWait(std::uint64_t wait, platform::Task first) HY_EXCLUDES(mutex_);
     void scheduleLocked() HY_REQUIRES(mutex_);
-    void wakeWorker();
+    void wakeWorker() override;
     void drain();
-    // How many ran: all, or as many as up to the one that suspended the queue.
+    // How many ran: as many as have their turn, or up to the one that suspended the
+    // queue or has more to do.
     std::size_t runUntilSuspended(std::vector<Item>& items) HY_EXCLUDES(mutex_);
 
     Worker& worker_;
@@ -84,7 +96,9 @@ private:
     bool scheduled_ HY_GUARDED_BY(mutex_) = false;
     bool suspended_ HY_GUARDED_BY(mutex_) = false;
     std::uint64_t waits_ HY_GUARDED_BY(mutex_) = 0;
-    bool suspendCalled_ = false; // Touched only by whoever drains.
+    // Touched only by whoever drains.
+    bool suspendCalled_ = false;
+    std::optional<Item> rest_; // of the task that ran last
 };
 
 } // namespace halyard::linux_

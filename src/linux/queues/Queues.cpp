@@ -40,12 +40,14 @@ void Queues::stop() {
 std::shared_ptr<platform::SerialQueue> Queues::makeSerialQueue(std::string_view /*name*/,
                                                                platform::QueuePriority priority) {
     const bool isService = priority == platform::QueuePriority::UserInteractive;
-    auto queue = std::make_shared<PooledSerialQueue>(isService ? service_ : relay_, timer_);
-    const MutexLock lock(mutex_);
     if (isService) {
-        serviceQueue_ = queue;
-        return queue;
+        auto fair = std::make_shared<FairSerialQueue>(service_, timer_);
+        const MutexLock lock(mutex_);
+        serviceQueue_ = fair;
+        return fair;
     }
+    auto queue = std::make_shared<PooledSerialQueue>(relay_, timer_);
+    const MutexLock lock(mutex_);
     if (relayQueues_.size() >= sweepAt_) {
         std::erase_if(relayQueues_, [](const auto& each) { return each.expired(); });
         sweepAt_ = std::max(kLeastSweep, relayQueues_.size() * 2);
@@ -97,7 +99,7 @@ Queues::busyRelayQueues(const platform::SerialQueue* except) {
     return busy;
 }
 
-std::shared_ptr<PooledSerialQueue> Queues::serviceQueue() {
+std::shared_ptr<FairSerialQueue> Queues::serviceQueue() {
     const MutexLock lock(mutex_);
     return serviceQueue_.lock();
 }
@@ -105,9 +107,15 @@ std::shared_ptr<PooledSerialQueue> Queues::serviceQueue() {
 void Queues::onServiceQueue(platform::Task task) {
     const auto service = serviceQueue();
     if (service != nullptr) {
-        service->async(std::move(task));
+        service->asyncBehindAll(std::move(task));
     } else {
         task(); // It has gone, and with it what it had to do.
+    }
+}
+
+void Queues::clientRelieved() {
+    if (const auto service = serviceQueue()) {
+        service->clientRelieved();
     }
 }
 

@@ -13,6 +13,7 @@
 
 #include "common/Mutex.h"
 #include "linux/queues/ContextQueue.h"
+#include "linux/queues/FairSerialQueue.h"
 #include "linux/queues/PooledSerialQueue.h"
 #include "linux/queues/Pressure.h"
 #include "linux/queues/Worker.h"
@@ -42,8 +43,10 @@ public:
     // it is called on counts as drained.
     void drain(std::function<void()> done);
 
-    // Runs a task behind what the service queue has to do now.
+    // Runs a task behind what the service queue has to do now, for whomever.
     void onServiceQueue(platform::Task task) HY_EXCLUDES(mutex_);
+    // A client that was held back need not be any more.
+    void clientRelieved() HY_EXCLUDES(mutex_);
 
     // Runs a task on each thread of these queues, soon.
     void onEachThread(const platform::Task& task);
@@ -68,7 +71,7 @@ private:
 
     void runDelayed(std::list<Delayed>::iterator delayed);
     void addDelayed(std::chrono::nanoseconds delay, platform::Task task);
-    std::shared_ptr<PooledSerialQueue> serviceQueue() HY_EXCLUDES(mutex_);
+    std::shared_ptr<FairSerialQueue> serviceQueue() HY_EXCLUDES(mutex_);
     std::vector<std::shared_ptr<PooledSerialQueue>>
     busyRelayQueues(const platform::SerialQueue* except) HY_EXCLUDES(mutex_);
     void drainRelayQueues(std::function<void()> done, const platform::SerialQueue* except);
@@ -88,7 +91,7 @@ private:
     Mutex mutex_;
     std::vector<std::weak_ptr<PooledSerialQueue>> relayQueues_ HY_GUARDED_BY(mutex_);
     std::size_t sweepAt_ HY_GUARDED_BY(mutex_) = 64;
-    std::weak_ptr<PooledSerialQueue> serviceQueue_ HY_GUARDED_BY(mutex_);
+    std::weak_ptr<FairSerialQueue> serviceQueue_ HY_GUARDED_BY(mutex_);
 };
 
 } // namespace halyard::linux_

@@ -59,7 +59,10 @@ void StoreQueue::appendLocked(StoreRow&& row, std::size_t bytes) {
         groupStarts_.push_back({items_.size(), std::chrono::steady_clock::now()});
     }
     const bool wasFull = isFullLocked();
-    items_.push_back({std::move(row), bytes});
+    items_.push_back({std::move(row), bytes, platform::ClientBudget::current()});
+    if (const auto& client = items_.back().client) {
+        client->begin(platform::ClientBudget::Work::Rows, bytes);
+    }
     queuedBytes_ += bytes;
     ++pushed_;
     ++heldRows_;
@@ -234,6 +237,9 @@ void StoreQueue::settle(std::span<const StoreItem> rows) {
     for (const StoreItem& item : rows) {
         bytes += item.bytes;
         closes += isClose(item.row) ? 1 : 0;
+        if (item.client != nullptr) {
+            item.client->end(platform::ClientBudget::Work::Rows, 1, item.bytes);
+        }
     }
     {
         const MutexLock lock(mutex_);

@@ -1,30 +1,11 @@
 #include "linux/store/StoreRow.h"
 
+#include "common/ValueSize.h"
+
 #include <array>
 
 namespace halyard::linux_ {
 namespace {
-
-constexpr std::size_t kBlockBytes = 48; // a block's header and what malloc adds
-constexpr std::size_t kMaxInlineText = 14;
-
-std::size_t bytesBeyond(const Value& value) {
-    switch (value.kind()) {
-    case Value::Kind::String:
-        return value.text().size() > kMaxInlineText ? kBlockBytes + value.text().size() : 0;
-    case Value::Kind::List: {
-        std::size_t sum = kBlockBytes;
-        for (const Value& item : value.list()) {
-            sum += sizeof(Value) + bytesBeyond(item);
-        }
-        return sum;
-    }
-    case Value::Kind::Dictionary:
-        return storeBytes(value.dictionary());
-    default:
-        return 0;
-    }
-}
 
 struct Bytes {
     std::size_t operator()(const StoreOpenRow& row) const {
@@ -39,7 +20,7 @@ struct Bytes {
     std::size_t operator()(const StoreEnergyRow& row) const { return storeBytes(row.payload); }
     std::size_t operator()(const StoreMetricRow& row) const { return row.message.size(); }
     std::size_t operator()(const StoreIncidentRow& row) const {
-        return storeBytes(row.signature) + bytesBeyond(row.report);
+        return storeBytes(row.signature) + bytesOf(row.report);
     }
     std::size_t operator()(const StoreRepeatRow&) const { return 0; }
 };
@@ -47,11 +28,7 @@ struct Bytes {
 } // namespace
 
 std::size_t storeBytes(const Dictionary& dictionary) {
-    std::size_t sum = dictionary.empty() ? 0 : kBlockBytes;
-    for (const auto& entry : dictionary) {
-        sum += sizeof(entry) + entry.key.text().size() + bytesBeyond(entry.value);
-    }
-    return sum;
+    return bytesOf(dictionary);
 }
 
 StoreTable tableOf(const StoreRow& row) {

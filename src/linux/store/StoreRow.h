@@ -13,6 +13,7 @@
 
 #include "common/Value.h"
 #include "linux/store/Schema.h"
+#include "platform/ClientBudget.h"
 #include "platform/RelayReporting.h"
 
 namespace halyard::linux_ {
@@ -94,6 +95,7 @@ using StoreRow =
 struct StoreItem {
     StoreRow row;
     std::size_t bytes = 0;
+    platform::ClientBudgetPtr client{}; // whose it is; null: the daemon's own
 };
 
 StoreTable tableOf(const StoreRow& row);
