@@ -88,7 +88,7 @@ TEST_F(ClientBoundsTest, AMessageWhoseKindFindsNoRoomIsRefusedAndCounted) {
 }
 
 TEST_F(ClientBoundsTest, CopiesForManySessionsAreLookedAtBeforeTheyAreMade) {
-    limit({.copies = 10'000});
+    limit({.copies = 10'500});
     client_.createAndStart(7);
     const Dictionary message{{"text", std::string(900, 'x')}};
     EXPECT_FALSE(client_.send(message, protocol::ReporterIDs(10, 7))->error);

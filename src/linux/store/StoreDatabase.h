@@ -14,6 +14,7 @@
 #include <chrono>
 #include <cstdint>
 #include <filesystem>
+#include <limits>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -44,6 +45,11 @@ public:
     };
     // More ids than any store has used.
     static constexpr std::int64_t kRoomForUnread = std::int64_t{1} << 40;
+    struct Inserted {
+        StoreTable table{};
+        std::int64_t id = 0;
+        std::uint64_t bytes = 0; // of its texts and blobs
+    };
     using RowCounts = std::array<std::uint64_t, kStoreTables>;
 
     explicit StoreDatabase(Settings settings);
@@ -63,6 +69,9 @@ public:
     // Moves everything from the log into the file first.
     void close();
 
+    // Larger rows are refused, each for itself.
+    void setMaxRowBytes(std::uint64_t bytes) { maxRowBytes_ = bytes; }
+
     StoreResult begin();
     // Requires begin(), and of an analytics event that its payload is built.
     // SQLITE_TOOBIG, SQLITE_CONSTRAINT and SQLITE_MISMATCH concern this row alone,
@@ -76,6 +85,8 @@ public:
     StoreResult insert(const StoreMetricRow& row);
     StoreResult insert(const StoreIncidentRow& row);
     StoreResult insert(const StoreRepeatRow& row);
+    // The row that the last insert wrote, which of a session's is the message.
+    const Inserted& lastInserted() const { return inserted_; }
     // Rolls back when it fails.
     StoreResult commit();
     void rollback();
@@ -143,6 +154,8 @@ private:
     RowCounts groupRows_{};
     RowCounts committedRows_{};
     std::vector<StoreUploadPtr> groupUploads_;
+    Inserted inserted_;
+    std::uint64_t maxRowBytes_ = std::numeric_limits<std::uint64_t>::max();
     std::int64_t firstUpload_ = 0;
     bool wroteUpload_ = false;
     Companions companions_{};

@@ -11,6 +11,17 @@ std::string_view nameOf(platform::UploadEnding ending) {
     return ending == platform::UploadEnding::Disconnected ? kEndedDisconnected : kEndedStopped;
 }
 
+// What a value adds to a row that can be much.
+std::uint64_t bytesOf(std::string_view text) {
+    return text.size();
+}
+std::uint64_t bytesOf(StoreBlob blob) {
+    return blob.bytes.size();
+}
+template <class Number> std::uint64_t bytesOf(Number) {
+    return 0;
+}
+
 } // namespace
 
 // Ids are given here and not by SQLite, so that they are known without asking and
@@ -19,6 +30,12 @@ std::string_view nameOf(platform::UploadEnding ending) {
 template <class... Values>
 StoreResult StoreDatabase::insertInto(StoreTable table, const Values&... values) {
     const auto index = static_cast<std::size_t>(table);
+    const std::uint64_t bytes = (std::uint64_t{0} + ... + bytesOf(values));
+    if (bytes > maxRowBytes_) {
+        return StoreFailure{
+            {{}, fmt::format("a row of {} bytes, more than {}", bytes, maxRowBytes_)},
+            SQLITE_TOOBIG};
+    }
     StoreStatement& insert = inserts_[index];
     insert.bindFrom(1, nextID_[index], values...);
     int code = insert.run();
@@ -32,6 +49,7 @@ StoreResult StoreDatabase::insertInto(StoreTable table, const Values&... values)
     if (code != SQLITE_OK) {
         return failureOf(code);
     }
+    inserted_ = {table, nextID_[index], bytes};
     ++nextID_[index];
     ++groupRows_[index];
     return {};

@@ -314,8 +314,11 @@ StoreResult StoreWriter::writeRows(std::span<StoreItem> group) {
     if (!result.ok()) {
         return result;
     }
+    database_.setMaxRowBytes(bounds.maxBytes / StoreShares::kRowShare);
+    shares_.begin();
     result = writeFacts();
     result = result.ok() ? insertAll(group) : result;
+    result = result.ok() ? shares_.trim(database_, bounds.maxBytes) : result;
     result = result.ok() ? trim(bounds, ageDue, more) : result;
     if (!result.ok()) {
         database_.rollback();
@@ -326,7 +329,8 @@ StoreResult StoreWriter::writeRows(std::span<StoreItem> group) {
     commitTime_ = clock_.steadyTime() - began;
     if (result.ok()) {
         facts_.noteCommitted(database_.generation());
-        trimMore_ = more;
+        const bool tooMuch = shares_.committed(bounds.maxBytes);
+        trimMore_ = more || tooMuch;
         noteRemoved();
         if (ageDue) {
             age_.noteCommitted();
@@ -343,6 +347,7 @@ StoreResult StoreWriter::insertAll(std::span<StoreItem> group) {
         StoreResult inserted =
             std::visit([this](const auto& row) { return database_.insert(row); }, item.row);
         if (inserted.ok()) {
+            shares_.note(item, database_.lastInserted());
             continue;
         }
         if (!concernsOneRow(inserted.failure())) {

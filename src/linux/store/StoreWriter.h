@@ -22,6 +22,7 @@
 #include "linux/store/StoreOptions.h"
 #include "linux/store/StoreQueue.h"
 #include "linux/store/StoreRetention.h"
+#include "linux/store/StoreShares.h"
 #include "platform/Clock.h"
 
 namespace halyard::linux_ {
@@ -112,6 +113,7 @@ private:
     const std::shared_ptr<StoreQueue> queue_;
     StoreDatabase database_;
     StoreRetention retention_;
+    StoreShares shares_;
     StoreKeeper keeper_;
     StoreAge age_;
     StoreFacts facts_;

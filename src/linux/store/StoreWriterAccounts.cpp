@@ -47,7 +47,7 @@ void StoreWriter::noteSizes() {
 void StoreWriter::noteRemoved() {
     const MutexLock lock(mutex_);
     for (std::size_t i = 0; i < kStoreTables; ++i) {
-        status_.removed[i] += retention_.removed()[i];
+        status_.removed[i] += retention_.removed()[i] + shares_.removed()[i];
     }
 }
 
