@@ -118,10 +118,6 @@ Outcome<void> Collector::collectTable(std::size_t table, StoreReader& reader,
         reader.forEach({name, kLogTables[table].columns, "", position.id}, [&](const Row& row) {
             const double time = timeOf(table, row);
             const bool leaves = scope_.consent.isGivenAt(time);
-            if (leaves && batch.body.count() >= scope_.limits.records) {
-                batch.hasMore = true;
-                return false;
-            }
             const std::string* const record =
                 leaves ? &records_.recordOf(reader, table, row) : nullptr;
             if (record != nullptr && batch.body.count() > 0 &&
@@ -135,7 +131,9 @@ Outcome<void> Collector::collectTable(std::size_t table, StoreReader& reader,
             } else if (record != nullptr) {
                 batch.body.add(*record);
             }
-            return true;
+            // Full: asking for another row would read as many again, only to leave them.
+            batch.hasMore = batch.body.count() >= scope_.limits.records;
+            return !batch.hasMore;
         });
     if (position != before) {
         batch.change.positions[name] = position;
