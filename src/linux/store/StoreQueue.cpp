@@ -60,8 +60,11 @@ void StoreQueue::appendLocked(StoreRow&& row, std::size_t bytes) {
     }
     const bool wasFull = isFullLocked();
     items_.push_back({std::move(row), bytes, platform::ClientBudget::current()});
-    if (const auto& client = items_.back().client) {
-        client->begin(platform::ClientBudget::Work::Rows, bytes);
+    // What cannot be written holds nobody back: that would be for good.
+    StoreItem& item = items_.back();
+    item.isAwaited = item.client != nullptr && !failing_;
+    if (item.isAwaited) {
+        item.client->begin(platform::ClientBudget::Work::Rows, bytes);
     }
     queuedBytes_ += bytes;
     ++pushed_;
@@ -126,10 +129,20 @@ bool StoreQueue::isStopping() const {
 }
 
 void StoreQueue::setFailing(std::optional<StoreLoss> reason) {
+    std::vector<std::pair<platform::ClientBudgetPtr, std::size_t>> released;
     {
         const MutexLock lock(mutex_);
         failing_ = reason;
         noteTightLocked();
+        for (StoreItem& item : items_) {
+            if (reason && std::exchange(item.isAwaited, false)) {
+                released.emplace_back(item.client, item.bytes);
+            }
+        }
+    }
+    // Those that the writer has already are one group, which is less than holds a client.
+    for (const auto& [client, bytes] : released) {
+        client->end(platform::ClientBudget::Work::Rows, 1, bytes);
     }
     tellPressure();
 }
@@ -237,7 +250,7 @@ void StoreQueue::settle(std::span<const StoreItem> rows) {
     for (const StoreItem& item : rows) {
         bytes += item.bytes;
         closes += isClose(item.row) ? 1 : 0;
-        if (item.client != nullptr) {
+        if (item.isAwaited) {
             item.client->end(platform::ClientBudget::Work::Rows, 1, item.bytes);
         }
     }

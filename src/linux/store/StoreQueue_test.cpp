@@ -17,6 +17,25 @@ void waitUntil(Steady::time_point moment) {
     }
 }
 
+TEST(StoreQueueTest, RowsThatCannotBeWrittenHoldTheirClientBackNoLonger) {
+    StoreQueue queue({}, {.delay = 1h, .rows = 4}, nullptr);
+    const auto client =
+        std::make_shared<platform::ClientBudget>(std::make_shared<const platform::SharedLimits>());
+    bool relieved = false;
+    client->setReliefHandler([&relieved] { relieved = true; });
+    const platform::BudgetScope scope(client);
+    while (!client->isBusy()) {
+        ASSERT_TRUE(queue.push(row()));
+    }
+    queue.setFailing(StoreLoss::DiskFull);
+    EXPECT_TRUE(relieved);
+    EXPECT_FALSE(client->isBusy());
+    for (int i = 0; i < 5'000; ++i) {
+        (void)queue.push(row());
+    }
+    EXPECT_FALSE(client->isBusy());
+}
+
 TEST(StoreQueueTest, RowsThatAreLeftBehindStayAsOldAsTheyAre) {
     StoreQueue queue({}, {.delay = 1h, .rows = 4}, nullptr);
     for (int i = 0; i < 6; ++i) {

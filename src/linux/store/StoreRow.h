@@ -96,6 +96,7 @@ struct StoreItem {
     StoreRow row;
     std::size_t bytes = 0;
     platform::ClientBudgetPtr client{}; // whose it is; null: the daemon's own
+    bool isAwaited = false;             // it counts for what its client has on its way
 };
 
 StoreTable tableOf(const StoreRow& row);
