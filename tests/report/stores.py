@@ -31,6 +31,8 @@ class Store:
         daemon.terminate(30)
         self.folder = Path(daemon.store_path).parent
         self.database = sqlite3.connect(daemon.store_path)
+        # Asking whether it accepts was a client, whose end it may have told of.
+        self.database.execute("DELETE FROM analytics_event")
 
     def close(self):
         self.database.commit()
