@@ -16,6 +16,7 @@ import unittest
 
 from harness import DaemonTest, PATIENCE
 
+CTL = os.environ.get("HALYARDCTL", "build/release/halyardctl")
 EXPORT = os.environ.get("HALYARD_EXPORT", "build/release/halyard-export")
 MODULES = os.environ.get("OTLP_MODULES", "")
 ORACLE = os.path.join(os.path.dirname(__file__), "../otlp/decode.js")
@@ -224,6 +225,38 @@ class Hostile(Export):
         self.receiver.take = lambda request: (hold.wait(PATIENCE), {}, b"")
         left = self.run_export("--once", OTEL_EXPORTER_OTLP_TIMEOUT="200")
         self.assertEqual(left.returncode, 1)
+
+
+class Looking(Export):
+    def look(self, what):
+        shown = subprocess.run(
+            [CTL, "--state", self.daemon.path("state"), "--json", "export", what, "--config",
+             self.daemon.path("etc")], env=self.environment(), text=True, capture_output=True,
+            timeout=PATIENCE, check=True)
+        return json.loads(shown.stdout)
+
+    def test_the_preview_names_every_key_that_leaves_and_sends_nothing(self):
+        self.play()
+        shown = self.look("preview")
+        self.assertEqual(self.receiver.requests, [])
+        self.assertEqual((shown["consent"], shown["requests"]), (True, 3))
+        named = {key["key"] for key in shown["keys"]}
+        self.assertLessEqual({"device.id", "halyard.application", "halyard.VQSessionVolume",
+                              "issue_type", "log.record.uid"}, named)
+        self.run_export("--once")
+        self.assertEqual(self.look("preview")["requests"], 0)
+
+    def test_the_status_says_what_waits_and_what_was_lost(self):
+        self.play()
+        waiting = self.look("status")
+        self.assertGreater(waiting["backlog"][0]["rows"], 2)
+        self.assertIsNone(waiting["last_success"])
+        self.receiver.answers = [(400, {}, b"")]
+        self.run_export("--once")
+        after = self.look("status")
+        self.assertEqual([each["rows"] for each in after["backlog"]], [0] * 5)
+        self.assertEqual(after["dropped"], {"refused": waiting["backlog"][0]["rows"]})
+        self.assertGreater(after["bytes_today"], 0)
 
 
 class Refusing(Export):
