@@ -173,6 +173,7 @@ class Requests(DaemonTest):
         client.session(1)
         for number in range(5000):
             client.notify("sendMessage", {"n": number}, 4, 1, [1])
+        client.result("getAllReporters")  # All of them have been read.
         payloads = self.rows("SELECT payload FROM upload_message ORDER BY id")
         self.assertEqual([json.loads(row[0])["n"] for row in payloads], list(range(5000)))
 
