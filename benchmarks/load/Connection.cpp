@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <poll.h>
 #include <stdexcept>
 #include <sys/socket.h>
 #include <sys/time.h>
@@ -13,6 +14,8 @@
 
 namespace halyard::load {
 namespace {
+
+constexpr int kSilenceMs = 1000; // then recv() is left to judge it
 
 [[noreturn]] void fail(const char* what) {
     if (errno == EAGAIN) {
@@ -58,6 +61,11 @@ Connection::~Connection() {
 Connection::Connection(Connection&& other) noexcept
     : socket_(std::exchange(other.socket_, -1)), received_(std::move(other.received_)),
       consumed_(other.consumed_), scanner_(other.scanner_), nextID_(other.nextID_) {}
+
+void Connection::awaitAnswer() {
+    awaitReadable();
+    readAnswer();
+}
 
 Value Connection::call(protocol::Method method, const protocol::Arguments& arguments) {
     std::string frame;
@@ -141,6 +149,12 @@ bool Connection::takeAnswer(protocol::Answer& answer) {
     scanner_.reset();
     answer = std::move(*decoded);
     return true;
+}
+
+// A thread that sleeps in recv() is also woken when the daemon has read what it sent.
+void Connection::awaitReadable() const {
+    pollfd readable{.fd = socket_, .events = POLLIN, .revents = 0};
+    (void)::poll(&readable, 1, kSilenceMs);
 }
 
 void Connection::receive() {

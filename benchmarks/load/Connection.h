@@ -26,6 +26,9 @@ public:
     // Returns when the daemon has taken everything sent before.
     void barrier() { call(protocol::Method::ReporterIDValid); }
 
+    // Of what was sent by send(). Requires that one request is unanswered.
+    void awaitAnswer();
+
     // In blocks of kBlockBytes, as a client library that coalesces would.
     void send(std::string_view bytes);
     // Keeps `inFlight` requests of the stream unanswered; all are answered when
@@ -37,6 +40,7 @@ public:
 private:
     protocol::Answer readAnswer();
     bool takeAnswer(protocol::Answer& answer);
+    void awaitReadable() const;
     void receive();
 
     int socket_ = -1;

@@ -77,7 +77,11 @@ Daemon::~Daemon() {
 // Room for every row, so that what is counted at the end is what was sent.
 void Daemon::writeConfiguration(const DaemonSettings& settings) const {
     std::ofstream file(directory_.path() / "etc" / "halyard.toml");
-    file << "[store]\nmax_bytes = \"64GiB\"\n[log]\nlevel = \"" << settings.logLevel << "\"\n";
+    file << "[store]\nmax_bytes = \"64GiB\"\n";
+    if (!options_.syncInterval.empty()) {
+        file << "sync_interval = \"" << options_.syncInterval << "\"\n";
+    }
+    file << "[log]\nlevel = \"" << settings.logLevel << "\"\n";
     if (!settings.analytics) {
         file << "[analytics]\nwanted = []\n";
     }

@@ -131,7 +131,7 @@ std::vector<HoldSample> holdLoad(const Options& options) {
     for (std::size_t i = 0; i < streams.size(); ++i) {
         clients.emplace_back(daemon, streams[i], static_cast<std::int64_t>(i + 1));
     }
-    const double rate = static_cast<double>(options.holdRate) / options.clients;
+    const double rate = static_cast<double>(options.rate) / options.clients;
     const double interval = std::max(1.0, options.holdSeconds / 12.0);
     std::vector<HoldSample> samples;
     const auto begin = std::chrono::steady_clock::now();

@@ -22,11 +22,15 @@ costs it, next to the floor: a process that appends the same bytes to a file.
   --connections=N   idle connections for the memory figure (1000)
   --sessions=N      idle sessions for the memory figure (10000)
   --hold=SECONDS    hold a load this long and watch the memory (0: do not)
-  --rate=N          messages per second of the held load (2000)
+  --paced=SECONDS   send requests evenly for this long, each awaited (0: do not)
+  --rate=N          messages per second of the held and of the paced load (2000)
+  --churn=N         create, configure, start and stop N sessions, each by itself
+                    and all at once (0: do not)
+  --sync-interval=T how often the daemon's store syncs, such as 5s (its default)
   --log-level=LEVEL level of the daemon's log, which goes to a file (info)
   --directory=DIR   where the private directories are made (/var/tmp)
   --timeout=SECONDS longest wait for one answer (120)
-  --only=WHAT       throughput or memory
+  --only=WHAT       throughput, memory or rest: what the options above ask for
   --mode=NAME       throughput of this mode alone, as the table names it
   --json            print JSON
 )";
@@ -47,7 +51,9 @@ constexpr NumberOption kNumbers[] = {
     {"--connections", &Options::connections, 1, 10000},
     {"--sessions", &Options::sessions, 1, 100000},
     {"--hold", &Options::holdSeconds, 0, 3600},
-    {"--rate", &Options::holdRate, 1, 100000},
+    {"--paced", &Options::pacedSeconds, 0, 3600},
+    {"--rate", &Options::rate, 1, 100000},
+    {"--churn", &Options::churn, 0, 100000},
     {"--timeout", &Options::timeoutSeconds, 1, 3600},
 };
 
@@ -78,10 +84,12 @@ bool setText(Options& options, std::string_view name, std::string_view text) {
         options.logLevel = text;
     } else if (name == "--directory") {
         options.directory = text;
+    } else if (name == "--sync-interval") {
+        options.syncInterval = text;
     } else if (name == "--mode") {
         options.mode = text;
         options.memory = false;
-    } else if (name == "--only" && (text == "throughput" || text == "memory")) {
+    } else if (name == "--only" && (text == "throughput" || text == "memory" || text == "rest")) {
         options.throughput = text == "throughput";
         options.memory = text == "memory";
     } else {

@@ -12,6 +12,7 @@ struct Options {
     std::string directory = "/var/tmp"; // private directories are made in it
     std::string logLevel = "info";      // the daemon's default
     std::string mode;                   // only this one; empty: all
+    std::string syncInterval;           // of the daemon's store; empty: its default
     // Of the sessions started at once, the daemon uploads five.
     std::uint32_t clients = 4;
     std::uint32_t messages = 200000; // per round and mode, of all clients together
@@ -21,7 +22,9 @@ struct Options {
     std::uint32_t connections = 1000;
     std::uint32_t sessions = 10000;
     std::uint32_t holdSeconds = 0;
-    std::uint32_t holdRate = 2000;      // messages per second, of all clients together
+    std::uint32_t pacedSeconds = 0;
+    std::uint32_t churn = 0;
+    std::uint32_t rate = 2000; // held or paced messages per second, of all clients together
     std::uint32_t timeoutSeconds = 120; // for one answer or one write
     bool throughput = true;
     bool memory = true;

@@ -61,6 +61,47 @@ std::string heldTable(const std::vector<HoldSample>& samples) {
     return text;
 }
 
+double percentile(const PacedLoad& load, std::size_t percent) {
+    return load.answerSeconds[load.answerSeconds.size() * percent / 100];
+}
+
+std::string pacedTable(const Options& options, const std::vector<PacedLoad>& loads) {
+    std::string text = fmt::format(
+        "\n{} requests/s, evenly, {} connections: CPU us/request, answers after us: p50, p99\n",
+        options.rate, options.clients);
+    for (const PacedLoad& load : loads) {
+        text += fmt::format("{:>10.1f}{:>10.0f}{:>10.0f}\n", load.cpuPerRequest() / 1e3,
+                            percentile(load, 50) * 1e6, percentile(load, 99) * 1e6);
+    }
+    return text;
+}
+
+std::string churnTable(const std::vector<Churn>& churns) {
+    std::string text = "\nsessions: each request awaited: s, CPU s; all at once: s, CPU s\n";
+    for (const Churn& churn : churns) {
+        text += fmt::format("{:>8}{:>10.2f}{:>10.2f}{:>10.2f}{:>10.2f}\n", churn.sessions,
+                            churn.awaitedSeconds, static_cast<double>(churn.awaitedCpu) / 1e9,
+                            churn.pipelinedSeconds, static_cast<double>(churn.pipelinedCpu) / 1e9);
+    }
+    return text;
+}
+
+Dictionary asDictionary(const PacedLoad& load) {
+    return {{"requests", load.requests},
+            {"seconds", load.seconds},
+            {"cpu_ns_per_request", load.cpuPerRequest()},
+            {"answer_p50_sec", percentile(load, 50)},
+            {"answer_p99_sec", percentile(load, 99)}};
+}
+
+Dictionary asDictionary(const Churn& churn) {
+    return {{"sessions", churn.sessions},
+            {"awaited_sec", churn.awaitedSeconds},
+            {"awaited_cpu_ns", churn.awaitedCpu},
+            {"pipelined_sec", churn.pipelinedSeconds},
+            {"pipelined_cpu_ns", churn.pipelinedCpu}};
+}
+
 Dictionary asDictionary(const Measurement& row) {
     Dictionary result{{"mode", row.mode},
                       {"messages", row.messages},
@@ -76,6 +117,14 @@ Dictionary asDictionary(const Measurement& row) {
     return result;
 }
 
+template <class Row> List asList(const std::vector<Row>& rows) {
+    List list;
+    for (const Row& row : rows) {
+        list.append(asDictionary(row));
+    }
+    return list;
+}
+
 Dictionary asDictionary(const Options& options) {
     return {{"messages", options.messages},
             {"clients", options.clients},
@@ -85,6 +134,8 @@ Dictionary asDictionary(const Options& options) {
             {"connections", options.connections},
             {"sessions", options.sessions},
             {"log_level", options.logLevel},
+            {"rate", options.rate},
+            {"sync_interval", options.syncInterval},
             {"directory", options.directory},
             {"block_bytes", Connection::kBlockBytes},
             {"processors", std::thread::hardware_concurrency()}};
@@ -103,16 +154,20 @@ std::string asTable(const Options& options, const Report& report) {
     if (!report.held.empty()) {
         text += heldTable(report.held);
     }
+    if (!report.paced.empty()) {
+        text += pacedTable(options, report.paced);
+    }
+    if (!report.churn.empty()) {
+        text += churnTable(report.churn);
+    }
     return text;
 }
 
 std::string asJson(const Options& options, const Report& report) {
     Dictionary result{{"options", asDictionary(options)}};
-    List throughput;
-    for (const Measurement& row : report.throughput) {
-        throughput.append(asDictionary(row));
-    }
-    result.set("throughput", throughput);
+    result.set("throughput", asList(report.throughput));
+    result.set("paced", asList(report.paced));
+    result.set("churn", asList(report.churn));
     if (report.idle) {
         result.set("memory",
                    Dictionary{{"idle_bytes", report.idle->idleBytes},

@@ -7,6 +7,7 @@
 
 #include "load/Memory.h"
 #include "load/Options.h"
+#include "load/Rates.h"
 #include "load/Throughput.h"
 
 namespace halyard::load {
@@ -15,6 +16,8 @@ struct Report {
     std::vector<Measurement> throughput; // medians; the floor first
     std::optional<IdleMemory> idle;
     std::vector<HoldSample> held;
+    std::vector<PacedLoad> paced; // of each round
+    std::vector<Churn> churn;
 };
 
 std::string asTable(const Options& options, const Report& report);

@@ -25,18 +25,6 @@ void startSession(Connection& connection, std::int64_t reporterID) {
     connection.barrier();
 }
 
-std::vector<Connection> connectClients(const Daemon& daemon, const Options& options,
-                                       const Mode& mode) {
-    std::vector<Connection> clients;
-    for (std::uint32_t i = 0; i < options.clients; ++i) {
-        clients.push_back(daemon.connect());
-        if (i == 0 || mode.addressed) {
-            startSession(clients.back(), i + 1);
-        }
-    }
-    return clients;
-}
-
 void checkRows(const std::vector<Stream>& streams, const Measurement& result, bool analytics) {
     std::uint64_t distinct = 0;
     for (const Stream& stream : streams) {
@@ -53,6 +41,18 @@ void checkRows(const std::vector<Stream>& streams, const Measurement& result, bo
 }
 
 } // namespace
+
+std::vector<Connection> connectClients(const Daemon& daemon, const Options& options,
+                                       const Mode& mode) {
+    std::vector<Connection> clients;
+    for (std::uint32_t i = 0; i < options.clients; ++i) {
+        clients.push_back(daemon.connect());
+        if (i == 0 || mode.addressed) {
+            startSession(clients.back(), i + 1);
+        }
+    }
+    return clients;
+}
 
 const std::vector<Mode>& modes() {
     static const std::vector<Mode> all = {

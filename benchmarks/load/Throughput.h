@@ -35,6 +35,10 @@ struct Measurement {
 
 const std::vector<Mode>& modes();
 
+// A connection for each client, with a started session where the mode wants one.
+std::vector<Connection> connectClients(const Daemon& daemon, const Options& options,
+                                       const Mode& mode);
+
 // Throws std::runtime_error, also when rows are missing in the store.
 Measurement measure(const Options& options, const Mode& mode);
 

@@ -40,6 +40,14 @@ Report measureAll(const Options& options) {
     if (options.holdSeconds > 0) {
         report.held = holdLoad(options);
     }
+    for (std::uint32_t round = 0; round < options.rounds; ++round) {
+        if (options.pacedSeconds > 0) {
+            report.paced.push_back(measurePaced(options));
+        }
+        if (options.churn > 0) {
+            report.churn.push_back(measureChurn(options));
+        }
+    }
     return report;
 }
 
