@@ -17,6 +17,8 @@ using protocol::FrameScanner;
 using protocol::Method;
 
 constexpr std::size_t kKeptCapacity = 4096;
+// What is done where it was read: more than this is done sooner by several threads.
+constexpr std::size_t kFewBytes = 8 * 1024;
 // What a connection takes that has nothing to do.
 constexpr std::size_t kConnectionBytes = 2048;
 // What an element takes beside its bytes, once it is decoded; a list of one has most.
@@ -26,6 +28,20 @@ bool needsAdministrator(Method method) {
     return method == Method::KillService || method == Method::AdminPostNotification ||
            method == Method::AdminFlush || method == Method::AdminStatus ||
            method == Method::AdminPurge;
+}
+
+// What may wait: for the reading of a device, a trace, the end. The thread that reads
+// from everybody must not, so this is never done there.
+bool mayWait(Method method) {
+    switch (method) {
+    case Method::CreateReportingSession: // It may replace one, and so end its trace.
+    case Method::StartReportingSessionForID:
+    case Method::StopReportingSessionForID:
+    case Method::DestroyReportingSession:
+        return true;
+    default:
+        return needsAdministrator(method);
+    }
 }
 
 std::string_view reason(FrameScanner::Outcome outcome) {
@@ -262,7 +278,8 @@ void SocketConnection::chargePending() {
 std::size_t SocketConnection::takeFrames(std::string_view stream) {
     const auto charge = std::make_shared<ReadCharge>(shared_from_this());
     const ChargeScope scope(charge);
-    const WakeUpScope wakeUps; // Once for all requests of the read.
+    WakeUpScope wakeUps(stream.size() <= kFewBytes ? WakeUpScope::Thread::Lent
+                                                   : WakeUpScope::Thread::Kept);
     std::size_t taken = 0;
     framesWait_ = false;
     while (taken < stream.size() && !ended_) {
@@ -283,7 +300,7 @@ std::size_t SocketConnection::takeFrames(std::string_view stream) {
         const std::size_t memory = length + scanner_.elements() * kElementBytes;
         scanner_.reset();
         taken += length;
-        if (!takeFrame(rest.substr(0, length), memory, charge)) {
+        if (!takeFrame(rest.substr(0, length), memory, charge, wakeUps)) {
             breakOff("a frame that is no MessagePack-RPC request");
             break;
         }
@@ -292,7 +309,7 @@ std::size_t SocketConnection::takeFrames(std::string_view stream) {
 }
 
 bool SocketConnection::takeFrame(std::string_view frame, std::size_t memory,
-                                 const std::shared_ptr<ReadCharge>& charge) {
+                                 const std::shared_ptr<ReadCharge>& charge, WakeUpScope& wakeUps) {
     auto call = shared_.decoder.decode(frame);
     if (!call) {
         return false;
@@ -308,6 +325,9 @@ bool SocketConnection::takeFrame(std::string_view frame, std::size_t memory,
                                 fmt::format("{} is not allowed for uid {}",
                                             protocol::methodName(*call->method), peer_.uid)});
         return true;
+    }
+    if (mayWait(*call->method)) {
+        wakeUps.keepThread();
     }
     charge->add(frame.size(), memory);
     protocol::Reply reply;

@@ -47,6 +47,7 @@ struct ListenerCounters {
 };
 
 class SocketConnection;
+class WakeUpScope;
 
 // What the connections of one listener share; on the io_context's thread.
 struct ListenerShared {
@@ -118,7 +119,7 @@ private:
     // Takes the frames at the front of `stream`; returns how many bytes they had.
     std::size_t takeFrames(std::string_view stream);
     bool takeFrame(std::string_view frame, std::size_t memory,
-                   const std::shared_ptr<ReadCharge>& charge);
+                   const std::shared_ptr<ReadCharge>& charge, WakeUpScope& wakeUps);
     void refuseCall(const protocol::Call& call, MaybeError error);
     Written writeOnce() HY_EXCLUDES(outMutex_);
     void writeSome();

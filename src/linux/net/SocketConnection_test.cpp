@@ -3,6 +3,7 @@
 #include <sys/socket.h>
 
 #include "linux/net/ListenerFixture.h"
+#include "linux/queues/PooledSerialQueue.h"
 
 namespace halyard::linux_ {
 namespace {
@@ -10,6 +11,43 @@ namespace {
 using protocol::Method;
 
 class SocketConnectionTest : public ListenerFixture {};
+
+// Whether the thread that read a request is lent for the work of it.
+class LoanRecorder final : public platform::ExportedObject {
+public:
+    void handle(protocol::Request) override { lent.push_back(WakeUpScope::lendsThread()); }
+
+    std::vector<bool> lent;
+};
+
+class SocketConnectionLoanTest : public ListenerFixture, public platform::ListenerDelegate {
+protected:
+    SocketConnectionLoanTest() { listener_->setDelegate(this); }
+    bool shouldAcceptNewConnection(const std::shared_ptr<platform::Connection>& made) override {
+        made->setExportedObject(recorder_);
+        made->resume();
+        return true;
+    }
+
+    const std::shared_ptr<LoanRecorder> recorder_ = std::make_shared<LoanRecorder>();
+};
+
+TEST_F(SocketConnectionLoanTest, AFewMessagesAreDoneWhereTheyWereRead) {
+    send(connect(), notification() + notification());
+    EXPECT_EQ(recorder_->lent, (std::vector<bool>{true, true}));
+}
+
+TEST_F(SocketConnectionLoanTest, WhatMayWaitIsNotDoneWhereItWasRead) {
+    const int client = connect();
+    send(client, call(Method::StopReportingSessionForID) + notification());
+    send(client, call(Method::KillService));
+    EXPECT_EQ(recorder_->lent, std::vector<bool>(3, false));
+}
+
+TEST_F(SocketConnectionLoanTest, ManyMessagesAreLeftToSeveralThreads) {
+    send(connect(), notification(20'000) + notification());
+    EXPECT_EQ(recorder_->lent, std::vector<bool>(2, false));
+}
 
 TEST_F(SocketConnectionTest, ABrokenConnectionIsInterruptedThenInvalidated) {
     const int client = connect();

@@ -24,7 +24,7 @@ void FairSerialQueue::async(platform::Task task) {
         lane->client = client;
         turns_.push_back(lane);
     }
-    lane->items.push_back({std::move(task), charge, ++submitted_});
+    lane->items.push_back({std::move(task), charge, ++submitted_, WakeUpScope::lendsThread()});
     scheduleLocked();
 }
 
@@ -40,7 +40,7 @@ void FairSerialQueue::asyncBehindAll(platform::Task task) {
 
 void FairSerialQueue::continueWith(platform::Task rest) {
     assert(isCurrent() && !rest_);
-    rest_ = Item{std::move(rest), currentCharge(), running_};
+    rest_ = Item{std::move(rest), currentCharge(), running_, false};
 }
 
 bool FairSerialQueue::hasWorkLocked() const {
@@ -140,20 +140,52 @@ void FairSerialQueue::giveTurn() {
         urgent();
         urgent = nullptr;
     } else if (lane != nullptr) {
-        runLane(*lane);
+        runLane(*lane, Where::Worker);
         putBack(lane);
     }
+    endTurn();
+}
+
+void FairSerialQueue::endTurn() {
     const MutexLock lock(mutex_);
     scheduled_ = false;
     scheduleLocked();
 }
 
-void FairSerialQueue::runLane(Lane& lane) {
+// The queue is scheduled, so this is its turn as it would be the worker's.
+void FairSerialQueue::runHere() {
+    LanePtr lane = laneToRunHere();
+    if (lane == nullptr) {
+        return wakeWorker();
+    }
+    const Running running(*this);
+    suspendCalled_ = false;
+    runLane(*lane, Where::Here);
+    putBack(std::move(lane));
+    endTurn();
+}
+
+FairSerialQueue::LanePtr FairSerialQueue::laneToRunHere() {
+    const MutexLock lock(mutex_);
+    if (suspended_ || !urgent_.empty() || !behind_.empty() || turns_.size() != 1) {
+        return nullptr;
+    }
+    const LanePtr& lane = turns_.front();
+    if (!lane->items.front().runsAnywhere ||
+        (lane->client != nullptr && lane->client->isBacklogged())) {
+        return nullptr;
+    }
+    LanePtr taken = lane;
+    turns_.pop_front();
+    return taken;
+}
+
+void FairSerialQueue::runLane(Lane& lane, Where where) {
     WakeUpScope wakeUps;
     const Clock::time_point end = Clock::now() + kTurn;
     std::size_t ran = 0;
     do {
-        std::optional<Item> item = takeFrom(lane);
+        std::optional<Item> item = takeFrom(lane, where);
         if (!item) {
             return;
         }
@@ -168,9 +200,9 @@ void FairSerialQueue::runLane(Lane& lane) {
              (lane.client == nullptr || !lane.client->isBacklogged()));
 }
 
-std::optional<FairSerialQueue::Item> FairSerialQueue::takeFrom(Lane& lane) {
+std::optional<FairSerialQueue::Item> FairSerialQueue::takeFrom(Lane& lane, Where where) {
     const MutexLock lock(mutex_);
-    if (lane.items.empty()) {
+    if (lane.items.empty() || (where == Where::Here && !lane.items.front().runsAnywhere)) {
         return std::nullopt;
     }
     std::optional<Item> item(std::move(lane.items.front()));

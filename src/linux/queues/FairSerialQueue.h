@@ -11,6 +11,9 @@
 // until clientRelieved().
 //
 // A task that takes long gives others their turn by continueWith().
+//
+// What a thread submits that it is lent by, and is all there is to do, runs on that
+// thread (see WakeUpScope); everything else on the worker.
 #pragma once
 
 #include <chrono>
@@ -52,7 +55,9 @@ private:
         platform::Task task;
         ChargePtr charge;
         std::uint64_t number; // in the order of submission
+        bool runsAnywhere;    // else on the worker only
     };
+    enum class Where { Worker, Here };
     struct Lane {
         platform::ClientBudgetPtr client; // null: the daemon itself
         std::deque<Item> items;
@@ -64,16 +69,20 @@ private:
     };
 
     void wakeWorker() override;
+    void runHere() override HY_EXCLUDES(mutex_);
     bool resumeWait(std::uint64_t wait, platform::Task first) HY_EXCLUDES(mutex_);
     void scheduleLocked() HY_REQUIRES(mutex_);
     bool hasWorkLocked() const HY_REQUIRES(mutex_);
     void giveTurn() HY_EXCLUDES(mutex_);
     // What runs next: null when nothing may.
     LanePtr nextLane(platform::Task& urgent) HY_EXCLUDES(mutex_);
+    // The same on a thread that is lent: null when it is the worker's affair.
+    LanePtr laneToRunHere() HY_EXCLUDES(mutex_);
     bool isNextBehindLocked() const HY_REQUIRES(mutex_);
-    void runLane(Lane& lane) HY_EXCLUDES(mutex_);
-    std::optional<Item> takeFrom(Lane& lane) HY_EXCLUDES(mutex_);
+    void runLane(Lane& lane, Where where) HY_EXCLUDES(mutex_);
+    std::optional<Item> takeFrom(Lane& lane, Where where) HY_EXCLUDES(mutex_);
     void putBack(LanePtr lane) HY_EXCLUDES(mutex_);
+    void endTurn() HY_EXCLUDES(mutex_);
 
     Worker& worker_;
     const PooledSerialQueue::Timer& timer_;

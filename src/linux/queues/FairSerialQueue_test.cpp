@@ -3,6 +3,7 @@
 #include <future>
 #include <gmock/gmock.h>
 #include <string>
+#include <thread>
 
 namespace halyard::linux_ {
 namespace {
@@ -38,6 +39,9 @@ protected:
         queue_->asyncBehindAll([&] { done.set_value(); });
         done.get_future().wait();
     }
+    platform::Task noteThread() {
+        return [this] { threads_.push_back(std::this_thread::get_id()); };
+    }
     static platform::ClientBudgetPtr makeClient() {
         return std::make_shared<ClientBudget>(std::make_shared<platform::SharedLimits>());
     }
@@ -46,6 +50,8 @@ protected:
     const platform::ClientBudgetPtr one_ = makeClient();
     const platform::ClientBudgetPtr two_ = makeClient();
     std::vector<std::string> ran_; // the worker's until all has run
+    std::vector<std::thread::id> threads_;
+    const std::thread::id here_ = std::this_thread::get_id();
     std::promise<void> opened_;
     Worker worker_{"test", 1, platform::QueuePriority::Utility};
     const std::shared_ptr<FairSerialQueue> queue_ =
@@ -129,6 +135,70 @@ TEST_F(FairSerialQueueTest, ASuspendedQueueRunsNothingBeforeItIsResumed) {
     waitUntilAllHasRun();
     ASSERT_EQ(ran_.size(), 4U);
     EXPECT_THAT(std::vector(ran_.begin(), ran_.begin() + 2), ElementsAre("suspends", "first"));
+}
+
+TEST_F(FairSerialQueueTest, ALentThreadRunsWhatItSubmits) {
+    {
+        const WakeUpScope scope(WakeUpScope::Thread::Lent);
+        submit(one_, noteThread());
+        submit(one_, noteThread());
+        EXPECT_TRUE(threads_.empty());
+    }
+    EXPECT_THAT(threads_, ElementsAre(here_, here_));
+}
+
+TEST_F(FairSerialQueueTest, ALentThreadIsGivenBackBeforeWhatMayWait) {
+    {
+        WakeUpScope scope(WakeUpScope::Thread::Lent);
+        submit(one_, noteThread());
+        scope.keepThread();
+        submit(one_, noteThread());
+    }
+    waitUntilAllHasRun();
+    EXPECT_THAT(threads_, ::testing::Each(::testing::Ne(here_)));
+    EXPECT_EQ(threads_.size(), 2U);
+}
+
+TEST_F(FairSerialQueueTest, ALentThreadLeavesABusyQueueToItsWorker) {
+    hold();
+    {
+        const WakeUpScope scope(WakeUpScope::Thread::Lent);
+        submit(one_, noteThread());
+    }
+    EXPECT_TRUE(threads_.empty());
+    release();
+    waitUntilAllHasRun();
+    EXPECT_THAT(threads_, ElementsAre(::testing::Ne(here_)));
+}
+
+TEST_F(FairSerialQueueTest, ALentThreadLeavesToTheWorkerWhatItsTurnHasNoTimeFor) {
+    {
+        const WakeUpScope scope(WakeUpScope::Thread::Lent);
+        submit(one_, noteLong("long"));
+        submit(one_, noteThread());
+    }
+    waitUntilAllHasRun();
+    EXPECT_THAT(threads_, ElementsAre(::testing::Ne(here_)));
+}
+
+TEST_F(FairSerialQueueTest, ALentThreadLeavesToTheWorkerWhatATaskPutOff) {
+    {
+        const WakeUpScope scope(WakeUpScope::Thread::Lent);
+        submit(one_, [this] { queue_->continueWith(noteThread()); });
+    }
+    waitUntilAllHasRun();
+    EXPECT_THAT(threads_, ElementsAre(::testing::Ne(here_)));
+}
+
+TEST_F(FairSerialQueueTest, ALentThreadLeavesToTheWorkerWhatOthersSubmit) {
+    {
+        const WakeUpScope scope(WakeUpScope::Thread::Lent);
+        submit(one_, noteThread());
+        std::thread([this] { submit(two_, noteThread()); }).join();
+    }
+    waitUntilAllHasRun();
+    EXPECT_EQ(threads_.size(), 2U);
+    EXPECT_THAT(threads_, ::testing::Each(::testing::Ne(here_)));
 }
 
 } // namespace

@@ -13,6 +13,8 @@ namespace {
 constexpr std::size_t kKeptCapacity = 16;
 // Tasks after which the queues they submitted to are let go, whatever follows.
 constexpr std::size_t kTasksPerWakeUp = 64;
+// More queues than this are worth waking the workers for.
+constexpr std::size_t kMostQueuesHere = 4;
 // Tasks after which the worker's other queues have their turn.
 constexpr std::size_t kTasksPerTurn = 512;
 
@@ -28,11 +30,36 @@ WakeUpScope*& WakeUpScope::current() {
     return innermost;
 }
 
-WakeUpScope::WakeUpScope() : outer_(std::exchange(current(), this)) {}
+bool WakeUpScope::lendsThread() {
+    const WakeUpScope* const scope = current();
+    return scope != nullptr && scope->thread_ == Thread::Lent;
+}
 
+WakeUpScope::WakeUpScope(Thread thread) : outer_(std::exchange(current(), this)), thread_(thread) {}
+
+// What a queue leaves that ran on a lent thread is done there as well.
 WakeUpScope::~WakeUpScope() {
+    runHere();
     current() = outer_;
-    flush();
+    if (lendsThread()) {
+        outer_->queues_.insert(outer_->queues_.end(), queues_.begin(), queues_.end());
+    } else {
+        flush();
+    }
+}
+
+void WakeUpScope::runHere() {
+    if (thread_ == Thread::Kept || queues_.empty()) {
+        return;
+    }
+    const auto end = std::chrono::steady_clock::now() + kLoan;
+    do {
+        const auto queue = std::move(queues_.front());
+        queues_.erase(queues_.begin());
+        queue->runHere();
+    } while (!queues_.empty() && queues_.size() <= kMostQueuesHere &&
+             std::chrono::steady_clock::now() < end);
+    thread_ = Thread::Kept;
 }
 
 void WakeUpScope::flush() {

@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <asio/executor_work_guard.hpp>
 #include <atomic>
 #include <future>
@@ -146,6 +147,56 @@ TEST_F(QueuesTest, WhatIsSubmittedRunsAtOnceWhereItsThreadBlocks) {
         }
         relayQueue()->async([&] { after = true; });
         EXPECT_FALSE(after) << "the scope goes on behind the section";
+    }
+    drain();
+}
+
+TEST_F(QueuesTest, WhatATaskSubmitsOnALentThreadRunsThereToo) {
+    const auto service = queues_.makeSerialQueue("service", QueuePriority::UserInteractive);
+    const auto relay = relayQueue();
+    std::thread::id thread;
+    bool wasBehind = false;
+    {
+        const WakeUpScope scope(WakeUpScope::Thread::Lent);
+        service->async([&] {
+            relay->async([&] {
+                thread = std::this_thread::get_id();
+                wasBehind = !service->isCurrent();
+            });
+        });
+    }
+    EXPECT_EQ(thread, std::this_thread::get_id());
+    EXPECT_TRUE(wasBehind);
+}
+
+TEST_F(QueuesTest, ManyQueuesRunOnTheWorkersThoughAThreadIsLent) {
+    const auto service = queues_.makeSerialQueue("service", QueuePriority::UserInteractive);
+    std::vector<std::shared_ptr<platform::SerialQueue>> many(64);
+    std::generate(many.begin(), many.end(), [this] { return relayQueue(); });
+    std::atomic<std::size_t> elsewhere{0};
+    {
+        const WakeUpScope scope(WakeUpScope::Thread::Lent);
+        service->async([&, here = std::this_thread::get_id()] {
+            for (const auto& queue : many) {
+                queue->async([&, here] { elsewhere += std::this_thread::get_id() != here; });
+            }
+        });
+    }
+    drain();
+    EXPECT_EQ(elsewhere, many.size());
+}
+
+TEST_F(QueuesTest, WhatATaskOnALentThreadWaitsForRunsOnAWorker) {
+    const auto service = queues_.makeSerialQueue("service", QueuePriority::UserInteractive);
+    const auto relay = relayQueue();
+    std::promise<void> ran;
+    {
+        const WakeUpScope scope(WakeUpScope::Thread::Lent);
+        service->async([&] {
+            relay->async([&] { ran.set_value(); });
+            const BlockingSection blocking;
+            ran.get_future().wait();
+        });
     }
     drain();
 }
