@@ -2,7 +2,7 @@
 """A fleet in small: many devices, one receiver, and all that goes wrong between them.
 
 usage: benchmarks/fleet/fleet.py HALYARD_EXPORT [--devices 100] [--seconds 60]
-           [--kills 20] [--faults 0.25] [--seed 1] [--keep]
+           [--kills 20] [--faults 0.25] [--seed 1] [--keep] [--collector PROGRAM]
 
 Each device has a store that is written to while it runs, and an exporter. Exporters and
 the receiver are killed at random and started again; the receiver is away for a while,
@@ -143,16 +143,73 @@ class Receiver:
         self.child = subprocess.Popen([sys.executable, os.path.join(HERE, "receiver.py"),
                                        self.directory, str(self.port),
                                        f"{self.seed}/{self.starts}", str(faults)])
-        while self.child.poll() is None:
-            with socket.socket() as probe:
-                if probe.connect_ex(("127.0.0.1", self.port)) == 0:
-                    return
-            time.sleep(0.02)
-        raise SystemExit("the receiver does not start")
+        await_port(self.child, self.port)
 
     def kill(self):
         self.child.kill()
         self.child.wait()
+
+
+class Collector:
+    """Stands between the devices and the receiver. Without a queue of its own, so that what it
+    answers is what the receiver answered."""
+
+    CONFIGURATION = """
+receivers:
+  otlp: {{ protocols: {{ http: {{ endpoint: "127.0.0.1:{port}" }} }} }}
+processors:
+  memory_limiter: {{ check_interval: 1s, limit_mib: 512 }}
+exporters:
+  otlphttp:
+    endpoint: http://127.0.0.1:{behind}
+    sending_queue: {{ enabled: false }}
+    retry_on_failure: {{ enabled: false }}
+service:
+  telemetry: {{ metrics: {{ level: none }} }}
+  pipelines:
+    logs: &all {{ receivers: [otlp], processors: [memory_limiter], exporters: [otlphttp] }}
+    traces: *all
+    metrics: *all
+"""
+
+    def __init__(self, program, root, port, behind):
+        self.program, self.port, self.behind, self.starts = program, port, behind, 0
+        self.child, self.log = None, os.path.join(root, "collector.log")
+        self.path = os.path.join(root, "collector.yaml")
+        with open(self.path, "w", encoding="utf-8") as file:
+            file.write(self.CONFIGURATION.format(port=port, behind=behind.port))
+
+    def start(self, faults):
+        del faults   # the receiver's, whose answers are not handed on one by one
+        self.starts += 1
+        if self.behind.child is None or self.behind.child.poll() is not None:
+            self.behind.start(0)
+        with open(self.log, "ab") as log:
+            self.child = subprocess.Popen([self.program, "--config", f"file:{self.path}"],
+                                          stdout=log, stderr=log)
+        await_port(self.child, self.port)
+
+    def kill(self):
+        """Every other time with what is behind it."""
+        self.child.kill()
+        self.child.wait()
+        if self.starts % 2 == 0:
+            self.behind.kill()
+
+
+def await_port(child, port):
+    while child.poll() is None:
+        with socket.socket() as probe:
+            if probe.connect_ex(("127.0.0.1", port)) == 0:
+                return
+        time.sleep(0.02)
+    raise SystemExit("the receiver does not start")
+
+
+def free_port():
+    with socket.socket() as free:
+        free.bind(("127.0.0.1", 0))
+        return free.getsockname()[1]
 
 
 class Request:
@@ -195,7 +252,7 @@ def read_journal(path):
 class Sum:
     """What arrived from one device, beside what was to leave it."""
 
-    def __init__(self, device, requests):
+    def __init__(self, device, requests, is_direct):
         self.device = device
         self.requests = sorted(requests, key=lambda request: request.began)
         self.wrong = []
@@ -203,7 +260,8 @@ class Sum:
         self.lost = device.losses()
         last = {}
         for request in reversed(self.requests):
-            request.unsure = request.is_unsure(device.stops, last.get(request.signal))
+            request.unsure = (not is_direct
+                              or request.is_unsure(device.stops, last.get(request.signal)))
             last[request.signal] = request
 
     def names_in(self, request, name_of):
@@ -317,7 +375,7 @@ def finish(devices, receiver):
     receiver.kill()
 
 
-def add_up(devices, journals):
+def add_up(devices, journals, is_direct):
     """Prints the sum, and says whether it closes."""
     requests = [request for path in journals for request in read_journal(path)]
     by_device = collections.defaultdict(list)
@@ -329,7 +387,7 @@ def add_up(devices, journals):
     total = collections.Counter()
     wrong = []
     for device in devices:
-        sheet = Sum(device, by_device[device.name])
+        sheet = Sum(device, by_device[device.name], is_direct)
         if device.status != 0:
             sheet.wrong.append(f"--once ended with {device.status}")
         arrived, missed = sheet.add("logs", device.store.logs, set(), log_name)
@@ -367,18 +425,19 @@ def main():
     parser.add_argument("--kills", type=int, default=20, help="of exporters, and of the receiver")
     parser.add_argument("--faults", type=float, default=0.25, help="share of requests that fail")
     parser.add_argument("--seed", default="1")
+    parser.add_argument("--collector", metavar="PROGRAM", help="stands before the receiver")
     parser.add_argument("--keep", action="store_true", help="leave everything for a look")
     arguments = parser.parse_args()
     root = tempfile.mkdtemp(prefix="halyard-fleet-")
     os.chmod(root, 0o755)
     program = shutil.copy(arguments.program, os.path.join(root, "halyard-export"))
     chance = random.Random(arguments.seed)
-    with socket.socket() as free:
-        free.bind(("127.0.0.1", 0))
-        port = free.getsockname()[1]
-    devices, receiver = [], Receiver(root, port, arguments.seed)
+    devices, last = [], Receiver(root, free_port(), arguments.seed)
+    receiver = last
+    if arguments.collector:
+        receiver = Collector(arguments.collector, root, free_port(), last)
     try:
-        devices = [Device(number, program, root, port, arguments.seed)
+        devices = [Device(number, program, root, receiver.port, arguments.seed)
                    for number in range(arguments.devices)]
         print(f"{len(devices)} devices stand, with {sum(each.store.rows for each in devices)} "
               "messages", flush=True)
@@ -389,9 +448,10 @@ def main():
         finish(devices, receiver)
         kills = sum(len(device.stops) - 1 for device in devices)
         print(f"killed         {kills} exporters, receiver started {receiver.starts} times")
-        return 0 if add_up(devices, glob.glob(os.path.join(root, "*.journal"))) else 1
+        journals = glob.glob(os.path.join(root, "*.journal"))
+        return 0 if add_up(devices, journals, is_direct=receiver is last) else 1
     finally:
-        for child in [device.child for device in devices] + [receiver.child]:
+        for child in [device.child for device in devices] + [receiver.child, last.child]:
             if child is not None and child.poll() is None:
                 child.kill()
                 child.wait()
