@@ -24,8 +24,8 @@ costs it, next to the floor: a process that appends the same bytes to a file.
   --hold=SECONDS    hold a load this long and watch the memory (0: do not)
   --paced=SECONDS   send requests evenly for this long, each awaited (0: do not)
   --rate=N          messages per second of the held and of the paced load (2000)
-  --churn=N         create, configure, start and stop N sessions, each by itself
-                    and all at once (0: do not)
+  --churn=N         create, start, stop and destroy N sessions, one after the
+                    other and all together (0: do not)
   --sync-interval=T how often the daemon's store syncs, such as 5s (its default)
   --log-level=LEVEL level of the daemon's log, which goes to a file (info)
   --directory=DIR   where the private directories are made (/var/tmp)

@@ -1,6 +1,7 @@
 #include "load/Rates.h"
 
 #include <algorithm>
+#include <array>
 #include <chrono>
 #include <thread>
 
@@ -47,17 +48,37 @@ template <class Work> Cost costOf(const Daemon& daemon, Work work) {
 }
 
 // The answer to a start is held until the stop, so nobody asks for it.
-template <class Ask> void liveOneSession(Connection& client, std::int64_t reporterID, Ask ask) {
+constexpr std::array kLife = {Method::CreateReportingSession,    Method::SetServiceType,
+                              Method::SetConfiguration,          Method::StartReportingSessionForID,
+                              Method::StopReportingSessionForID, Method::DestroyReportingSession};
+
+Arguments argumentsFor(std::uint32_t session) {
     Arguments arguments;
-    arguments.reporterID = reporterID;
+    arguments.reporterID = session + 1;
     arguments.serviceType = 0;
     arguments.dictionary = {{"HostApplicationDisplayID", "player"}};
-    ask(Method::CreateReportingSession, arguments);
-    ask(Method::SetServiceType, arguments);
-    ask(Method::SetConfiguration, arguments);
-    client.notify(Method::StartReportingSessionForID, arguments);
-    ask(Method::StopReportingSessionForID, arguments);
-    ask(Method::DestroyReportingSession, arguments);
+    return arguments;
+}
+
+void liveOneByOne(Connection& client, std::uint32_t sessions) {
+    for (std::uint32_t i = 0; i < sessions; ++i) {
+        for (const Method method : kLife) {
+            if (method == Method::StartReportingSessionForID) {
+                client.notify(method, argumentsFor(i));
+            } else {
+                client.call(method, argumentsFor(i));
+            }
+        }
+    }
+}
+
+void liveTogether(Connection& client, std::uint32_t sessions) {
+    for (const Method method : kLife) {
+        for (std::uint32_t i = 0; i < sessions; ++i) {
+            client.notify(method, argumentsFor(i));
+        }
+    }
+    client.barrier();
 }
 
 } // namespace
@@ -96,21 +117,15 @@ Churn measureChurn(const Options& options) {
     const Daemon daemon(options, {.logLevel = options.logLevel});
     Connection client = daemon.connect();
     client.barrier();
-    const auto liveAll = [&](auto ask) {
-        for (std::uint32_t i = 0; i < options.churn; ++i) {
-            liveOneSession(client, i + 1, ask);
-        }
-        client.barrier();
-        client.call(Method::AdminFlush);
-    };
     const Cost awaited = costOf(daemon, [&] {
-        liveAll([&](Method method, const Arguments& arguments) { client.call(method, arguments); });
+        liveOneByOne(client, options.churn);
+        client.call(Method::AdminFlush);
     });
-    const Cost pipelined = costOf(daemon, [&] {
-        liveAll(
-            [&](Method method, const Arguments& arguments) { client.notify(method, arguments); });
+    const Cost together = costOf(daemon, [&] {
+        liveTogether(client, options.churn);
+        client.call(Method::AdminFlush);
     });
-    return {options.churn, awaited.seconds, awaited.cpu, pipelined.seconds, pipelined.cpu};
+    return {options.churn, awaited.seconds, awaited.cpu, together.seconds, together.cpu};
 }
 
 } // namespace halyard::load

@@ -24,8 +24,8 @@ struct Churn {
     std::uint32_t sessions = 0;
     double awaitedSeconds = 0; // each request sent once the one before is answered
     std::uint64_t awaitedCpu = 0;
-    double pipelinedSeconds = 0; // all sent at once
-    std::uint64_t pipelinedCpu = 0;
+    double togetherSeconds = 0; // all created before the first starts, and so on
+    std::uint64_t togetherCpu = 0;
 };
 
 // Every client sends a request at its share of the rate and awaits its answer.

@@ -77,11 +77,11 @@ std::string pacedTable(const Options& options, const std::vector<PacedLoad>& loa
 }
 
 std::string churnTable(const std::vector<Churn>& churns) {
-    std::string text = "\nsessions: each request awaited: s, CPU s; all at once: s, CPU s\n";
+    std::string text = "\nsessions: each request awaited: s, CPU s; all together: s, CPU s\n";
     for (const Churn& churn : churns) {
         text += fmt::format("{:>8}{:>10.2f}{:>10.2f}{:>10.2f}{:>10.2f}\n", churn.sessions,
                             churn.awaitedSeconds, static_cast<double>(churn.awaitedCpu) / 1e9,
-                            churn.pipelinedSeconds, static_cast<double>(churn.pipelinedCpu) / 1e9);
+                            churn.togetherSeconds, static_cast<double>(churn.togetherCpu) / 1e9);
     }
     return text;
 }
@@ -98,8 +98,8 @@ Dictionary asDictionary(const Churn& churn) {
     return {{"sessions", churn.sessions},
             {"awaited_sec", churn.awaitedSeconds},
             {"awaited_cpu_ns", churn.awaitedCpu},
-            {"pipelined_sec", churn.pipelinedSeconds},
-            {"pipelined_cpu_ns", churn.pipelinedCpu}};
+            {"together_sec", churn.togetherSeconds},
+            {"together_cpu_ns", churn.togetherCpu}};
 }
 
 Dictionary asDictionary(const Measurement& row) {
