@@ -177,23 +177,31 @@ std::vector<Reading> LinuxHWReport::readConfigured(const ChannelList& list,
 platform::HWReportResult<platform::HWReportSamplesRef>
 LinuxHWReport::createSamples(platform::HWReportSubscription* subscription,
                              const platform::HWReportChannels* channels) {
-    const auto* const own = dynamic_cast<const Subscription*>(subscription);
+    auto* const own = dynamic_cast<Subscription*>(subscription);
     if (own == nullptr || own->list.get() != channels) {
         return {nullptr, kInvalid};
     }
     const platform::SteadyTime now = clock_.steadyTime();
-    auto configured = readConfigured(*own->list, now);
-    auto samples = std::make_shared<SampleSet>(own->list, now);
+    if (own->latest == nullptr || now - own->latest->time() >= kCurrent) {
+        own->latest = read(own->list, now);
+    }
+    return {own->latest, std::nullopt};
+}
+
+std::shared_ptr<const SampleSet> LinuxHWReport::read(const ChannelListRef& list,
+                                                     platform::SteadyTime now) {
+    auto configured = readConfigured(*list, now);
+    auto samples = std::make_shared<SampleSet>(list, now);
     std::size_t next = 0;
-    for (const std::size_t place : own->list->places) {
+    for (const std::size_t place : list->places) {
         Channel& channel = channels_[place];
         const Reading reading =
             channel.configured ? std::move(configured[next++]) : channel.source->read(now);
         noteChange(*channel.facts, channel.failing, reading.status != ReadStatus::Read, reading);
         samples->add(reading);
     }
-    sampleCycles(*own->list, now, *samples);
-    return {samples, std::nullopt};
+    sampleCycles(*list, now, *samples);
+    return samples;
 }
 
 void LinuxHWReport::sampleCycles(const ChannelList& list, platform::SteadyTime now,
