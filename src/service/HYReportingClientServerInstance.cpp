@@ -94,12 +94,25 @@ template <class Body> void HYReportingClientServerInstance::continueOnServiceQue
     serviceQueue_->continueWith(taskOf(std::move(body)));
 }
 
+template <class Body>
+void HYReportingClientServerInstance::onServiceQueueFor(std::int64_t reporterID, Body body) {
+    onServiceQueue([reporterID, body = std::move(body)](auto& self, Delegate& delegate) mutable {
+        const auto session = self.ownSession(reporterID);
+        if (session != nullptr && session->mayTrace()) {
+            self.continueOnServiceQueue(std::move(body));
+        } else {
+            body(self, delegate);
+        }
+    });
+}
+
 void HYReportingClientServerInstance::createReportingSession(std::int64_t reporterID,
                                                              BoolReply reply) {
-    onServiceQueue([reporterID, reply = std::move(reply)](auto& self, Delegate& delegate) {
-        const MaybeError error = self.create(delegate, reporterID);
-        reply(error, !error);
-    });
+    onServiceQueueFor(reporterID,
+                      [reporterID, reply = std::move(reply)](auto& self, Delegate& delegate) {
+                          const MaybeError error = self.create(delegate, reporterID);
+                          reply(error, !error);
+                      });
 }
 
 MaybeError HYReportingClientServerInstance::create(Delegate& delegate, std::int64_t reporterID) {
@@ -176,9 +189,10 @@ void HYReportingClientServerInstance::setConfiguration(Dictionary configuration,
 
 void HYReportingClientServerInstance::startReportingSessionForID(std::int64_t reporterID,
                                                                  BoolReply reply) {
-    onServiceQueue([reporterID, reply = std::move(reply)](auto& self, Delegate& delegate) {
-        self.start(delegate, reporterID, reply);
-    });
+    onServiceQueueFor(reporterID,
+                      [reporterID, reply = std::move(reply)](auto& self, Delegate& delegate) {
+                          self.start(delegate, reporterID, reply);
+                      });
 }
 
 void HYReportingClientServerInstance::start(Delegate& delegate, std::int64_t reporterID,
@@ -246,10 +260,11 @@ void HYReportingClientServerInstance::sendRest(std::shared_ptr<MessageFanOut> fa
 
 void HYReportingClientServerInstance::stopReportingSessionForID(std::int64_t reporterID,
                                                                 BoolReply reply) {
-    onServiceQueue([reporterID, reply = std::move(reply)](auto& self, Delegate& delegate) {
-        self.stop(delegate, reporterID);
-        reply(std::nullopt, true);
-    });
+    onServiceQueueFor(reporterID,
+                      [reporterID, reply = std::move(reply)](auto& self, Delegate& delegate) {
+                          self.stop(delegate, reporterID);
+                          reply(std::nullopt, true);
+                      });
 }
 
 void HYReportingClientServerInstance::stop(Delegate& delegate, std::int64_t reporterID) {
@@ -275,10 +290,11 @@ void HYReportingClientServerInstance::stop(Delegate& delegate, std::int64_t repo
 
 void HYReportingClientServerInstance::destroyReportingSession(std::int64_t reporterID,
                                                               BoolReply reply) {
-    onServiceQueue([reporterID, reply = std::move(reply)](auto& self, Delegate& delegate) {
-        self.destroy(delegate, reporterID);
-        reply(std::nullopt, true);
-    });
+    onServiceQueueFor(reporterID,
+                      [reporterID, reply = std::move(reply)](auto& self, Delegate& delegate) {
+                          self.destroy(delegate, reporterID);
+                          reply(std::nullopt, true);
+                      });
 }
 
 void HYReportingClientServerInstance::destroy(Delegate& delegate, std::int64_t reporterID) {

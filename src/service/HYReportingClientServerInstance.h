@@ -89,6 +89,9 @@ private:
     template <class Body> platform::Task taskOf(Body body);
     template <class Body> void onServiceQueue(Body body);
     template <class Body> void continueOnServiceQueue(Body body);
+    // As onServiceQueue(), for what begins or ends the session: where it may wait for a
+    // trace, it is done on the queue's own thread.
+    template <class Body> void onServiceQueueFor(std::int64_t reporterID, Body body);
 
     // The bodies of the requests, on the service work queue.
     MaybeError create(Delegate& delegate, std::int64_t reporterID);

@@ -102,6 +102,20 @@ TEST_F(HYReportingClientServerInstanceTest, SetsNothingOnAnotherClientsSession) 
     EXPECT_EQ(platform_.log.count("service type 4 set for reporter  7"), 0U);
 }
 
+// It would hold up everybody on a thread that was lent.
+TEST_F(HYReportingClientServerInstanceTest, WhatMayWaitForATraceIsLeftToTheQueuesOwnThread) {
+    for (const auto type : {kAudioServiceTypeAlarms, kAudioServiceTypeTest}) {
+        client_.create(7);
+        client_.setServiceType(type, 7);
+        client_.start(7);
+        client_.connection().send(protocol::Method::StopReportingSessionForID, {.reporterID = 7});
+        platform_.queues.runOne();
+        EXPECT_EQ(session(7)->started(), type == kAudioServiceTypeTest);
+        run();
+        EXPECT_FALSE(session(7)->started());
+    }
+}
+
 TEST_F(HYReportingClientServerInstanceTest, StopsNoOtherClientsSession) {
     client_.createAndStart(7);
     EXPECT_TRUE(succeeded(other_.stop(7)));

@@ -139,6 +139,8 @@ public:
     void setupTracing(const std::string* fileName) { trace_->setupTracing(fileName); }
     std::optional<std::string> tracingFileName() const { return trace_->tracingFileName(); }
     bool startedTracing() const { return trace_->startedTracing(); }
+    // Whether its start or its end may have to do with a trace, and so take long.
+    bool mayTrace() const { return serviceType() == kAudioServiceTypeTest || startedTracing(); }
     std::optional<platform::SteadyTime> stopWaitsSince() const { return trace_->stopWaitsSince(); }
     std::string getPSTraceFileURL() const { return trace_->getPSTraceFileURL(); }
 

@@ -30,20 +30,6 @@ bool needsAdministrator(Method method) {
            method == Method::AdminPurge;
 }
 
-// What may wait: for the reading of a device, a trace, the end. The thread that reads
-// from everybody must not, so this is never done there.
-bool mayWait(Method method) {
-    switch (method) {
-    case Method::CreateReportingSession: // It may replace one, and so end its trace.
-    case Method::StartReportingSessionForID:
-    case Method::StopReportingSessionForID:
-    case Method::DestroyReportingSession:
-        return true;
-    default:
-        return needsAdministrator(method);
-    }
-}
-
 std::string_view reason(FrameScanner::Outcome outcome) {
     switch (outcome) {
     case FrameScanner::Outcome::TooLarge:
@@ -326,8 +312,8 @@ bool SocketConnection::takeFrame(std::string_view frame, std::size_t memory,
                                             protocol::methodName(*call->method), peer_.uid)});
         return true;
     }
-    if (mayWait(*call->method)) {
-        wakeUps.keepThread();
+    if (needsAdministrator(*call->method)) {
+        wakeUps.keepThread(); // What it waits for may have to be done by this thread.
     }
     charge->add(frame.size(), memory);
     protocol::Reply reply;

@@ -37,9 +37,9 @@ TEST_F(SocketConnectionLoanTest, AFewMessagesAreDoneWhereTheyWereRead) {
     EXPECT_EQ(recorder_->lent, (std::vector<bool>{true, true}));
 }
 
-TEST_F(SocketConnectionLoanTest, WhatMayWaitIsNotDoneWhereItWasRead) {
+TEST_F(SocketConnectionLoanTest, WhatAnAdministratorAsksForIsNotDoneWhereItWasRead) {
     const int client = connect();
-    send(client, call(Method::StopReportingSessionForID) + notification());
+    send(client, call(Method::AdminFlush) + notification());
     send(client, call(Method::KillService));
     EXPECT_EQ(recorder_->lent, std::vector<bool>(3, false));
 }
