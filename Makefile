@@ -6,7 +6,7 @@
 BUILD_PACKAGES := g++ cmake ninja-build ccache pkg-config python3 \
 	libasio-dev libsqlite3-dev libtomlplusplus-dev libsystemd-dev \
 	libfmt-dev rapidjson-dev libmimalloc-dev libprotozero-dev libplist-dev \
-	libtraceevent-dev libcli11-dev zlib1g-dev libcurl4-openssl-dev uuid-dev \
+	libtraceevent-dev libcli11-dev zlib1g-dev libcurl4-openssl-dev libdeflate-dev uuid-dev \
 	node-d3 libpipewire-0.3-dev libspa-0.2-dev
 # What the demonstration plays with.
 RUN_PACKAGES := pipewire pipewire-bin pipewire-pulse libspa-0.2-modules wireplumber \

@@ -6,7 +6,6 @@
 
 #include "StoreAccess.h"
 #include "platform/Log.h"
-#include "send/Compression.h"
 
 namespace halyard::exporting {
 namespace {
@@ -118,15 +117,14 @@ Outcome<void> Exporter::stepOf(Signal signal, Step& step) {
     return place_.commit(signal, batch.change, world_.now());
 }
 
-Exporter::Load Exporter::loadOf(const Batch& batch) const {
-    Load load;
-    load.body = batch.body.finished(resourceAttributes(resource_, scope_.omission));
+Exporter::Load Exporter::loadOf(const Batch& batch) {
+    batch.body.finish(resourceAttributes(resource_, scope_.omission), plain_);
     if (plan_.options.compress) {
-        std::string compressed = gzipped(load.body);
-        load.isCompressed = !compressed.empty();
-        load.body = load.isCompressed ? std::move(compressed) : std::move(load.body);
+        if (const std::string_view packed = gzip_.compressed(plain_); !packed.empty()) {
+            return {packed, true};
+        }
     }
-    return load;
+    return {plain_, false};
 }
 
 Outcome<void> Exporter::send(Signal signal, Batch& batch, Step& step) {

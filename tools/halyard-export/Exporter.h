@@ -12,11 +12,13 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <string_view>
 
 #include "Options.h"
 #include "content/Collector.h"
 #include "content/Resource.h"
 #include "place/ExportPlace.h"
+#include "send/Compression.h"
 #include "send/Receiver.h"
 
 namespace halyard::exporting {
@@ -63,8 +65,9 @@ private:
         double notBefore = 0;
         std::string told; // what the log has been told of it
     };
+    // A body as it is sent; valid until the next.
     struct Load {
-        std::string body;
+        std::string_view body;
         bool isCompressed = false;
     };
 
@@ -77,7 +80,7 @@ private:
     reading::Outcome<void> giveUp(Signal signal, Batch& batch, const Answer& answer);
     void retryLater(Signal signal, const Answer& answer);
     void tell(Signal signal, const std::string& trouble);
-    Load loadOf(const Batch& batch) const;
+    Load loadOf(const Batch& batch);
     Lane& laneOf(Signal signal) { return lanes_[static_cast<std::size_t>(signal)]; }
 
     const std::filesystem::path store_;
@@ -88,6 +91,8 @@ private:
     ResourceFacts resource_;
     std::unique_ptr<Collector> collector_;
     std::array<Lane, kSignals> lanes_;
+    std::string plain_; // the body of the last load
+    Gzip gzip_;
 };
 
 } // namespace halyard::exporting

@@ -4,7 +4,6 @@
 #include <rapidjson/writer.h>
 
 #include "otlp/OtlpJson.h"
-#include "send/Compression.h"
 
 namespace halyard::exporting {
 namespace {
@@ -49,7 +48,7 @@ Answer Preview::post(Signal signal, std::string_view body, bool /*isCompressed*/
         return answer;
     }
     ++requests_;
-    bytes_ += gzipped(body).size();
+    bytes_ += gzip_.compressed(body).size();
     const Names& names = kNames[static_cast<std::size_t>(signal)];
     for (const auto& resource : member(document, names.resources).GetArray()) {
         takeAttributes("resource", "", resource["resource"]);

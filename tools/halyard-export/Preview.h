@@ -13,6 +13,7 @@
 #include <rapidjson/document.h>
 
 #include "Options.h"
+#include "send/Compression.h"
 #include "send/Receiver.h"
 
 namespace halyard::exporting {
@@ -50,6 +51,7 @@ private:
     void add(const std::string& where, const std::string& name, const std::string& key,
              const std::string& example);
 
+    Gzip gzip_;
     std::map<Place, Key> keys_;
     std::array<std::uint64_t, kSignals> records_{};
     std::uint64_t requests_ = 0;

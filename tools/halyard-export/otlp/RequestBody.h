@@ -23,9 +23,9 @@ public:
     // Of the items alone.
     std::size_t bytes() const { return items_.size(); }
 
-    // The whole message; empty when it has no items. `attributes` are those of the
-    // resource, encoded as fields of a Resource.
-    std::string finished(std::string_view attributes) const;
+    // Writes the whole message to `body`; empty when it has no items. `attributes` are those
+    // of the resource, encoded as fields of a Resource.
+    void finish(std::string_view attributes, std::string& body) const;
 
 private:
     std::string items_;

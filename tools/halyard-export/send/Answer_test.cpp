@@ -59,10 +59,18 @@ TEST(AnswerTest, NonsenseRejectsNothing) {
 }
 
 TEST(CompressionTest, MakesAGzipFile) {
-    const std::string packed = gzipped(std::string(10'000, 'a'));
+    Gzip gzip;
+    const std::string packed(gzip.compressed(std::string(10'000, 'a')));
     ASSERT_GT(packed.size(), 18U);
     EXPECT_LT(packed.size(), 200U);
     EXPECT_EQ(packed.substr(0, 3), "\x1f\x8b\x08");
+}
+
+TEST(CompressionTest, MakesTheSameOfTheSameWhateverWasBefore) {
+    Gzip gzip;
+    const std::string first(gzip.compressed("one and only one"));
+    (void)gzip.compressed(std::string(100'000, 'x'));
+    EXPECT_EQ(gzip.compressed("one and only one"), first);
 }
 
 } // namespace

@@ -1,31 +1,31 @@
 #include "send/Compression.h"
 
-#include <zlib.h>
+#include <libdeflate.h>
 
 namespace halyard::exporting {
 namespace {
 
-constexpr int kGzip = 16; // added to the bits of the window
-constexpr int kMemoryLevel = 8;
+// Higher ones take much longer for a few bytes (docs/export.md has the figures).
+constexpr int kLevel = 6;
 
 } // namespace
 
-std::string gzipped(std::string_view bytes) {
-    z_stream stream{};
-    if (deflateInit2(&stream, Z_BEST_SPEED, Z_DEFLATED, MAX_WBITS + kGzip, kMemoryLevel,
-                     Z_DEFAULT_STRATEGY) != Z_OK) {
+void Gzip::Free::operator()(libdeflate_compressor* compressor) const {
+    libdeflate_free_compressor(compressor);
+}
+
+Gzip::Gzip() : compressor_(libdeflate_alloc_compressor(kLevel)) {}
+
+std::string_view Gzip::compressed(std::string_view bytes) {
+    if (compressor_ == nullptr) {
         return {};
     }
-    std::string out(deflateBound(&stream, bytes.size()), '\0');
-    // zlib's type for what it only reads.
-    stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(bytes.data()));
-    stream.avail_in = static_cast<uInt>(bytes.size());
-    stream.next_out = reinterpret_cast<Bytef*>(out.data());
-    stream.avail_out = static_cast<uInt>(out.size());
-    const bool isWhole = deflate(&stream, Z_FINISH) == Z_STREAM_END;
-    out.resize(isWhole ? stream.total_out : 0);
-    deflateEnd(&stream);
-    return out;
+    const std::size_t bound = libdeflate_gzip_compress_bound(compressor_.get(), bytes.size());
+    if (out_.size() < bound) {
+        out_.resize(bound);
+    }
+    return {out_.data(), libdeflate_gzip_compress(compressor_.get(), bytes.data(), bytes.size(),
+                                                  out_.data(), out_.size())};
 }
 
 } // namespace halyard::exporting
