@@ -319,7 +319,7 @@ def log_name(record):
     for pair in otlp.all_of(record, 6):
         parts = dict(otlp.fields(pair))
         if parts[1] == b"log.record.uid":
-            return uuid.UUID(dict(otlp.fields(parts[2]))[1].decode()).bytes
+            return dict(otlp.fields(parts[2]))[1].decode()
     return None
 
 

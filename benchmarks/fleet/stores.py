@@ -39,6 +39,10 @@ def bits(time):
     return f"{struct.unpack('<Q', struct.pack('<d', time))[0]:x}"
 
 
+def mixed(time):
+    return struct.unpack("<Q", struct.pack("<d", time))[0] * 0x9E3779B97F4A7C15 % 2**64 >> 48
+
+
 def named(*parts):
     return uuid.uuid5(NAMES, "/".join(str(part) for part in parts))
 
@@ -81,7 +85,7 @@ class Store:
             "INSERT INTO upload_message(upload_session, category, type, payload, time)"
             " VALUES(?, ?, ?, ?, ?)", (session, category, kind, text, time))
         self.rows += 1
-        self.logs.add(named(self.device, "upload_message", self.rows, bits(time)).bytes)
+        self.logs.add(f"{self.device}/upload_message/{self.rows}/{mixed(time):04x}")
 
     def open_session(self):
         self.sessions += 1

@@ -93,7 +93,7 @@ void Collector::arrived(Signal signal) {
 Outcome<Batch> Collector::collectLogs(StoreReader& reader, const ExportPlace& place) {
     Batch batch;
     // A session may have got its row, or been closed, since the last look.
-    sessions_.forget();
+    records_.forget();
     for (std::size_t table = 0; table < kLogTables.size() && !batch.hasMore; ++table) {
         if (table == kAnalyticsEvents && !scope_.analyticsEvents) {
             continue;

@@ -38,6 +38,53 @@ TEST_F(ContentsTest, APayloadKeepsItsTypes) {
     }
 }
 
+TEST_F(ContentsTest, OfAListThatIsTooDeepTheInnermostStays) {
+    const auto nested = [](std::size_t depth) {
+        return std::string(depth, '[') + std::string(depth, ']');
+    };
+    message(1, R"({"deep":)" + nested(129) + R"(,"flat":)" + nested(128) + R"(,"beside":[7]})");
+    run();
+    const auto records = receiver_.items(Signal::Logs);
+    ASSERT_EQ(records.size(), 1U);
+    EXPECT_EQ(attribute(records[0], "halyard.beside"), "other");
+    const std::string& json = receiver_.requests.at(0).json;
+    std::size_t lists = 0;
+    for (std::size_t at = 0; (at = json.find("arrayValue", at)) != std::string::npos; ++at) {
+        ++lists;
+    }
+    EXPECT_EQ(lists, 128U + 128U + 1U); // the innermost of the first stays
+}
+
+TEST_F(ContentsTest, APayloadThatIsNoDictionaryHasNoAttributes) {
+    for (const char* const payload :
+         {R"({"a":1,"b":)", R"([{"a":1}])", R"("a")", "7", "", R"({"a":1e999})", R"({"a":1} {)"}) {
+        message(1, payload);
+    }
+    run();
+    const auto records = receiver_.items(Signal::Logs);
+    ASSERT_EQ(records.size(), 7U);
+    for (const auto& record : records) {
+        EXPECT_EQ(record["attributes"].Size(), 1U); // its identity
+    }
+}
+
+TEST_F(ContentsTest, TextsThatAreNotUtf8BecomeSo) {
+    message(1, "{\"k\xff\":\"v\xc3\",\"escaped\":\"\\u00e9\\n\"}");
+    run();
+    const auto records = receiver_.items(Signal::Logs);
+    EXPECT_EQ(attribute(records.at(0), "halyard.k\xef\xbf\xbd"), "v\xef\xbf\xbd");
+    EXPECT_EQ(attribute(records.at(0), "halyard.escaped"), "\xc3\xa9\n");
+}
+
+TEST_F(ContentsTest, AnOmittedNameThatIsNotUtf8IsNamedNowhere) {
+    plan_.options.omit = {"application"};
+    message(1, "{\"said\":\"by pl\xffyer\",\"x\":1}", session("", "pl\xffyer"));
+    run();
+    const auto records = receiver_.items(Signal::Logs);
+    EXPECT_EQ(attribute(records.at(0), "halyard.said"), "none");
+    EXPECT_EQ(attribute(records.at(0), "halyard.x"), "1");
+}
+
 TEST_F(ContentsTest, ALogRecordBelongsToTheSpanOfItsSession) {
     message(2, "{}", session());
     run();

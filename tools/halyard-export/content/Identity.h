@@ -1,8 +1,9 @@
 // Names of what leaves, the same whenever it is sent: who receives a thing twice can
 // tell.
 //
-// They are derived from the device's identity and what stands in the store, as UUIDs of
-// version 5 (RFC 9562): nothing has to be remembered for them. Values; any thread.
+// They are derived from the device's identity and what stands in the store, those of traces
+// and spans as UUIDs of version 5 (RFC 9562): nothing has to be remembered for them. Values;
+// any thread.
 #pragma once
 
 #include <array>
@@ -28,8 +29,11 @@ public:
     SpanID spanOf(std::int64_t row, double opened) const;
     // Of a glitch of that session.
     SpanID spanOfGlitch(std::int64_t row, double opened, double start, std::string_view node) const;
-    // Of a row of a table, as a UUID's text.
-    std::string recordOf(std::string_view table, std::int64_t row, double time) const;
+    // Of a row of a table: the device, the table, the row, and 16 bits of its time, which tell
+    // apart the rows of a store that was put back to an earlier state. A text that mostly
+    // repeats the one before it, for a UUID's digits are most of what a record weighs.
+    void appendRecord(std::string& text, std::string_view table, std::int64_t row,
+                      double time) const;
 
 private:
     std::string device_;

@@ -16,6 +16,8 @@ enum Table : std::size_t { kMessages, kIncidents, kEnergy, kEvents };
 // Of upload_message.
 enum Column : int { kID, kSession, kSessionInfo, kUserInfo, kCategory, kType, kPayload, kTime };
 
+// Clients make them up.
+constexpr std::size_t kMostEvents = 1024;
 constexpr int kTimeColumn[] = {kTime, 3, 4, 3};
 
 struct Severity {
@@ -46,26 +48,49 @@ std::string eventName(std::uint32_t category, std::uint16_t type) {
     return name;
 }
 
-void LogRecords::begin(std::string_view event, int severity, std::size_t table,
-                       const reading::Row& row) {
-    const double time = timeOf(table, row);
+std::string_view LogRecords::eventOf(std::uint32_t category, std::uint16_t type) {
+    const std::uint64_t key = (std::uint64_t{category} << 16U) | type;
+    auto found = events_.find(key);
+    if (found == events_.end()) {
+        if (events_.size() >= kMostEvents) {
+            events_.clear();
+        }
+        found = events_.emplace(key, eventName(category, type)).first;
+    }
+    return found->second;
+}
+
+void LogRecords::forget() {
+    sessions_.forget();
+    session_.reset();
+}
+
+void LogRecords::begin(std::string_view event, int severity) {
     const auto* const level =
         std::find_if(std::begin(kSeverities), std::end(kSeverities),
                      [severity](const Severity& each) { return each.number == severity; });
+    record_.clear();
+    attributes_.clear();
     Writer writer(record_);
-    writer.add_fixed64(log_record::kTime, nanoseconds(time));
+    writer.add_string(log_record::kEventName, event.data(), event.size());
     writer.add_enum(log_record::kSeverityNumber, severity);
     writer.add_string(log_record::kSeverityText, level->text.data(), level->text.size());
+}
+
+void LogRecords::end(std::size_t table, const reading::Row& row) {
+    const double time = timeOf(table, row);
+    uid_.clear();
+    identity_.appendRecord(uid_, kLogTables[table].name, row.integer(kID), time);
+    record_ += attributes_.texts;
+    appendAttribute(record_, log_record::kAttributes, {}, "log.record.uid", AnyValue::ofText(uid_));
+    Writer writer(record_);
+    writer.add_fixed64(log_record::kTime, nanoseconds(time));
     writer.add_fixed64(log_record::kObservedTime, nanoseconds(time));
-    writer.add_string(log_record::kEventName, event.data(), event.size());
-    otlp::addText(writer, log_record::kAttributes, "log.record.uid",
-                  identity_.recordOf(kLogTables[table].name, row.integer(kID), time));
+    record_ += attributes_.numbers;
 }
 
 const std::string& LogRecords::recordOf(reading::StoreReader& reader, std::size_t table,
                                         const reading::Row& row) {
-    record_.clear();
-    payload_.setNames({});
     switch (table) {
     case kMessages:
         addMessage(reader, row);
@@ -80,67 +105,79 @@ const std::string& LogRecords::recordOf(reading::StoreReader& reader, std::size_
         addNamedEvent("halyard.event", table, row);
         break;
     }
+    end(table, row);
     return record_;
 }
 
 void LogRecords::addMessage(reading::StoreReader& reader, const reading::Row& row) {
     const auto category = static_cast<std::uint32_t>(row.integer(kCategory));
     const auto type = static_cast<std::uint16_t>(row.integer(kType));
-    begin(eventName(category, type), severityOf(category, type), kMessages, row);
+    begin(eventOf(category, type), severityOf(category, type));
     const auto session = row.maybeInteger(kSession);
-    const BookedSession* const booked = session ? sessions_.find(reader, *session) : nullptr;
-    if (booked != nullptr) {
-        Writer writer(record_);
-        const auto trace = viewOf(booked->trace);
-        const auto span = viewOf(booked->span);
-        writer.add_bytes(log_record::kTraceID, trace.data(), trace.size());
-        writer.add_bytes(log_record::kSpanID, span.data(), span.size());
-        // A session's names are from when it was opened.
-        addNames(booked->names, booked->userInfo, consent_.isGivenAt(booked->opened));
+    if (session && session != session_) {
+        session_ = session;
+        sessionBytes_.clear();
+        const BookedSession* const booked = sessions_.find(reader, *session);
+        booked != nullptr ? addSession(*booked) : payload_.setNames({});
     } else if (!session) {
-        addNames(reading::namesIn(fields_, row.text(kSessionInfo), row.text(kUserInfo)),
-                 row.text(kUserInfo), true);
+        session_.reset();
+        const auto names = reading::namesIn(fields_, row.text(kSessionInfo), row.text(kUserInfo));
+        setNames(names, row.text(kUserInfo));
+        addNames(record_, names);
     }
-    Writer writer(record_);
-    payload_.addAll(writer, log_record::kAttributes, row.text(kPayload));
+    if (session) {
+        record_ += sessionBytes_;
+    }
+    payload_.add(attributes_, log_record::kAttributes, row.text(kPayload));
 }
 
-void LogRecords::addNames(const reading::SessionNames& names, std::string_view userInfo,
-                          bool leave) {
-    payload_.setNames(omission_.omitsApplication() ? applicationNames(names, userInfo)
-                                                   : std::vector<std::string>());
-    if (!leave) {
-        return;
+void LogRecords::addSession(const BookedSession& session) {
+    setNames(session.names, session.userInfo);
+    Writer writer(sessionBytes_);
+    const auto trace = viewOf(session.trace);
+    const auto span = viewOf(session.span);
+    writer.add_bytes(log_record::kTraceID, trace.data(), trace.size());
+    writer.add_bytes(log_record::kSpanID, span.data(), span.size());
+    // A session's names are from when it was opened.
+    if (consent_.isGivenAt(session.opened)) {
+        addNames(sessionBytes_, session.names);
     }
-    Writer writer(record_);
+}
+
+void LogRecords::setNames(const reading::SessionNames& names, std::string_view json) {
+    payload_.setNames(omission_.omitsApplication() ? applicationNames(names, json)
+                                                   : std::vector<std::string>());
+}
+
+void LogRecords::addNames(std::string& bytes, const reading::SessionNames& names) {
     if (names.application) {
-        payload_.addText(writer, log_record::kAttributes, "application", *names.application);
+        payload_.addText(bytes, log_record::kAttributes, "application", *names.application);
     }
     if (names.service) {
-        payload_.addText(writer, log_record::kAttributes, "service", *names.service);
+        payload_.addText(bytes, log_record::kAttributes, "service", *names.service);
     }
 }
 
 void LogRecords::addIncident(const reading::Row& row) {
     constexpr int kSignature = 1;
-    begin("halyard.incident", log_record::kError, kIncidents, row);
-    Writer writer(record_);
-    payload_.addAll(writer, log_record::kAttributes, row.text(kSignature));
+    begin("halyard.incident", log_record::kError);
+    session_.reset();
+    payload_.setNames({});
+    payload_.add(attributes_, log_record::kAttributes, row.text(kSignature));
 }
 
 void LogRecords::addNamedEvent(std::string_view event, std::size_t table, const reading::Row& row) {
     const bool isEnergy = table == kEnergy;
     const int name = isEnergy ? 2 : 1;
-    begin(event, log_record::kInfo, table, row);
-    if (omission_.omitsApplication()) {
-        payload_.setNames(applicationNames({}, row.text(name + 1)));
-    }
-    Writer writer(record_);
+    begin(event, log_record::kInfo);
+    session_.reset();
+    setNames({}, row.text(name + 1));
     if (isEnergy && !omission_.omits("client")) {
-        otlp::addInteger(writer, log_record::kAttributes, "halyard.client", row.integer(1));
+        appendAttribute(attributes_.numbers, log_record::kAttributes, kPrefix, "client",
+                        AnyValue::ofInteger(row.integer(1)));
     }
-    payload_.addText(writer, log_record::kAttributes, "name", row.text(name));
-    payload_.addAll(writer, log_record::kAttributes, row.text(name + 1));
+    payload_.addText(attributes_.texts, log_record::kAttributes, "name", row.text(name));
+    payload_.add(attributes_, log_record::kAttributes, row.text(name + 1));
 }
 
 } // namespace halyard::exporting

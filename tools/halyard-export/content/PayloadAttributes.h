@@ -1,51 +1,76 @@
 // The dictionaries of the store as attributes.
 //
+// The text of a row is read once, from its bytes right into those of the request: no tree
+// stands between, which would cost more than all the rest. What varies from record to record
+// is kept apart from what mostly stays the same, because what stays the same is compressed
+// best in one piece.
+//
 // Not thread-safe: the scratch buffers are used again.
 #pragma once
 
+#include <functional>
 #include <string>
 #include <string_view>
 #include <vector>
 
+#include <rapidjson/reader.h>
+
 #include "content/Omission.h"
 #include "otlp/Attributes.h"
-#include "reading/JsonFields.h"
 
 namespace halyard::exporting {
 
 // What stands before each key of ours.
 inline constexpr std::string_view kPrefix = "halyard.";
 
+// Encoded attributes, which belong to one message and may be put there in any order.
+struct AttributeBytes {
+    std::string texts; // and lists and dictionaries
+    std::string numbers;
+
+    void clear() {
+        texts.clear();
+        numbers.clear();
+    }
+};
+
 class PayloadAttributes {
 public:
+    // Whether an entry is told elsewhere.
+    using Passes = std::function<bool(std::string_view key)>;
+
     // Borrows `omission`.
     explicit PayloadAttributes(const Omission& omission) : omission_(omission) {}
 
     // The names that stand for the application of what follows.
-    void setNames(std::vector<std::string> names) { names_ = std::move(names); }
+    void setNames(std::vector<std::string> names);
 
-    bool isLeftOut(std::string_view key, std::string_view text) const;
-
-    // All entries of a JSON object, their keys after kPrefix. What is no object has none.
-    void addAll(otlp::Writer& writer, otlp::Tag tag, std::string_view json);
+    // Appends all entries of a JSON object, their keys after kPrefix, as fields `tag`. What
+    // is no object has none.
+    void add(AttributeBytes& bytes, otlp::Tag tag, std::string_view json,
+             const Passes& passes = nullptr);
     // One entry; nothing where it is left out.
-    void add(otlp::Writer& writer, otlp::Tag tag, std::string_view key,
-             const rapidjson::Value& value);
-    void addText(otlp::Writer& writer, otlp::Tag tag, std::string_view key, std::string_view text);
+    void addText(std::string& bytes, otlp::Tag tag, std::string_view key, std::string_view text);
 
 private:
-    // False: it is left out.
-    bool append(std::string& any, const rapidjson::Value& value, int depth);
-    bool appendDictionary(std::string& any, const rapidjson::Value& value, int depth);
-    bool appendList(std::string& any, const rapidjson::Value& value, int depth);
+    class Transcoder;
+    struct Container {
+        std::string bytes;
+        std::string_view key; // of the entry that is about to come
+        bool isList = false;
+    };
+
+    bool mayLeave(std::string_view key) const;
+    bool mayLeaveAsText(std::string_view text) const;
     bool namesApplication(std::string_view text) const;
+    bool isSummary(std::string_view json) const;
 
     const Omission& omission_;
     std::vector<std::string> names_;
     bool isSummary_ = false;
-    reading::JsonFields fields_;
-    std::string any_;
-    std::string key_;
+    rapidjson::Reader reader_;
+    std::string json_;                  // which is parsed in its place
+    std::vector<Container> containers_; // by their depth
 };
 
 } // namespace halyard::exporting

@@ -12,6 +12,9 @@ using namespace otlp;
 
 // Of the upload framework itself, which the span's own attributes tell better.
 constexpr std::string_view kFrameworkKeys = "kRelay";
+// Which the protocol has attributes of its own for.
+constexpr const char* kPid = "application_pid";
+constexpr const char* kBinary = "application_binary";
 
 void addID(Writer& span, Tag tag, std::string_view id) {
     span.add_bytes(tag, id.data(), id.size());
@@ -37,7 +40,7 @@ void SessionSpans::add(RequestBody& body, const BookedSession& session,
     span.add_string(span::kName, session.names.service.value_or("unknown"));
     span.add_enum(span::kKind, span::kInternal);
     addTimes(span, session.opened, session.closed.value_or(session.opened));
-    addFacts(span, session);
+    addFacts(bytes, session);
     addEvents(span, contents);
     if (contents.changesLeftOut > 0) {
         span.add_uint32(span::kDroppedEvents, static_cast<std::uint32_t>(std::min<std::uint64_t>(
@@ -54,42 +57,61 @@ void SessionSpans::add(RequestBody& body, const BookedSession& session,
     }
 }
 
-void SessionSpans::addFacts(Writer& span, const BookedSession& session) {
-    if (session.sessionID) {
-        addInteger(span, span::kAttributes, "halyard.session_id", *session.sessionID);
-    }
+void SessionSpans::addFacts(std::string& bytes, const BookedSession& session) {
+    attributes_.clear();
     const auto addName = [&](std::string_view key, const std::optional<std::string>& name) {
         if (name) {
-            payload_.addText(span, span::kAttributes, key, *name);
+            payload_.addText(attributes_.texts, span::kAttributes, key, *name);
         }
     };
     addName("application", session.names.application);
     addName("service", session.names.service);
     if (!session.ended.empty()) {
-        payload_.addText(span, span::kAttributes, "ended", session.ended);
+        addName("ended", session.ended);
     }
+    if (session.sessionID) {
+        appendAttribute(attributes_.numbers, span::kAttributes, kPrefix, "session_id",
+                        AnyValue::ofInteger(*session.sessionID));
+    }
+    addProcess(session);
+    bytes.append(attributes_.texts).append(attributes_.numbers);
+}
+
+void SessionSpans::addProcess(const BookedSession& session) {
     reading::JsonFields fields;
-    if (!fields.parse(session.userInfo)) {
-        return;
+    (void)fields.parse(session.userInfo);
+    const rapidjson::Value* const pid = fields.find(kPid);
+    const bool hasPid = pid != nullptr && pid->IsInt64();
+    const auto binary = fields.text(kBinary);
+    if (hasPid && !omission_.omits(kPid)) {
+        appendAttribute(attributes_.numbers, span::kAttributes, {}, "process.pid",
+                        AnyValue::ofInteger(pid->GetInt64()));
     }
-    fields.forEachEntry([&](std::string_view key, const rapidjson::Value& value) {
-        if (key == "application_pid" && value.IsInt64() && !omission_.omits(key)) {
-            addInteger(span, span::kAttributes, "process.pid", value.GetInt64());
-        } else if (key == "application_binary" && value.IsString() && !omission_.omits(key)) {
-            otlp::addText(span, span::kAttributes, "process.executable.name",
-                          {value.GetString(), value.GetStringLength()});
-        } else if (!key.starts_with(kFrameworkKeys)) {
-            payload_.add(span, span::kAttributes, key, value);
-        }
+    if (binary && !omission_.omits(kBinary)) {
+        Writer writer(attributes_.texts);
+        otlp::addText(writer, span::kAttributes, "process.executable.name", *binary);
+    }
+    payload_.add(attributes_, span::kAttributes, session.userInfo, [&](std::string_view key) {
+        return (hasPid && key == kPid) || (binary && key == kBinary) ||
+               key.starts_with(kFrameworkKeys);
     });
 }
 
+void SessionSpans::addPayload(std::string& bytes, Tag tag, std::string_view payload) {
+    attributes_.clear();
+    payload_.add(attributes_, tag, payload);
+    bytes.append(attributes_.texts).append(attributes_.numbers);
+}
+
 void SessionSpans::addEvents(Writer& span, const SessionContents& contents) {
+    std::string event;
     const auto addEvent = [&](double time, std::string_view name, std::string_view payload) {
-        Writer event(span, span::kEvents);
-        event.add_fixed64(span::kEventTime, nanoseconds(time));
-        event.add_string(span::kEventName, name.data(), name.size());
-        payload_.addAll(event, span::kEventAttributes, payload);
+        event.clear();
+        Writer writer(event);
+        writer.add_fixed64(span::kEventTime, nanoseconds(time));
+        writer.add_string(span::kEventName, name.data(), name.size());
+        addPayload(event, span::kEventAttributes, payload);
+        span.add_message(span::kEvents, event);
     };
     for (const TimedPayload& change : contents.changes) {
         addEvent(change.time,
@@ -111,7 +133,7 @@ std::string SessionSpans::glitchSpan(const BookedSession& session, const GlitchF
     span.add_string(span::kName, "glitch");
     span.add_enum(span::kKind, span::kInternal);
     addTimes(span, glitch.start, glitch.start + glitch.seconds.value_or(0));
-    payload_.addAll(span, span::kAttributes, glitch.payload);
+    addPayload(bytes, span::kAttributes, glitch.payload);
     return bytes;
 }
 

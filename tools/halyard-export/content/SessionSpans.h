@@ -24,12 +24,15 @@ public:
 
 private:
     void addEvents(otlp::Writer& span, const SessionContents& contents);
-    void addFacts(otlp::Writer& span, const BookedSession& session);
+    void addFacts(std::string& bytes, const BookedSession& session);
+    void addProcess(const BookedSession& session);
+    void addPayload(std::string& bytes, otlp::Tag tag, std::string_view payload);
     std::string glitchSpan(const BookedSession& session, const GlitchFacts& glitch);
 
     const Identity& identity_;
     const Omission& omission_;
     PayloadAttributes payload_;
+    AttributeBytes attributes_;
 };
 
 } // namespace halyard::exporting

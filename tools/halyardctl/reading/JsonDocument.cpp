@@ -1,15 +1,15 @@
 #include "reading/JsonDocument.h"
 
-#include <charconv>
 #include <cstdint>
 
 #include <rapidjson/memorystream.h>
 
+#include "reading/JsonNumbers.h"
+
 namespace halyard::reading {
 namespace {
 
-// Passes everything on, numbers as the standard library reads them: exact, where the parser's
-// own way to exact numbers shifts a zero such as "0e-88" by an undefined count.
+// Passes everything on, numbers as what they are.
 class Numbers {
 public:
     using Length = rapidjson::SizeType;
@@ -17,17 +17,7 @@ public:
     explicit Numbers(rapidjson::Document& document) : document_(document) {}
 
     bool RawNumber(const char* text, Length length, bool /*copy*/) {
-        const auto isWhole = [&](auto& number) {
-            const auto read = std::from_chars(text, text + length, number);
-            return read.ec == std::errc() && read.ptr == text + length;
-        };
-        std::int64_t integer = 0;
-        std::uint64_t large = 0;
-        double real = 0;
-        if (isWhole(integer) && (integer != 0 || *text != '-')) {
-            return document_.Int64(integer);
-        }
-        return isWhole(large) ? document_.Uint64(large) : isWhole(real) && document_.Double(real);
+        return takeNumber({text, length}, document_);
     }
     bool Null() { return document_.Null(); }
     bool Bool(bool value) { return document_.Bool(value); }
