@@ -27,6 +27,7 @@ import time
 sys.path.append(os.path.join(os.path.dirname(os.path.abspath(__file__)), "..", "scripts"))
 sys.path.append(os.path.join(os.path.dirname(os.path.abspath(__file__)), "..", "tests", "daemon"))
 import launcher  # noqa: E402
+from faulty_disk import FaultyDisk  # noqa: E402
 from harness import Client  # noqa: E402
 
 SECONDS = {"50ms": 0.05, "500ms": 0.5, "5s": 5, "30s": 30}
@@ -69,8 +70,8 @@ class Run:
         self.daemon = launcher.Launcher(arguments.halyardd, self.root)
         self.daemon.configure(f'[store]\nsync_interval = "{interval}"\n')
         self.disk = Disk(self.daemon.path("state")) if arguments.device else None
-        self.order = self.daemon.path("order")
-        self.daemon.start(extra={"LD_PRELOAD": arguments.library, "FAULTY_DISK": self.order})
+        self.faulty = FaultyDisk(arguments.library, self.daemon.path("faults"))
+        self.daemon.start(extra=self.faulty.environment())
         self.daemon.wait_until_it_accepts(60)
         self.client = Client(self.daemon.socket_path)
         self.client.session(1)
@@ -79,8 +80,6 @@ class Run:
     def counts(self):
         """Bytes written, syncs, wake-ups."""
         pid = self.daemon.process.pid
-        with open(self.order + ".counts", "rb") as file:
-            syncs = int.from_bytes(file.read(8), "little")
         if self.disk:
             written = self.disk.written()
         else:
@@ -91,7 +90,7 @@ class Run:
             with open(f"/proc/{pid}/task/{thread}/status", encoding="ascii") as file:
                 wakes += next(int(line.split()[1]) for line in file
                               if line.startswith("voluntary_ctxt_switches"))
-        return written, syncs, wakes
+        return written, self.faulty.syncs(), wakes
 
     def message(self):
         n = self.sent

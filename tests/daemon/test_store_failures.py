@@ -7,6 +7,7 @@ import sqlite3
 import subprocess
 import unittest
 
+from faulty_disk import FaultyDisk
 from harness import PATIENCE, Daemon, DaemonTest
 
 
@@ -122,19 +123,13 @@ class OnAFaultyDisk(unittest.TestCase):
             self.skipTest("FAULTY_DISK_LIBRARY names no library")
         self.daemon = Daemon()
         self.addCleanup(self.daemon.remove)
-        self.order = self.daemon.path("order")
-        self.tell("")
-        self.daemon.start(extra={"LD_PRELOAD": library, "FAULTY_DISK": self.order})
+        self.disk = FaultyDisk(library, self.daemon.path("disk"))
+        self.daemon.start(extra=self.disk.environment())
         self.daemon.wait_until_it_accepts(PATIENCE)
         self.client = self.daemon.client()
         self.addCleanup(self.client.close)
         self.client.session(1)
         self.sent = 0
-
-    def tell(self, order):
-        with open(self.order + ".new", "w", encoding="utf-8") as file:
-            file.write(order)
-        os.rename(self.order + ".new", self.order)
 
     def send(self):
         self.client.result("sendMessage", {"n": self.sent}, 4, 1, [1])
@@ -149,7 +144,7 @@ class OnAFaultyDisk(unittest.TestCase):
     def test_a_hang_is_told_and_so_is_what_it_costs(self):
         self.send()
         self.client.result("admin.flush")
-        self.tell("hang")
+        self.disk.tell("hang")
 
         def failing():
             self.send()
@@ -172,10 +167,10 @@ class OnAFaultyDisk(unittest.TestCase):
         other.commit()
         other.execute("PRAGMA wal_checkpoint(TRUNCATE)")
         other.close()
-        self.tell("eio")
+        self.disk.tell("read_error")
         self.send()
         self.daemon.wait_for(lambda: self.store()["failing"])
-        self.tell("")
+        self.disk.tell("none")
         self.send()
         self.client.result("admin.flush")
         self.assertEqual(self.messages(), self.sent)
