@@ -26,6 +26,9 @@ FUZZ_SECONDS ?= 60
 # `make check PRESETS=gcc-tsan` for one of them; `make check TIDY=1` adds clang-tidy.
 PRESETS ?= gcc-debug gcc-release gcc-asan gcc-tsan clang-debug clang-release clang-asan clang-tsan
 TIDY ?=
+# `make torture MINUTES=60 SEED=7`; without a seed it takes one, and prints it.
+MINUTES ?= 10
+SEED ?=
 # `make install PREFIX=/usr DESTDIR=DIR` puts everything below DIR.
 PREFIX ?= /usr/local
 DESTDIR ?=
@@ -40,7 +43,7 @@ CTEST_FLAGS := --output-on-failure --no-label-summary --parallel $(TEST_JOBS)
 FIXED_ADDRESSES := setarch $(shell uname -m) -R
 
 .DEFAULT_GOAL := build
-.PHONY: deps build install deb run pictures test check fuzz tidy bench format clean
+.PHONY: deps build install deb run pictures test torture check fuzz tidy bench format clean
 
 deps:
 	@scripts/install-deps.sh $(BUILD_PACKAGES) $(RUN_PACKAGES) $(TEST_PACKAGES)
@@ -78,6 +81,11 @@ test: deps
 	scripts/fetch-axe.sh build/test/axe
 	scripts/fetch-otlp.sh build/test/otlp
 	$(CTEST) --preset test $(CTEST_FLAGS)
+
+torture: deps
+	cmake --preset test
+	cmake --build --preset test --parallel $(JOBS) --target halyardd halyardctl halyard faulty_disk
+	tests/torture/torture.py build/test --minutes $(MINUTES) $(if $(SEED),--seed $(SEED))
 
 check: deps
 	@scripts/install-deps.sh $(CHECK_PACKAGES)

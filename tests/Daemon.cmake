@@ -10,3 +10,9 @@ foreach(name requests bad_input hostile neovim endurance drivers sinks configura
   set_tests_properties(daemon.${name} PROPERTIES LABELS daemon TIMEOUT 600
     ENVIRONMENT "HALYARDD=$<TARGET_FILE:halyardd>;FAULTY_DISK_LIBRARY=$<TARGET_FILE:faulty_disk>;HALYARDCTL=$<TARGET_FILE:halyardctl>;HALYARD_EXPORT=$<TARGET_FILE:halyard-export>;OTLP_MODULES=${CMAKE_BINARY_DIR}/otlp/node_modules;HALYARD_PIPEWIRE=$<TARGET_FILE:halyard-pipewire>;GLITCH_PLAYER=$<TARGET_FILE:glitch_player>;EXAMPLE=$<TARGET_FILE:halyard_client_example>;PYTHONDONTWRITEBYTECODE=1")
 endforeach()
+
+# The books that `make torture` keeps, themselves.
+add_test(NAME daemon.torture_checks
+  COMMAND ${HALYARD_PYTHON} ${CMAKE_CURRENT_SOURCE_DIR}/torture/test_checks.py)
+set_tests_properties(daemon.torture_checks PROPERTIES LABELS daemon TIMEOUT 120
+  ENVIRONMENT "PYTHONDONTWRITEBYTECODE=1")
