@@ -39,6 +39,11 @@ StoreResult StoreAge::update(StoreDatabase& database) {
     return database.resultOf(code);
 }
 
+bool StoreAge::hasNews() {
+    look();
+    return unwritten_;
+}
+
 void StoreAge::look() {
     const double wall = platform::secondsSince1970(clock_.wallTime());
     const double uptime = seconds(clock_.systemUptime());

@@ -30,6 +30,8 @@ public:
     // Looks at the clock, and sees to it that the database knows of its jumps. Requires
     // an open transaction.
     StoreResult update(StoreDatabase& database);
+    // There is something that the database does not know of yet.
+    bool hasNews();
     // The transaction was committed.
     void noteCommitted() { unwritten_ = false; }
     // Rows of before that are older. Seconds since 1970, by the clock that they carry.

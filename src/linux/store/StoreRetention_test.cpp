@@ -80,6 +80,31 @@ TEST_F(StoreRetentionTest, AClockThatIsSetForwardTakesNoRowsAlong) {
     EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 0);
 }
 
+TEST_F(StoreRetentionTest, AJumpIsKnownToTheNextRunHoweverSoonThatComes) {
+    for (const bool rowsCome : {true, false}) {
+        open();
+        addSingles(10, {});
+        flush();
+        clock_.setWallTime(clock_.wallTime() + std::chrono::days(10));
+        if (rowsCome) {
+            commitOne();
+        }
+        open();
+        clock_.advance(options_.agePeriod);
+        commitOne();
+    }
+    EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 20);
+}
+
+TEST_F(StoreRetentionTest, AJumpIsKnownAfterAKillIfAnythingWasCommittedSince) {
+    open();
+    addSingles(10, {});
+    flush();
+    clock_.setWallTime(clock_.wallTime() + std::chrono::days(10));
+    commitOne();
+    EXPECT_EQ(reader().number("SELECT count(*) FROM clock_jump"), 1);
+}
+
 TEST_F(StoreRetentionTest, LimitsCanBeLoweredAtRunTime) {
     options_.limits.maxBytes = 64 * 1024 * 1024;
     open();

@@ -91,8 +91,11 @@ void StoreWriter::closeDatabase() {
         HY_LOG_ERROR(HYReportingPlatformCategory, "closing {}, {} rows lost: {}",
                      options_.path.string(), sum(queue_->levels().lost), nameOf(*surrendered_));
     }
-    retention_.reset();
     const bool moved = database_.hasMoved();
+    if (!surrendered_ && !moved && database_.isOpen() && age_.hasNews()) {
+        (void)attempt({}); // The next run could not tell a jump from having been off.
+    }
+    retention_.reset();
     if (moved || !keeper_.keepLog().ok()) {
         database_.abandon(); // What lies at its path is not ours.
     } else {
@@ -332,8 +335,8 @@ StoreResult StoreWriter::writeRows(std::span<StoreItem> group) {
         const bool tooMuch = shares_.committed(bounds.maxBytes);
         trimMore_ = more || tooMuch;
         noteRemoved();
+        age_.noteCommitted();
         if (ageDue) {
-            age_.noteCommitted();
             agedAt_ = more ? platform::SteadyTime() : clock_.steadyTime();
         }
     }
@@ -360,13 +363,10 @@ StoreResult StoreWriter::insertAll(std::span<StoreItem> group) {
 }
 
 StoreResult StoreWriter::trim(const StoreLimits& bounds, bool ageDue, bool& more) {
-    std::optional<double> oldest;
-    if (ageDue) {
-        if (StoreResult known = age_.update(database_); !known.ok()) {
-            return known;
-        }
-        oldest = age_.oldest(bounds.maxAge);
+    if (StoreResult known = age_.update(database_); !known.ok()) {
+        return known;
     }
+    const auto oldest = ageDue ? std::optional(age_.oldest(bounds.maxAge)) : std::nullopt;
     return retention_.trim(database_, bounds.maxBytes, oldest, more);
 }
 
