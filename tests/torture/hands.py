@@ -27,6 +27,13 @@ STORM = ['[log]\nlevel = "%s"\n' % level for level in ("info", "debug", "error")
     "this is no TOML", "[store]\nmax_age = 7\n", ""]
 
 
+def start(target, *arguments):
+    """A process that does not outlive this one."""
+    process = FORK.Process(target=target, args=arguments, daemon=True)
+    process.start()
+    return process
+
+
 def storm(daemon, seed, seconds):
     """Rewrites the drop-ins and has them read, and configures sessions, all the time."""
     choose = random.Random(seed)
@@ -89,9 +96,10 @@ def purge(path, answers):
 class Hands:
     """Borrows the daemon and the disk, for one life."""
 
-    def __init__(self, daemon, faults, programs, place, counts):
+    def __init__(self, daemon, faults, programs, place, file):
         self.daemon, self.faults, self.programs, self.place = daemon, faults, programs, place
-        self.counts = counts
+        self.counts = place.counts
+        self.file = file                # where a name of this life's lies
         self.processes = []
         self.undo = []                 # (when, what), for what has to be taken back
         self.troubled = []             # [from, until]: when others may well have to wait
@@ -115,8 +123,7 @@ class Hands:
             action()
 
     def begin(self, target, *arguments):
-        process = FORK.Process(target=target, args=arguments)
-        process.start()
+        process = start(target, *arguments)
         self.processes.append(process)
 
     def later(self, seconds, action):
@@ -161,7 +168,7 @@ class Hands:
     def halyardctl(self, act):
         arguments = [self.programs.halyardctl, "--state", self.daemon.path("state"), "--socket",
                      self.daemon.socket_path, *act.name.split()]
-        output = open(self.place.file("halyardctl.txt"), "ab")  # pylint: disable=consider-using-with
+        output = open(self.file("halyardctl"), "ab")  # pylint: disable=consider-using-with
         self.ctl.append((act.name, subprocess.Popen(  # pylint: disable=consider-using-with
             arguments, stdout=subprocess.DEVNULL, stderr=output, stdin=subprocess.DEVNULL)))
         output.close()
@@ -170,8 +177,8 @@ class Hands:
         self.each_file(os.remove, [act.name])
 
     def move_store(self, act):
-        folder = self.place.file(f"moved-{len(self.moved)}")
-        os.makedirs(folder, exist_ok=True)
+        folder = self.file(f"moved-{len(self.moved)}")
+        os.makedirs(folder)
         self.moved.append(os.path.join(folder, "telemetry.db"))
         self.each_file(lambda path: shutil.move(path, folder), SUFFIXES)
 

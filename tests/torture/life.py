@@ -11,7 +11,7 @@ import time
 
 import checks
 import honest
-from hands import FORK, SUFFIXES, Hands
+from hands import FORK, SUFFIXES, Hands, start
 
 WHO = re.compile(r'"who":"([^"]+)","n":(\d+)')
 SHEET = re.compile(r"messages since the start: (\{.*\})")
@@ -72,7 +72,7 @@ class LifeRun:
 
     def __init__(self, plan, place):
         self.plan, self.place, self.daemon = plan, place, place.daemon
-        self.hands = Hands(place.daemon, place.disk, place.programs, place, place.counts)
+        self.hands = Hands(place.daemon, place.disk, place.programs, place, self.file)
         self.faults = []
         self.clients = []
         self.recent = []
@@ -96,6 +96,12 @@ class LifeRun:
     def fault(self, text):
         self.faults.append(text)
 
+    def file(self, name):
+        """What this life leaves to be looked at."""
+        folder = self.place.file(f"life-{self.plan.number}")
+        os.makedirs(folder, exist_ok=True)
+        return os.path.join(folder, name)
+
     def alive(self):
         return self.daemon.process.poll() is None
 
@@ -105,7 +111,7 @@ class LifeRun:
         self.before = Snapshot(self.daemon.store_path, self.place.file("copy"))
         self.fault_all(self.before.faults)
         self.daemon.configure(self.plan.configuration)
-        self.daemon.log_path = self.place.file(f"log-{self.plan.number}")
+        self.daemon.log_path = self.file("log")
         for act in self.plan.acts:
             if act.at < 0:
                 self.hands.do(act)
@@ -115,18 +121,13 @@ class LifeRun:
         self.warm_up()
         self.handles = self.at_rest()
         self.stop = FORK.Event()
-        self.watcher_path = self.place.file("status")
-        self.watcher = FORK.Process(target=honest.watch,
-                                    args=(self.daemon.socket_path, 0.4, self.watcher_path))
-        self.watcher.start()
+        self.watcher_path = self.file("status")
+        self.watcher = start(honest.watch, self.daemon.socket_path, 0.4, self.watcher_path)
         for number, kind in enumerate(honest.KINDS):
             who = f"{kind.__name__.lower()}{number}@{self.plan.number}"
-            ledger = self.place.file(f"ledger-{number}")
-            if os.path.exists(ledger):
-                os.remove(ledger)
-            process = FORK.Process(target=honest.run, args=(
-                kind, self.daemon.socket_path, who, number, self.place.seed, self.stop, ledger))
-            process.start()
+            ledger = self.file(f"ledger-{number}")
+            process = start(honest.run, kind, self.daemon.socket_path, who, number,
+                            self.place.seed, self.stop, ledger)
             self.clients.append((who, process, ledger))
 
     def fault_all(self, texts):
@@ -161,6 +162,8 @@ class LifeRun:
         if self.alive():
             self.fault_all(checks.size(self.memory("VmHWM")))
             self.place.peak = max(self.place.peak, self.memory("VmHWM"))
+        self.faulty_end = self.plan.end != "quiet" and any(
+            end > time.monotonic() for _, end in self.hands.faulty)
         getattr(self, "end_" + self.plan.end)()
         self.ended = time.monotonic()
         self.hands.calm()
@@ -299,7 +302,7 @@ class LifeRun:
         self.account_of_clients()
         self.fault_all(checks.files(names_below(self.daemon.path("state")),
                                     names_below(self.daemon.path("log")),
-                                    sessions_open=self.plan.end == "sigkill"))
+                                    sessions_open=self.plan.end == "sigkill" or self.faulty_end))
         self.account_waits()
 
     def read_statuses(self):

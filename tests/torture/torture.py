@@ -27,7 +27,7 @@ import launcher  # noqa: E402
 import library  # noqa: E402
 import plan  # noqa: E402
 from faulty_disk import FaultyDisk  # noqa: E402
-from hands import FORK  # noqa: E402
+from hands import FORK, start  # noqa: E402
 from harness import Daemon  # noqa: E402
 from life import LifeRun  # noqa: E402
 
@@ -101,9 +101,8 @@ class Library:
         self.run = run
         self.stop = FORK.Event()
         self.path = run.file("library")
-        self.process = FORK.Process(target=library.run, args=(
-            run.programs.libhalyard, run.daemon.socket_path, self.stop, self.path))
-        self.process.start()
+        self.process = start(library.run, run.programs.libhalyard, run.daemon.socket_path,
+                             self.stop, self.path)
         self.stored = set()
         self.excused = []  # (from, until): what was sent then may be missing
 
@@ -154,8 +153,7 @@ def report_fault(run, life, minute):
         print("  " + fault[:1500])
     print("  the last acts: " + "; ".join(life.recent[-12:]))
     print(f"  kept in {run.root}; this life alone: --seed {run.seed} --life {life.plan.number}")
-    kept = run.file(f"fault-{life.plan.number}")
-    shutil.copytree(run.daemon.root, os.path.join(kept, "daemon"), dirs_exist_ok=True,
+    shutil.copytree(run.daemon.root, life.file("daemon"),
                     ignore=shutil.ignore_patterns("*.sock"))
 
 
@@ -194,10 +192,8 @@ def torture(run, arguments):
         if (life.faults and not arguments.keep_going) or arguments.life is not None \
                 or minutes() >= arguments.minutes:
             break
-        try:
-            os.remove(run.daemon.log_path)
-        except FileNotFoundError:
-            pass
+        if not life.faults:
+            shutil.rmtree(life.file(""))
     ended = run.library.end()
     for fault in ended or (run.library.faults() if well else []):
         print("FAULT " + fault)
