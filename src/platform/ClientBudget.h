@@ -20,6 +20,7 @@
 #include <utility>
 
 #include "common/Error.h"
+#include "platform/SizeExpectation.h"
 
 namespace halyard::platform {
 
@@ -93,6 +94,9 @@ public:
     [[nodiscard]] bool isBusy();
     // Any thread calls it. Requires that no other thread uses this object yet.
     void setReliefHandler(std::function<void()> handler) { relief_ = std::move(handler); }
+    // Of its rows whose contents are made later. Each client's own: large ones of
+    // another would look like a backlog of this one.
+    SizeExpectation& laterBytes() { return laterBytes_; }
 
     // Of the client whose request the calling thread is at; null outside of any.
     static const std::shared_ptr<ClientBudget>& current();
@@ -117,6 +121,7 @@ private:
     std::array<Level, kWorks> work_;
     std::atomic<bool> awaited_{false}; // Somebody was told to wait.
     std::function<void()> relief_;
+    SizeExpectation laterBytes_;
 };
 using ClientBudgetPtr = std::shared_ptr<ClientBudget>;
 

@@ -255,7 +255,7 @@ bool Store::addAnalyticsEvent(const Value& name, std::function<Dictionary()> bui
         row.payload = row.builder();
         row.builder = nullptr;
     } else {
-        hidden = queue_->expectedPayloadBytes();
+        hidden = queue_->payloadsOf(platform::ClientBudget::current()).bytes();
     }
     return queue_->push(std::move(row), hidden);
 }

@@ -59,6 +59,25 @@ TEST_F(StoreEventServicesTest, BuildsPayloadsAtOnceWhileRowsPileUp) {
     flush();
 }
 
+TEST_F(StoreEventServicesTest, AnEventWeighsLikeItsOwnClientsLargestUntilItIsBuilt) {
+    StoreAnalyticsService service(open());
+    const auto limits = std::make_shared<const platform::SharedLimits>();
+    const auto large = std::make_shared<platform::ClientBudget>(limits);
+    const auto small = std::make_shared<platform::ClientBudget>(limits);
+    const auto send = [&service](const platform::ClientBudgetPtr& client, std::size_t bytes) {
+        const platform::BudgetScope scope(client);
+        service.sendEventLazily("name", [bytes] {
+            return Dictionary{{"text", std::string(bytes, 'x')}};
+        });
+    };
+    send(large, 1'000'000);
+    flush();
+    send(small, 1);
+    EXPECT_LT(store_->status().queuedBytes, 10'000U);
+    send(large, 1);
+    EXPECT_GT(store_->status().queuedBytes, 1'000'000U);
+}
+
 TEST_F(StoreEventServicesTest, NobodyWantsEventsWithoutAStore) {
     options_.path = directory_.path() / "absent" / "telemetry.db";
     StoreAnalyticsService service(open());

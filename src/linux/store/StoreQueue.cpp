@@ -9,8 +9,6 @@ namespace {
 
 // Rows' worth of room that the queue keeps for its next burst.
 constexpr std::size_t kKeptCapacity = 8192;
-// How fast the expected size of payloads forgets a large one.
-constexpr std::size_t kForgetShare = 64;
 
 bool isClose(const StoreRow& row) {
     return std::holds_alternative<StoreCloseRow>(row);
@@ -149,12 +147,6 @@ void StoreQueue::setFailing(std::optional<StoreLoss> reason) {
 
 bool StoreQueue::crowdedLocked() const {
     return heldRows_ >= marks_.highRows || heldBytes_ >= marks_.highBytes;
-}
-
-void StoreQueue::notePayloadBytes(std::size_t bytes) {
-    const std::size_t expected = expectedPayloadBytes();
-    expectedPayload_.store(std::max(bytes, expected - expected / kForgetShare),
-                           std::memory_order_relaxed);
 }
 
 StoreQueue::Levels StoreQueue::levels() const {

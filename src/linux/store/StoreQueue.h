@@ -79,12 +79,11 @@ public:
     void setFailing(std::optional<StoreLoss> reason) HY_EXCLUDES(mutex_);
     // Whether rows had better come with their final size. Costs next to nothing.
     bool wantsFinishedRows() const { return tight_.load(std::memory_order_relaxed); }
-    // What a payload that is not built yet is taken to weigh: like the largest of
-    // late. Any thread asks, the writer's tells what one has come to.
-    std::size_t expectedPayloadBytes() const {
-        return expectedPayload_.load(std::memory_order_relaxed);
+    // What payloads of this client that are not built yet are taken to weigh. Any thread
+    // asks, the writer's tells what one has come to.
+    platform::SizeExpectation& payloadsOf(const platform::ClientBudgetPtr& client) {
+        return client != nullptr ? client->laterBytes() : ownPayloads_;
     }
-    void notePayloadBytes(std::size_t bytes);
     Levels levels() const HY_EXCLUDES(mutex_);
     void countLost(StoreLoss reason, StoreTable table) HY_EXCLUDES(mutex_);
 
@@ -149,7 +148,7 @@ private:
     bool stopping_ HY_GUARDED_BY(mutex_) = false;
 
     std::atomic<bool> tight_{false};
-    std::atomic<std::size_t> expectedPayload_{1024};
+    platform::SizeExpectation ownPayloads_; // of the daemon itself
     Mutex pressureMutex_; // Held while the handler runs, so that it is told in order.
     bool toldPressure_ HY_GUARDED_BY(pressureMutex_) = false;
 };

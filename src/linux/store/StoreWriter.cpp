@@ -346,7 +346,7 @@ StoreResult StoreWriter::writeRows(std::span<StoreItem> group) {
 StoreResult StoreWriter::insertAll(std::span<StoreItem> group) {
     rejected_.clear();
     for (StoreItem& item : group) {
-        buildPayload(item.row);
+        buildPayload(item);
         StoreResult inserted =
             std::visit([this](const auto& row) { return database_.insert(row); }, item.row);
         if (inserted.ok()) {
@@ -371,12 +371,12 @@ StoreResult StoreWriter::trim(const StoreLimits& bounds, bool ageDue, bool& more
 }
 
 // What was built is kept in the row: its group may be written again.
-void StoreWriter::buildPayload(StoreRow& row) {
-    auto* const event = std::get_if<StoreAnalyticsRow>(&row);
+void StoreWriter::buildPayload(StoreItem& item) {
+    auto* const event = std::get_if<StoreAnalyticsRow>(&item.row);
     if (event != nullptr && event->builder) {
         event->payload = event->builder();
         event->builder = nullptr;
-        queue_->notePayloadBytes(storeBytes(event->payload));
+        queue_->payloadsOf(item.client).note(storeBytes(event->payload));
     }
 }
 

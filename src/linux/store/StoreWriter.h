@@ -97,7 +97,7 @@ private:
     StoreResult writeFacts();
     StoreResult insertAll(std::span<StoreItem> group);
     StoreResult trim(const StoreLimits& bounds, bool ageDue, bool& more);
-    void buildPayload(StoreRow& row);
+    void buildPayload(StoreItem& item);
     void noteRemoved() HY_EXCLUDES(mutex_);
     void noteSizes() HY_EXCLUDES(mutex_);
     void settle(std::span<StoreItem> group);
