@@ -180,6 +180,12 @@ int open64(const char* path, int flags, ...) {
     return openingFails(path, flags) ? -1 : real(path, flags, mode);
 }
 
+int access(const char* path, int mode) noexcept {
+    static auto* const real = next(&access, "access");
+    const int error = (mode & W_OK) != 0 ? errorOfChange(path) : 0;
+    return error == EROFS && refused(error) ? -1 : real(path, mode);
+}
+
 int unlink(const char* path) noexcept {
     static auto* const real = next(&unlink, "unlink");
     const int error = errorOfChange(path);

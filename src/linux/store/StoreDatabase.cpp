@@ -4,6 +4,7 @@
 #include <fmt/format.h>
 #include <fstream>
 #include <string_view>
+#include <sys/statvfs.h>
 #include <unistd.h>
 #include <utility>
 
@@ -281,14 +282,23 @@ StoreResult StoreDatabase::resultOf(int code) const {
     return code == SQLITE_OK ? StoreResult() : failureOf(code);
 }
 
-// SQLite says no more than that it cannot open something.
+// SQLite says no more than that it cannot open something. 0 when that is for good.
 int StoreDatabase::whyNotWritable() const {
-    for (const fs::path& path : {settings_.path.parent_path(), settings_.path}) {
+    const fs::path folder = settings_.path.parent_path();
+    for (const fs::path& path : {folder, settings_.path}) {
         if (::access(path.c_str(), W_OK) != 0 && errno != ENOENT) {
             return errno;
         }
     }
-    return 0;
+    struct statvfs disk {};
+    if (::statvfs(folder.c_str(), &disk) == 0 &&
+        (disk.f_bavail == 0 || (disk.f_files != 0 && disk.f_favail == 0))) {
+        return ENOSPC;
+    }
+    std::error_code ignored;
+    const fs::file_type there = fs::status(settings_.path, ignored).type();
+    const bool couldBe = there == fs::file_type::regular || there == fs::file_type::not_found;
+    return couldBe && fs::is_directory(folder, ignored) ? EIO : 0;
 }
 
 StoreFailure StoreDatabase::failureOf(int code) const {

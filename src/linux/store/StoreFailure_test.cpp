@@ -75,6 +75,31 @@ TEST_F(StoreFailureTest, FullDiskAtTheStartIsOvercomeToo) {
     EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 2);
 }
 
+TEST_F(StoreFailureTest, ADiskWithoutRoomForAFileAtTheStartIsOvercomeToo) {
+    if (!mountSmallDisk("size=1m,nr_inodes=2")) { // for itself and the store, not for its log
+        GTEST_SKIP() << "needs the right to mount";
+    }
+    open();
+    EXPECT_TRUE(store_->isOpen());
+    EXPECT_NE(log_.waitFor("cannot write").find("full"), std::string::npos);
+    ASSERT_EQ(::mount("tmpfs", directory_.path().c_str(), "tmpfs", MS_REMOUNT, "nr_inodes=9"), 0);
+    addSingles(2, {});
+    flush();
+    EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 2);
+}
+
+TEST_F(StoreFailureTest, AFileThatCannotBeOpenedForNowIsTriedAgain) {
+    const auto inTheWay = options_.path.string() + "-wal";
+    std::filesystem::create_directory(inTheWay);
+    open();
+    EXPECT_TRUE(store_->isOpen());
+    log_.waitFor("cannot write");
+    std::filesystem::remove(inTheWay);
+    addSingles(2, {});
+    flush();
+    EXPECT_EQ(reader().number("SELECT count(*) FROM upload_message"), 2);
+}
+
 TEST_F(StoreFailureTest, AReadOnlyDiskAtTheStartIsOvercomeToo) {
     if (!mountSmallDisk("size=1m")) {
         GTEST_SKIP() << "needs the right to mount";

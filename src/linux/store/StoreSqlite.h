@@ -39,8 +39,9 @@ struct StoreFailure : Failure {
     }
     // Worth another try.
     bool mayPass() const {
-        return !isDamage() && (isWantOfSpace() || isLock() || isReadOnly() ||
-                               primary() == SQLITE_IOERR || primary() == SQLITE_NOMEM);
+        return !isDamage() &&
+               (isWantOfSpace() || isLock() || isReadOnly() || primary() == SQLITE_IOERR ||
+                primary() == SQLITE_NOMEM || static_cast<int>(code) == EIO);
     }
 };
 using StoreResult = Result<void, StoreFailure>;
