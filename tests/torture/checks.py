@@ -94,15 +94,12 @@ def kept(presents, counted, may_lack_first, excused=lambda who, n: False):
     return faults
 
 
-def files(state, log, sessions_open=False):
-    """Nothing is left over; `state` and `log` are names below the daemon's folders."""
+def files(state, log):
+    """An orderly end leaves nothing over; both are names below the daemon's folders."""
     faults = []
-    allowed = {"telemetry.db"}
-    if sessions_open:
-        allowed |= {"telemetry.db-wal", "telemetry.db-shm"}
     for name in state:
         plain = name.split("/")[-1]
-        if name not in allowed and not name.startswith("incidents/") or plain.startswith("."):
+        if name != "telemetry.db" and not name.startswith("incidents/") or plain.startswith("."):
             faults.append(f"left in the state directory: {name}")
     faults += [f"left in the logs directory: {name}" for name in log
                if name.split("/")[-1].startswith(".") or name.endswith((".new", ".tmp"))]

@@ -100,10 +100,6 @@ class Remains(unittest.TestCase):
         for log in ("Reporting/.s.1-2", "s.tmp"):
             self.assertTrue(checks.files([], [log]), log)
 
-    def test_a_kill_leaves_the_log_of_the_store(self):
-        self.assertEqual(checks.files(["telemetry.db", "telemetry.db-wal", "telemetry.db-shm"], [],
-                                      sessions_open=True), [])
-
     def test_memory_threads_and_descriptors_come_back(self):
         self.assertEqual(checks.size(599, 199), [])
         self.assertTrue(checks.size(600))

@@ -213,6 +213,7 @@ def main():
     if arguments.seed is None:
         arguments.seed = random.SystemRandom().randrange(1_000_000)
     print(f"seed {arguments.seed}, {arguments.minutes:g} minutes", flush=True)
+    signal.signal(signal.SIGTERM, lambda *_: sys.exit(1))  # And all that it started.
     run = Run(arguments)
     well = torture(run, arguments)
     if well:
