@@ -238,21 +238,34 @@ void SocketConnection::readAvailable() {
     }
     peerFinished_ = got == 0;
     if (got > 0) {
-        const std::string_view chunk(shared_.buffer.data(), static_cast<std::size_t>(got));
-        shared_.counters.bytesRead += chunk.size();
-        if (pending_.empty()) {
-            const std::size_t taken = takeFrames(chunk);
-            pending_.assign(chunk.substr(taken));
-        } else {
-            pending_ += chunk;
-            pending_.erase(0, takeFrames(pending_));
-        }
-        if (pending_.empty()) {
-            dropSpareCapacity(pending_);
-        }
-        chargePending();
+        takeChunk(std::string_view(shared_.buffer.data(), static_cast<std::size_t>(got)));
     }
     readIfAllowed();
+}
+
+// Answers that are made meanwhile are written once, at the end.
+void SocketConnection::takeChunk(std::string_view chunk) {
+    shared_.counters.bytesRead += chunk.size();
+    shared_.reading = this;
+    if (pending_.empty()) {
+        const std::size_t taken = takeFrames(chunk);
+        pending_.assign(chunk.substr(taken));
+    } else {
+        pending_ += chunk;
+        pending_.erase(0, takeFrames(pending_));
+    }
+    shared_.reading = nullptr;
+    if (pending_.empty()) {
+        dropSpareCapacity(pending_);
+    }
+    chargePending();
+    if (std::exchange(answersWait_, false)) {
+        writeSome();
+    }
+}
+
+bool SocketConnection::isReadHere() const {
+    return shared_.context.get_executor().running_in_this_thread() && shared_.reading == this;
 }
 
 void SocketConnection::chargePending() {
@@ -347,6 +360,14 @@ void SocketConnection::send(std::string_view bytes) {
                    [self = shared_from_this(), complete] { self->closeUnlessLeft(complete); });
     } else if (!writeScheduled_) {
         writeScheduled_ = true;
+        scheduleWriting();
+    }
+}
+
+void SocketConnection::scheduleWriting() {
+    if (isReadHere()) {
+        answersWait_ = true;
+    } else {
         asio::post(socket_.get_executor(), [self = shared_from_this()] { self->writeSome(); });
     }
 }

@@ -51,12 +51,14 @@ class WakeUpScope;
 
 // What the connections of one listener share; on the io_context's thread.
 struct ListenerShared {
-    ListenerShared(Pressure& p, asio::io_context& context)
-        : pressure(p), buffer(kReadSize, '\0'), turns(context) {}
+    ListenerShared(Pressure& p, asio::io_context& c)
+        : pressure(p), context(c), buffer(kReadSize, '\0'), turns(c) {}
 
     static constexpr std::size_t kReadSize = 64 * 1024;
 
     Pressure& pressure;
+    asio::io_context& context;
+    const SocketConnection* reading = nullptr; // the one whose requests are being taken
     std::string buffer;
     protocol::CallDecoder decoder;
     std::unordered_set<std::shared_ptr<SocketConnection>> connections;
@@ -114,6 +116,10 @@ private:
     // Whether it may not; then somebody calls readIfAllowed() once it may again.
     bool pausesReading();
     void waitReadable();
+    // Takes what is in the shared buffer's first bytes.
+    void takeChunk(std::string_view chunk);
+    // Whether the calling thread is taking this connection's requests.
+    bool isReadHere() const;
     // Breaks off when the budget has no room for a frame that has not come in whole.
     void chargePending();
     // Takes the frames at the front of `stream`; returns how many bytes they had.
@@ -121,6 +127,7 @@ private:
     bool takeFrame(std::string_view frame, std::size_t memory,
                    const std::shared_ptr<ReadCharge>& charge, WakeUpScope& wakeUps);
     void refuseCall(const protocol::Call& call, MaybeError error);
+    void scheduleWriting();
     Written writeOnce() HY_EXCLUDES(outMutex_);
     void writeSome();
     void stopAnswering() HY_EXCLUDES(outMutex_);
@@ -142,7 +149,8 @@ private:
     protocol::FrameScanner scanner_;
     std::string pending_; // The bytes of frames that wait to be taken.
     platform::Allotment pendingBytes_;
-    bool framesWait_ = false; // They do not wait for more bytes.
+    bool framesWait_ = false;  // They do not wait for more bytes.
+    bool answersWait_ = false; // for the end of the read that they are made in
     bool waiting_ = false;
     bool ended_ = false;
     bool peerFinished_ = false;
