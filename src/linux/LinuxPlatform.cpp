@@ -111,6 +111,8 @@ void LinuxPlatform::makeServices(const Settings& settings) {
     store_ = std::make_unique<StoreServices>(storeOptions(directories_.state, settings, pressure_),
                                              system_.clock, system_.random);
     store_->offerTo(platform_);
+    storeFiles_.emplace(context_, directories_.state, kStoreFile,
+                        [this] { store_->store.lookAfterFiles(); });
     incidents_ = std::make_unique<IncidentFolder>(
         system_.clock,
         IncidentFolder::Options{

@@ -29,6 +29,7 @@
 #include "linux/system/IncidentFolder.h"
 #include "linux/system/LastResort.h"
 #include "linux/system/LogWriter.h"
+#include "linux/system/RemovalWatch.h"
 #include "linux/system/SystemServices.h"
 #include "linux/trace/TraceServices.h"
 #include "platform/Operations.h"
@@ -90,6 +91,7 @@ private:
     ConfigurationServices configuration_;
     ProcOwnProcess ownProcess_;
     std::unique_ptr<StoreServices> store_;
+    std::optional<RemovalWatch> storeFiles_;
     std::unique_ptr<IncidentFolder> incidents_;
     OwnerRights ownerRights_; // the service queue's
     std::unique_ptr<LinuxHWReport> hwReport_;

@@ -186,6 +186,14 @@ class OnAFaultyDisk(unittest.TestCase):
         self.daemon.kill()
         self.assertEqual(self.messages(), self.sent)
 
+    def test_a_log_that_is_removed_is_missed_though_nothing_is_written(self):
+        self.send()
+        self.client.result("admin.flush")
+        os.remove(self.daemon.store_path + "-wal")
+        self.daemon.wait_for(lambda: "what was in it is kept" in self.daemon.log())
+        self.daemon.kill()
+        self.assertEqual(self.messages(), self.sent)
+
 
 if __name__ == "__main__":
     unittest.main()

@@ -76,6 +76,9 @@ public:
     // Runs a task on the store's thread, between two groups; never without a store.
     void onThread(std::function<void()> task) { writer_->onThread(std::move(task)); }
 
+    // Somebody may have removed or replaced the files: has the store's thread look now.
+    void lookAfterFiles() { queue_->wake(); }
+
     void setLimits(StoreLimits limits) { writer_->setLimits(limits); }
     // Whether the owner agrees, from now on, that rows may leave the machine: noted in
     // the file, see StoreFacts.
