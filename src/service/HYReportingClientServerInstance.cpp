@@ -229,8 +229,9 @@ void HYReportingClientServerInstance::sendMessage(
     auto processName = HYReportingUtilityIsInternalBuild()
                            ? HYReportingUtilityProcessNameForPID(pid_)
                            : std::nullopt;
-    onServiceQueue([fanOut = MessageFanOut({std::move(message), category, type},
-                                           std::move(reporterIDs), std::move(processName)),
+    MessageFanOut fanOut({std::move(message), category, type}, std::move(reporterIDs),
+                         std::move(processName));
+    onServiceQueue([fanOut = std::move(fanOut),
                     reply = std::move(reply)](auto& self, Delegate& delegate) mutable {
         if (self.send(delegate, fanOut)) {
             answer(reply, fanOut.error());
