@@ -43,32 +43,42 @@ bool needsQuotes(std::string_view text) noexcept {
     return text.empty();
 }
 
+constexpr bool isLiteral(char c) noexcept {
+    return static_cast<unsigned char>(c) >= 0x20 && c != 0x7F && c != '"' && c != '\\';
+}
+
+void appendEscaped(std::string& out, char c) {
+    switch (c) {
+    case '"':
+        out += "\\\"";
+        break;
+    case '\\':
+        out += "\\\\";
+        break;
+    case '\n':
+        out += "\\n";
+        break;
+    case '\r':
+        out += "\\r";
+        break;
+    case '\t':
+        out += "\\t";
+        break;
+    default:
+        fmt::format_to(std::back_inserter(out), "\\{:03o}", static_cast<unsigned>(c));
+    }
+}
+
 void appendQuoted(std::string& out, std::string_view text) {
     out += '"';
-    for (const char c : text) {
-        switch (c) {
-        case '"':
-            out += "\\\"";
-            break;
-        case '\\':
-            out += "\\\\";
-            break;
-        case '\n':
-            out += "\\n";
-            break;
-        case '\r':
-            out += "\\r";
-            break;
-        case '\t':
-            out += "\\t";
-            break;
-        default:
-            if (static_cast<unsigned char>(c) < 0x20 || c == 0x7F) {
-                fmt::format_to(std::back_inserter(out), "\\{:03o}", static_cast<unsigned>(c));
-            } else {
-                out += c;
-            }
+    while (!text.empty()) {
+        const auto plain = static_cast<std::size_t>(
+            std::find_if_not(text.begin(), text.end(), isLiteral) - text.begin());
+        out += text.substr(0, plain);
+        if (plain < text.size()) {
+            appendEscaped(out, text[plain]);
         }
+        text.remove_prefix(std::min(plain + 1, text.size()));
     }
     out += '"';
 }

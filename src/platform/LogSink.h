@@ -6,6 +6,7 @@
 
 namespace halyard::platform {
 
+// All but the text are literals: whoever takes a line may keep them.
 struct LogLine {
     LogLevel level;
     LogCategory category;

@@ -1,7 +1,7 @@
 #include "platform/Platform.h"
 
-#include <algorithm>
 #include <cassert>
+#include <fmt/format.h>
 
 #include "common/Description.h"
 #include "platform/Device.h"
@@ -11,7 +11,7 @@ fmt::format_context::iterator
 fmt::formatter<halyard::Value>::format(const halyard::Value& value,
                                        fmt::format_context& context) const {
     const std::string text = halyard::describe(value);
-    return std::copy(text.begin(), text.end(), context.out());
+    return fmt::format_to(context.out(), "{}", text); // All of it at a time.
 }
 
 namespace halyard::platform {
@@ -48,9 +48,16 @@ bool logEnabled(LogLevel level) {
 
 void logFormatted(LogLevel level, LogCategory category, const LogPlace& where,
                   fmt::string_view format, fmt::format_args arguments) {
-    const std::string text = shortened(fmt::vformat(format, arguments), kLongestText);
+    fmt::memory_buffer text;
+    fmt::vformat_to(fmt::appender(text), format, arguments);
+    std::string_view shown(text.data(), text.size());
+    std::string shorter;
+    if (shown.size() > kLongestText) {
+        shorter = shortened(std::string(shown), kLongestText);
+        shown = shorter;
+    }
     installed->log->write(
-        {level, category, baseName(where.file), where.line, where.function, text});
+        {level, category, baseName(where.file), where.line, where.function, shown});
 }
 
 } // namespace halyard::platform

@@ -48,7 +48,7 @@ Value describeSessions(const std::vector<std::shared_ptr<HYReportingSession>>& s
                        std::size_t count) {
     std::vector<Value> descriptions;
     for (std::size_t i = 0; i < sessions.size() && i < kNamedInLog; ++i) {
-        descriptions.emplace_back(sessions[i]->description());
+        descriptions.emplace_back(sessions[i]->sharedDescription());
     }
     tellRest(descriptions, count);
     return List(std::move(descriptions));

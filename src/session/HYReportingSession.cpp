@@ -77,13 +77,26 @@ HYReportingSession::~HYReportingSession() {
     HY_LOG_INFO(HYReportingSessionCategory, "deallocing this session {}", reporterID_);
 }
 
-std::string HYReportingSession::description() const {
+Value HYReportingSession::sharedDescription() const {
+    const MutexLock lock(mutex_);
+    const AudioServiceType type = serviceType();
+    const bool isStarted = started();
+    const Value name = HYReportingUtilityRetrieveAppName(configuration_);
+    // Only of strings is it certain that equal ones look the same.
+    if (described_.text.isNone() || described_.type != type || described_.started != isStarted ||
+        !name.isString() || !(described_.name == name)) {
+        described_ = {type, isStarted, name, describedBy(type, isStarted, name)};
+    }
+    return described_.text;
+}
+
+std::string HYReportingSession::describedBy(AudioServiceType type, bool isStarted,
+                                            const Value& name) const {
     return fmt::format(
         "reporterID={},serviceName={},ownerPid={},HostApplicationDisplayID={},started={}",
-        reporterID_, HYReportingUtilityGenerateServiceNameFromServiceType(serviceType()),
+        reporterID_, HYReportingUtilityGenerateServiceNameFromServiceType(type),
         processIdentifiers_.empty() ? 0 : processIdentifiers_.front(),
-        shortened(describe(HYReportingUtilityRetrieveAppName(configuration())), kLongestName),
-        started() ? 1 : 0);
+        shortened(describe(name), kLongestName), isStarted ? 1 : 0);
 }
 
 std::string HYReportingSession::serviceName() const {

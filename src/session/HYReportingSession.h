@@ -53,7 +53,9 @@ public:
     [[nodiscard]] std::optional<platform::ClientBound> chargeTo(platform::ClientBudgetPtr owner);
 
     // For lines of the log: of a long application name only the beginning.
-    std::string description() const;
+    std::string description() const { return std::string(sharedDescription().text()); }
+    // The same, kept until something of it changes, since a broadcast shows every session.
+    Value sharedDescription() const HY_EXCLUDES(mutex_);
 
     // Starting a started session and stopping one that is not are no-ops. A stop
     // blocks until the trace, if there is one, is complete.
@@ -147,6 +149,15 @@ public:
 private:
     HYReportingSession(std::int64_t reporterID, std::vector<std::int32_t> processIdentifiers);
 
+    // What a description was made of.
+    struct Described {
+        AudioServiceType type{};
+        bool started = false;
+        Value name;
+        Value text; // none before the first
+    };
+
+    std::string describedBy(AudioServiceType type, bool isStarted, const Value& name) const;
     void take(Dictionary message, AudioEventCategory category, AudioEventType type);
     void sendVolumeEvents();
     void sendSummaryEvent();
@@ -169,6 +180,7 @@ private:
 
     mutable Mutex mutex_;
     Dictionary configuration_ HY_GUARDED_BY(mutex_);
+    mutable Described described_ HY_GUARDED_BY(mutex_);
     platform::Allotment configurationBytes_ HY_GUARDED_BY(mutex_);
     TransactionCompleteBlock transactionCompleteBlock_ HY_GUARDED_BY(mutex_);
     platform::DriverSnapshotRef driverSnapShot_ HY_GUARDED_BY(mutex_);

@@ -1,5 +1,6 @@
 #include "session/SessionFixture.h"
 
+#include <fmt/format.h>
 #include <thread>
 
 namespace halyard {
@@ -64,6 +65,27 @@ TEST_F(HYReportingSessionTest, DescribesItself) {
     session->start();
     EXPECT_EQ(session->description(), "reporterID=-9,serviceName=alarms,ownerPid=100,"
                                       "HostApplicationDisplayID=org.example.clock,started=1");
+}
+
+TEST_F(HYReportingSessionTest, DescribesWhatItHasBecomeSinceTheLastTime) {
+    const auto session = HYReportingSession::initWithID(7, {100});
+    const auto described = [&](const char* service, const char* name, int started) {
+        return fmt::format("reporterID=7,serviceName={},ownerPid=100,HostApplicationDisplayID={},"
+                           "started={}",
+                           service, name, started);
+    };
+    EXPECT_EQ(session->description(), described("unknown", "Unknown", 0));
+    session->setServiceType(kAudioServiceTypeAlarms);
+    EXPECT_EQ(session->description(), described("alarms", "Unknown", 0));
+    session->start();
+    EXPECT_EQ(session->description(), described("alarms", "Unknown", 1));
+    session->updateConfigurationWithContentsOfConfiguration({{"HostApplicationDisplayID", 1e19}});
+    EXPECT_EQ(session->description(), described("alarms", "1e+19", 1));
+    session->updateConfigurationWithContentsOfConfiguration(
+        {{"HostApplicationDisplayID", 10'000'000'000'000'000'000U}});
+    EXPECT_EQ(session->description(), described("alarms", "10000000000000000000", 1));
+    session->stop();
+    EXPECT_EQ(session->description(), described("alarms", "10000000000000000000", 0));
 }
 
 TEST_F(HYReportingSessionTest, DescribesALongApplicationNameByItsBeginning) {

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <chrono>
+#include <climits>
 #include <condition_variable>
 #include <csignal>
 #include <cstdlib>
@@ -15,6 +16,7 @@
 #include <sys/un.h>
 #include <unistd.h>
 #include <utility>
+#include <vector>
 
 // With SUPPRESS_LOCATION the fields below are the caller's, not this file's.
 #define SD_JOURNAL_SUPPRESS_LOCATION
@@ -27,6 +29,9 @@ namespace halyard::linux_ {
 namespace {
 
 constexpr std::chrono::seconds kFlushLimit{1};
+// What is kept for the next lines.
+constexpr std::size_t kKeptCapacity = 1024; // records
+constexpr std::size_t kKeptBytes = 64 * 1024;
 
 std::string_view levelName(LogLevel level) {
     switch (level) {
@@ -56,28 +61,38 @@ int journalPriority(LogLevel level) {
     return 3;
 }
 
+bool isPlain(char c) {
+    return static_cast<unsigned char>(c) >= 0x20 && c != 0x7F && c != '\\';
+}
+
+void appendEscaped(std::string& out, char c) {
+    switch (c) {
+    case '\n':
+        out += "\\n";
+        break;
+    case '\r':
+        out += "\\r";
+        break;
+    case '\t':
+        out += "\\t";
+        break;
+    case '\\':
+        out += "\\\\";
+        break;
+    default:
+        fmt::format_to(std::back_inserter(out), "\\x{:02x}", static_cast<unsigned>(c));
+    }
+}
+
 void appendEscaped(std::string& out, std::string_view text) {
-    for (const char c : text) {
-        switch (c) {
-        case '\n':
-            out += "\\n";
-            break;
-        case '\r':
-            out += "\\r";
-            break;
-        case '\t':
-            out += "\\t";
-            break;
-        case '\\':
-            out += "\\\\";
-            break;
-        default:
-            if (static_cast<unsigned char>(c) < 0x20 || c == 0x7F) {
-                fmt::format_to(std::back_inserter(out), "\\x{:02x}", static_cast<unsigned>(c));
-            } else {
-                out += c;
-            }
+    while (!text.empty()) {
+        const auto plain = static_cast<std::size_t>(
+            std::find_if_not(text.begin(), text.end(), isPlain) - text.begin());
+        out += text.substr(0, plain);
+        if (plain < text.size()) {
+            appendEscaped(out, text[plain]);
         }
+        text.remove_prefix(std::min(plain + 1, text.size()));
     }
 }
 
@@ -97,10 +112,10 @@ void sendToJournal(const LogRecord& record) {
         "MESSAGE=" + record.message,
         fmt::format("PRIORITY={}", journalPriority(record.level)),
         fmt::format("SUBSYSTEM={}", kLogSubsystem),
-        "CATEGORY=" + record.category,
-        "CODE_FILE=" + record.file,
+        fmt::format("CATEGORY={}", record.category),
+        fmt::format("CODE_FILE={}", record.file),
         fmt::format("CODE_LINE={}", record.line),
-        "CODE_FUNC=" + record.function,
+        fmt::format("CODE_FUNC={}", record.function),
         "SYSLOG_IDENTIFIER=halyardd",
     };
     iovec parts[std::size(fields)];
@@ -138,25 +153,38 @@ bool leadsToJournal(int fd) {
 }
 
 std::string logMessage(const platform::LogLine& line) {
-    return fmt::format("{:>25}:{:<5} {}", line.file, line.line, line.text);
+    constexpr std::size_t kFileWidth = 25;
+    constexpr std::size_t kLineWidth = 5;
+    const fmt::format_int number(line.line);
+    std::string out;
+    out.reserve(kFileWidth + 2 * kLineWidth + line.file.size() + line.text.size());
+    out.append(kFileWidth - std::min(kFileWidth, line.file.size()), ' ');
+    out.append(line.file).append(1, ':').append(number.data(), number.size());
+    out.append(kLineWidth - std::min(kLineWidth, number.size()), ' ');
+    return out.append(1, ' ').append(line.text);
+}
+
+void appendStandardErrorLine(std::string& out, const LogRecord& record) {
+    out.append(levelName(record.level)).append(1, ' ').append(record.category).append(1, ' ');
+    appendEscaped(out, record.message);
+    out += '\n';
 }
 
 std::string standardErrorLine(const LogRecord& record) {
-    std::string out = fmt::format("{} {} ", levelName(record.level), record.category);
-    appendEscaped(out, record.message);
-    out += '\n';
+    std::string out;
+    appendStandardErrorLine(out, record);
     return out;
 }
 
 struct LogWriter::State {
     // All that waits to be written, once there is some; nothing at the end.
-    std::deque<LogRecord> take() HY_EXCLUDES(mutex);
-    void written(std::deque<LogRecord> records) HY_EXCLUDES(mutex);
+    void take(std::vector<LogRecord>& taken) HY_EXCLUDES(mutex);
+    void written(std::vector<LogRecord>& records) HY_EXCLUDES(mutex);
     bool isIdleLocked() const HY_REQUIRES(mutex) { return queued.empty() && !writing; }
 
     Mutex mutex;
     std::condition_variable_any changed;
-    std::deque<LogRecord> queued HY_GUARDED_BY(mutex);
+    std::vector<LogRecord> queued HY_GUARDED_BY(mutex);
     std::deque<LogRecord> recent HY_GUARDED_BY(mutex);
     std::size_t queuedBytes HY_GUARDED_BY(mutex) = 0;
     std::uint64_t untoldDrops HY_GUARDED_BY(mutex) = 0;
@@ -164,30 +192,35 @@ struct LogWriter::State {
     bool stopping HY_GUARDED_BY(mutex) = false;
 };
 
-std::deque<LogRecord> LogWriter::State::take() {
+void LogWriter::State::take(std::vector<LogRecord>& taken) {
+    taken.clear();
     const MutexLock lock(mutex);
     while (!stopping && queued.empty()) {
         changed.wait(mutex);
     }
     if (queued.empty()) {
-        return {};
+        return;
     }
-    std::deque<LogRecord> taken = std::exchange(queued, {});
+    taken.swap(queued);
+    if (queued.capacity() > kKeptCapacity) {
+        std::vector<LogRecord>().swap(queued);
+    }
     queuedBytes = 0;
     writing = true;
     if (const auto drops = std::exchange(untoldDrops, 0); drops > 0) {
         taken.push_back(
-            {LogLevel::Error, std::string(HYReportingPlatformCategory),
+            {LogLevel::Error, HYReportingPlatformCategory,
              fmt::format("{:>25}:{:<5} {} messages dropped", "LogWriter.cpp", __LINE__, drops),
              "LogWriter.cpp", __LINE__, __func__});
     }
-    return taken;
 }
 
-void LogWriter::State::written(std::deque<LogRecord> records) {
+void LogWriter::State::written(std::vector<LogRecord>& records) {
+    const std::size_t newest = std::min(records.size(), kRecentLines);
     const MutexLock lock(mutex);
     writing = false;
-    std::move(records.begin(), records.end(), std::back_inserter(recent));
+    std::move(std::prev(records.end(), static_cast<std::ptrdiff_t>(newest)), records.end(),
+              std::back_inserter(recent));
     while (recent.size() > kRecentLines) {
         recent.pop_front();
     }
@@ -196,9 +229,30 @@ void LogWriter::State::written(std::deque<LogRecord> records) {
 
 LogWriter::Output LogWriter::defaultOutput() {
     if (leadsToJournal(STDERR_FILENO)) {
-        return sendToJournal;
+        return [](std::span<const LogRecord> records) {
+            std::for_each(records.begin(), records.end(), sendToJournal);
+        };
     }
-    return [](const LogRecord& record) { writeAll(STDERR_FILENO, standardErrorLine(record)); };
+    return linesOn(STDERR_FILENO);
+}
+
+// As many lines at a time as a pipe takes in one piece: others may write to it, too.
+LogWriter::Output LogWriter::linesOn(int fd) {
+    return [fd, text = std::string()](std::span<const LogRecord> records) mutable {
+        for (const LogRecord& record : records) {
+            const std::size_t before = text.size();
+            appendStandardErrorLine(text, record);
+            if (text.size() > PIPE_BUF && before > 0) {
+                writeAll(fd, std::string_view(text).substr(0, before));
+                text.erase(0, before);
+            }
+        }
+        writeAll(fd, text);
+        text.clear();
+        if (text.capacity() > kKeptBytes) {
+            text.shrink_to_fit();
+        }
+    };
 }
 
 LogWriter::LogWriter(Output output)
@@ -227,9 +281,8 @@ LogWriter::~LogWriter() {
 }
 
 void LogWriter::write(const platform::LogLine& line) {
-    LogRecord record{line.level,       std::string(line.category),
-                     logMessage(line), std::string(line.file),
-                     line.line,        std::string(line.function)};
+    LogRecord record{line.level, line.category, logMessage(line),
+                     line.file,  line.line,     line.function};
     const MutexLock lock(state_->mutex);
     if (state_->queuedBytes + cost(record) > kMaxQueuedBytes) {
         ++state_->untoldDrops;
@@ -244,11 +297,10 @@ void LogWriter::write(const platform::LogLine& line) {
 }
 
 void LogWriter::run(const std::shared_ptr<State>& state, const Output& output) {
-    for (auto records = state->take(); !records.empty(); records = state->take()) {
-        for (const LogRecord& record : records) {
-            output(record);
-        }
-        state->written(std::move(records));
+    std::vector<LogRecord> records;
+    for (state->take(records); !records.empty(); state->take(records)) {
+        output(records);
+        state->written(records);
     }
 }
 

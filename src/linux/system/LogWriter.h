@@ -12,7 +12,9 @@
 #include <cstdint>
 #include <functional>
 #include <memory>
+#include <span>
 #include <string>
+#include <string_view>
 #include <thread>
 #include <vector>
 
@@ -20,14 +22,14 @@
 
 namespace halyard::linux_ {
 
-// A finished line on its way out.
+// A finished line on its way out. The views are of literals.
 struct LogRecord {
     LogLevel level;
-    std::string category;
+    std::string_view category;
     std::string message; // prefix and text
-    std::string file;
+    std::string_view file;
     int line;
-    std::string function;
+    std::string_view function;
 };
 
 // `%25s:%-5d `, then the text.
@@ -35,6 +37,7 @@ std::string logMessage(const platform::LogLine& line);
 // The standard-error form, control characters and backslashes escaped, so that
 // no text can pass for a line of its own. Ends in a line break.
 std::string standardErrorLine(const LogRecord& record);
+void appendStandardErrorLine(std::string& out, const LogRecord& record);
 // Whether `fd` leads to journald.
 bool leadsToJournal(int fd);
 
@@ -43,8 +46,8 @@ public:
     static constexpr std::size_t kMaxQueuedBytes = 4 * 1024 * 1024;
     static constexpr std::size_t kRecentLines = 256;
 
-    // Where records go; called on the log's own thread.
-    using Output = std::function<void(const LogRecord&)>;
+    // Where records go, the oldest first; called on the log's own thread.
+    using Output = std::function<void(std::span<const LogRecord>)>;
 
     explicit LogWriter(Output output);
     // Writes what is queued, for a second at most.
@@ -52,6 +55,8 @@ public:
 
     // Journald when standard error leads there, else standard error.
     static Output defaultOutput();
+    // Lines on a file, pipe or terminal, several at a time.
+    static Output linesOn(int fd);
 
     bool isEnabled(LogLevel level) const override { return level >= level_.load(); }
     void write(const platform::LogLine& line) override;

@@ -2,7 +2,9 @@
 
 #include <gtest/gtest.h>
 
+#include <climits>
 #include <future>
+#include <sys/socket.h>
 #include <unistd.h>
 
 namespace halyard::linux_ {
@@ -31,7 +33,11 @@ TEST(StandardErrorLine, EscapesWhatCouldForgeALine) {
 
 TEST(LogWriter, WritesInTheOrderOfTheLines) {
     std::vector<std::string> written;
-    LogWriter log([&](const LogRecord& each) { written.push_back(each.message); });
+    LogWriter log([&](std::span<const LogRecord> records) {
+        for (const LogRecord& each : records) {
+            written.push_back(each.message);
+        }
+    });
     log.write(line("first"));
     log.write(line("second"));
     log.flush();
@@ -42,7 +48,7 @@ TEST(LogWriter, WritesInTheOrderOfTheLines) {
 }
 
 TEST(LogWriter, LevelsBelowTheSetOneAreOff) {
-    LogWriter log([](const LogRecord&) {});
+    LogWriter log([](std::span<const LogRecord>) {});
     EXPECT_FALSE(log.isEnabled(LogLevel::Debug));
     EXPECT_TRUE(log.isEnabled(LogLevel::Info));
 
@@ -56,12 +62,14 @@ TEST(LogWriter, AStuckReaderCostsLinesAndTellsHowMany) {
     std::promise<void> stuck;
     auto opened = gate.get_future().share();
     std::vector<std::string> written;
-    LogWriter log([&](const LogRecord& each) {
+    LogWriter log([&](std::span<const LogRecord> records) {
         if (written.empty()) {
             stuck.set_value();
         }
         opened.wait();
-        written.push_back(each.message);
+        for (const LogRecord& each : records) {
+            written.push_back(each.message);
+        }
     });
     log.write(line("first"));
     stuck.get_future().wait();
@@ -77,7 +85,7 @@ TEST(LogWriter, AStuckReaderCostsLinesAndTellsHowMany) {
 }
 
 TEST(LogWriter, KeepsTheNewestLines) {
-    LogWriter log([](const LogRecord&) {});
+    LogWriter log([](std::span<const LogRecord>) {});
     for (std::size_t i = 0; i < LogWriter::kRecentLines + 1; ++i) {
         log.write(line(std::to_string(i)));
     }
@@ -86,6 +94,24 @@ TEST(LogWriter, KeepsTheNewestLines) {
     const auto recent = log.recentLines();
     ASSERT_EQ(recent.size(), LogWriter::kRecentLines);
     EXPECT_TRUE(recent.front().ends_with(" 1\n"));
+}
+
+// A pair of which each write is read by itself.
+TEST(LinesOn, WritesSeveralWholeLinesAtATimeAndNoMoreThanAPipeTakes) {
+    int ends[2];
+    ASSERT_EQ(::socketpair(AF_UNIX, SOCK_SEQPACKET, 0, ends), 0);
+    const std::vector<LogRecord> records(3, record(std::string(PIPE_BUF / 2 - 50, 'x')));
+    LogWriter::linesOn(ends[0])(records);
+    ::close(ends[0]);
+
+    std::vector<std::string> pieces;
+    std::string piece(std::size_t{4} * PIPE_BUF, 0);
+    for (ssize_t n = 0; (n = ::read(ends[1], piece.data(), piece.size())) > 0;) {
+        pieces.emplace_back(piece, 0, static_cast<std::size_t>(n));
+    }
+    ::close(ends[1]);
+    const std::string text = standardErrorLine(records.front());
+    EXPECT_EQ(pieces, (std::vector{text + text, text}));
 }
 
 TEST(LeadsToJournal, IsFalseForAPipe) {
