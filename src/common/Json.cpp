@@ -107,46 +107,61 @@ template <class Writer> void writeValue(Writer& writer, const Value& value) {
 
 // The compact form, which the store writes of every message, without RapidJSON:
 // that looks at each byte of a text twice more than needed.
+//
+// There is always room for kSlack bytes, so that numbers and what stands between values
+// are written without looking; whatever uses some of it makes room anew.
 class CompactText {
 public:
-    void clear() { size_ = 0; }
+    CompactText() = default;
+    CompactText(const CompactText&) = delete;
+    CompactText& operator=(const CompactText&) = delete;
+
+    void clear() { at_ = buffer_.data(); }
     void shrink() {
         if (buffer_.size() > kKeptBytes) {
             buffer_ = std::vector<char>(kFirstBytes);
         }
-        size_ = 0;
+        clear();
     }
     std::size_t capacity() const { return buffer_.size(); }
-    std::string_view text() const { return {buffer_.data(), size_}; }
+    std::string_view text() const {
+        return {buffer_.data(), static_cast<std::size_t>(at_ - buffer_.data())};
+    }
     void write(const Value& value);
     void write(std::span<const Dictionary::Entry> entries);
+    void write(std::span<const Dictionary::Entry> entries, const Dictionary::Entry& top);
 
 private:
     static constexpr std::size_t kFirstBytes = 1024;
     static constexpr std::size_t kKeptBytes = 64 * 1024;
+    // The longest number and some signs.
+    static constexpr std::size_t kSlack = 64;
 
-    // Makes room behind what is written. Never null.
-    char* room(std::size_t bytes) {
-        if (buffer_.size() - size_ < bytes) {
-            buffer_.resize(std::max(buffer_.size() * 2, size_ + bytes));
+    // Makes room for so many bytes beside the slack.
+    void need(std::size_t bytes) {
+        const auto size = static_cast<std::size_t>(at_ - buffer_.data());
+        if (buffer_.size() - size < bytes + kSlack) {
+            buffer_.resize(std::max(buffer_.size() * 2, size + bytes + kFirstBytes));
+            at_ = buffer_.data() + size;
         }
-        return buffer_.data() + size_;
     }
-    void put(char c) {
-        *room(1) = c;
-        ++size_;
-    }
+    void put(char c) { *at_++ = c; }
+    // Requires room.
     void append(std::string_view text) {
-        std::memcpy(room(text.size()), text.data(), text.size());
-        size_ += text.size();
+        std::memcpy(at_, text.data(), text.size());
+        at_ += text.size();
     }
+    void append(const fmt::format_int& digits) { append({digits.data(), digits.size()}); }
     void writeText(std::string_view text);
     void writeEscaped(std::string_view text);
+    void escape(char c);
     void write(std::span<const Value> items);
+    void writeEntry(const Value& key, const Value& value);
+    void close(char opened, char closing);
     template <class Real> void writeReal(Real value);
 
     std::vector<char> buffer_ = std::vector<char>(kFirstBytes);
-    std::size_t size_ = 0;
+    char* at_ = buffer_.data();
 };
 
 void CompactText::writeText(std::string_view text) {
@@ -154,11 +169,24 @@ void CompactText::writeText(std::string_view text) {
         writeEscaped(text);
         return;
     }
-    char* at = room(text.size() + 2);
-    *at = '"';
-    std::memcpy(at + 1, text.data(), text.size());
-    at[text.size() + 1] = '"';
-    size_ += text.size() + 2;
+    need(text.size());
+    put('"');
+    append(text);
+    put('"');
+}
+
+void CompactText::escape(char c) {
+    constexpr std::string_view kNamed = "\"\\\b\f\n\r\t";
+    constexpr std::string_view kNames = "\"\\bfnrt";
+    if (const std::size_t named = kNamed.find(c); named != std::string_view::npos) {
+        put('\\');
+        put(kNames[named]);
+    } else {
+        constexpr std::string_view kDigits = "0123456789ABCDEF";
+        append("\\u00");
+        put(kDigits[static_cast<unsigned char>(c) / 16]);
+        put(kDigits[static_cast<unsigned char>(c) % 16]);
+    }
 }
 
 void CompactText::writeEscaped(std::string_view text) {
@@ -166,86 +194,115 @@ void CompactText::writeEscaped(std::string_view text) {
         writeEscaped(replaceInvalidUtf8(text));
         return;
     }
+    const auto isLiteral = [](char c) {
+        return static_cast<unsigned char>(c) >= 0x20 && c != '"' && c != '\\';
+    };
+    need(text.size());
     put('"');
-    for (const char c : text) {
-        constexpr std::string_view kNamed = "\"\\\b\f\n\r\t";
-        constexpr std::string_view kNames = "\"\\bfnrt";
-        if (const std::size_t named = kNamed.find(c); named != std::string_view::npos) {
-            put('\\');
-            put(kNames[named]);
-        } else if (static_cast<unsigned char>(c) < 0x20) {
-            constexpr std::string_view kDigits = "0123456789ABCDEF";
-            append("\\u00");
-            put(kDigits[static_cast<unsigned char>(c) / 16]);
-            put(kDigits[static_cast<unsigned char>(c) % 16]);
-        } else {
-            put(c);
+    while (!text.empty()) {
+        const auto plain = static_cast<std::size_t>(
+            std::find_if_not(text.begin(), text.end(), isLiteral) - text.begin());
+        append(text.substr(0, plain));
+        if (plain < text.size()) {
+            escape(text[plain]);
         }
+        text.remove_prefix(std::min(plain + 1, text.size()));
+        need(text.size());
     }
     put('"');
 }
 
 template <class Real> void CompactText::writeReal(Real value) {
-    constexpr std::size_t kLongest = 40;
     if (std::isfinite(value)) {
-        char* const at = room(kLongest);
-        size_ += static_cast<std::size_t>(fmt::format_to(at, FMT_COMPILE("{}"), value) - at);
+        at_ = fmt::format_to(at_, FMT_COMPILE("{}"), value);
     } else {
         writeText(std::isnan(value) ? "NaN" : value > 0 ? "Infinity" : "-Infinity");
     }
 }
 
+// In the place of the comma behind the last, if there is any.
+void CompactText::close(char opened, char closing) {
+    at_ -= at_[-1] == opened ? 0 : 1;
+    put(closing);
+}
+
 void CompactText::write(std::span<const Value> items) {
+    need(0);
     put('[');
-    for (std::size_t i = 0; i < items.size(); ++i) {
-        if (i > 0) {
-            put(',');
-        }
-        write(items[i]);
+    for (const Value& item : items) {
+        write(item);
+        put(',');
     }
-    put(']');
+    close('[', ']');
+}
+
+void CompactText::writeEntry(const Value& key, const Value& value) {
+    writeText(key.text());
+    put(':');
+    write(value);
+    put(',');
 }
 
 void CompactText::write(std::span<const Dictionary::Entry> entries) {
+    need(0);
     put('{');
-    for (std::size_t i = 0; i < entries.size(); ++i) {
-        if (i > 0) {
-            put(',');
-        }
-        writeText(entries[i].key.text());
-        put(':');
-        write(entries[i].value);
+    for (const Dictionary::Entry& entry : entries) {
+        writeEntry(entry.key, entry.value);
     }
-    put('}');
+    close('{', '}');
+}
+
+void CompactText::write(std::span<const Dictionary::Entry> entries, const Dictionary::Entry& top) {
+    put('{');
+    bool isThere = top.value.isNone();
+    for (const Dictionary::Entry& entry : entries) {
+        if (!(entry.key == top.key)) {
+            writeEntry(entry.key, entry.value);
+        } else if (!top.value.isNone()) {
+            writeEntry(top.key, top.value);
+            isThere = true;
+        }
+    }
+    if (!isThere) {
+        writeEntry(top.key, top.value);
+    }
+    close('{', '}');
 }
 
 void CompactText::write(const Value& value) {
     switch (value.kind()) {
     case Value::Kind::None:
-        return append("null");
+        append("null");
+        break;
     case Value::Kind::Bool:
-        return append(value.integerValue() != 0 ? "true" : "false");
-    case Value::Kind::Int: {
-        const fmt::format_int digits(value.integerValue());
-        return append({digits.data(), digits.size()});
-    }
-    case Value::Kind::UInt: {
-        const fmt::format_int digits(value.unsignedValue());
-        return append({digits.data(), digits.size()});
-    }
+        append(value.integerValue() != 0 ? "true" : "false");
+        break;
+    case Value::Kind::Int:
+        append(fmt::format_int(value.integerValue()));
+        break;
+    case Value::Kind::UInt:
+        append(fmt::format_int(value.unsignedValue()));
+        break;
     case Value::Kind::Float:
-        return writeReal(value.floatValue());
+        writeReal(value.floatValue());
+        break;
     case Value::Kind::Double:
-        return writeReal(value.doubleValue());
+        writeReal(value.doubleValue());
+        break;
     case Value::Kind::String:
-        return writeText(value.text());
+        writeText(value.text());
+        break;
     case Value::Kind::Date:
-        return writeText(rfc3339(value.date()));
+        writeText(rfc3339(value.date()));
+        break;
     case Value::Kind::List:
-        return write(List::itemsOf(value));
+        write(List::itemsOf(value));
+        break;
     case Value::Kind::Dictionary:
-        return write(Dictionary::entriesOf(value));
+        write(Dictionary::entriesOf(value));
+        break;
     }
+    need(0);
 }
 
 std::string_view contents(const rapidjson::StringBuffer& buffer) {
@@ -283,6 +340,12 @@ std::string_view JsonWriter::write(const Value& value) {
 std::string_view JsonWriter::write(const Dictionary& value) {
     buffer_->text.clear();
     buffer_->text.write({value.begin(), value.end()});
+    return buffer_->text.text();
+}
+
+std::string_view JsonWriter::write(const Dictionary& value, const Dictionary::Entry& top) {
+    buffer_->text.clear();
+    buffer_->text.write({value.begin(), value.end()}, top);
     return buffer_->text.text();
 }
 

@@ -28,6 +28,8 @@ public:
     // Valid until the next call.
     std::string_view write(const Value& value);
     std::string_view write(const Dictionary& value);
+    // As it would be had `top` been set in it; a value of none leaves the key out.
+    std::string_view write(const Dictionary& value, const Dictionary::Entry& top);
 
     // Lets go of the room that an unusually long text took.
     void shrink();

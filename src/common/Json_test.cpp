@@ -108,5 +108,27 @@ TEST(JsonTest, AWriterLetsGoOfTheRoomOfALongText) {
     EXPECT_EQ(writer.write(Value("short")), "\"short\"");
 }
 
+TEST(JsonTest, AnEntryOnTopIsWrittenAsIfItHadBeenSet) {
+    const Dictionary message{{"a", 1}, {"b", List{}}};
+    JsonWriter writer;
+    for (const Dictionary::Entry& top :
+         {Dictionary::Entry{"a", "x"}, {"b", 2}, {"c", 3}, {"a", Value()}, {"c", Value()}}) {
+        Dictionary set = message;
+        set.set(top.key, top.value);
+        EXPECT_EQ(writer.write(message, top), toJson(set));
+    }
+    EXPECT_EQ(writer.write({}, {"a", Value()}), "{}");
+}
+
+TEST(JsonTest, LongTextsGrowWithoutLosingAnything) {
+    List list;
+    std::string expected = "[";
+    for (std::size_t length = 0; length < 3000; length += 7) {
+        list.append(std::string(length, 'x') + "\n");
+        expected += (length > 0 ? ",\"" : "\"") + std::string(length, 'x') + "\\n\"";
+    }
+    EXPECT_EQ(toJson(list), expected + "]");
+}
+
 } // namespace
 } // namespace halyard

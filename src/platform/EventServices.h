@@ -7,14 +7,35 @@
 #include <functional>
 #include <string>
 #include <string_view>
+#include <utility>
 
 #include "common/Value.h"
 
 namespace halyard::platform {
 
+// What an event carries: a message with one entry set on top of it, or a dictionary as it
+// is. The two are put together only for who wants them so: most payloads are written out.
+struct EventPayload {
+    EventPayload() = default;
+    EventPayload(Dictionary whole) : message(std::move(whole)) {}
+    EventPayload(Dictionary below, Value key, Value value)
+        : message(std::move(below)), top{std::move(key), std::move(value)} {}
+
+    Dictionary whole() const {
+        Dictionary result = message;
+        if (!top.key.isNone()) {
+            result.set(top.key, top.value);
+        }
+        return result;
+    }
+
+    Dictionary message;
+    Dictionary::Entry top; // No key: there is none. No value: its key is left out.
+};
+
 class AnalyticsService {
 public:
-    using PayloadBuilder = std::function<Dictionary()>;
+    using PayloadBuilder = std::function<EventPayload()>;
 
     virtual ~AnalyticsService() = default;
     // Whether anybody wants events of this name now.

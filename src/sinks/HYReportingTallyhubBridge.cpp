@@ -4,7 +4,7 @@
 #include <string_view>
 #include <utility>
 
-#include "platform/EventServices.h"
+#include "common/KeyTable.h"
 #include "platform/Platform.h"
 
 namespace halyard {
@@ -52,10 +52,10 @@ void HYReportingTallyhubBridge::handleEvent(const Dictionary* message, AudioEven
     }
 }
 
-Dictionary HYReportingTallyhubBridge::payload(Dictionary message, const Value& applicationName) {
-    static const Value key("HostApplicationDisplayID");
-    message.set(key, applicationName);
-    return message;
+platform::EventPayload HYReportingTallyhubBridge::payload(Dictionary message,
+                                                          Value applicationName) {
+    static const Value key = KeyTable().intern("HostApplicationDisplayID");
+    return {std::move(message), key, std::move(applicationName)};
 }
 
 } // namespace halyard

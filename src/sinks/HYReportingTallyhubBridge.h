@@ -11,6 +11,7 @@
 #include <memory>
 
 #include "common/HYReportingUtility.h"
+#include "platform/EventServices.h"
 #include "sinks/SessionFacts.h"
 
 namespace halyard {
@@ -27,7 +28,7 @@ public:
 
     // The message with the application's name put on top; without a name, what
     // the client itself claims under that key goes as well.
-    static Dictionary payload(Dictionary message, const Value& applicationName);
+    static platform::EventPayload payload(Dictionary message, Value applicationName);
 };
 
 } // namespace halyard

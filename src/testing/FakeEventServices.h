@@ -18,7 +18,7 @@ class FakeAnalyticsService final : public platform::AnalyticsService {
 public:
     struct Event {
         std::string name;
-        PayloadBuilder builder;
+        std::function<Dictionary()> builder;
     };
 
     bool isEventUsed(std::string_view name) const override {
@@ -29,7 +29,8 @@ public:
         return usesAll || used.count(std::string(name)) != 0;
     }
     void sendEventLazily(std::string_view name, PayloadBuilder builder) override {
-        events.push_back({std::string(name), std::move(builder)});
+        events.push_back(
+            {std::string(name), [builder = std::move(builder)] { return builder().whole(); }});
     }
 
     std::set<std::string> used;

@@ -248,12 +248,11 @@ void Store::hurryFor(std::uint16_t category) {
     }
 }
 
-bool Store::addAnalyticsEvent(const Value& name, std::function<Dictionary()> builder) {
-    StoreAnalyticsRow row{name, std::move(builder), {}, now()};
+bool Store::addAnalyticsEvent(const Value& name, StoreAnalyticsRow::Builder builder) {
+    StoreAnalyticsRow row{name, std::move(builder), now()};
     std::size_t hidden = 0;
     if (queue_->wantsFinishedRows()) {
-        row.payload = row.builder();
-        row.builder = nullptr;
+        row.build();
     } else {
         hidden = queue_->payloadsOf(platform::ClientBudget::current()).bytes();
     }

@@ -59,7 +59,7 @@ public:
                                         const Dictionary& payload);
     // `builder` is called once at most: on the store's thread, or at once while
     // rows pile up, so that their size is known.
-    bool addAnalyticsEvent(const Value& name, std::function<Dictionary()> builder);
+    bool addAnalyticsEvent(const Value& name, StoreAnalyticsRow::Builder builder);
     bool addEnergyEvent(std::uint32_t client, std::string_view name, const Dictionary& payload);
     bool addMetric(std::uint32_t metricID, std::string message);
     // `report` is a path or a text.

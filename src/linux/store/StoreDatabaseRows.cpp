@@ -110,8 +110,10 @@ StoreResult StoreDatabase::insert(const StoreSingleRow& row) {
 }
 
 StoreResult StoreDatabase::insert(const StoreAnalyticsRow& row) {
-    return insertInto(StoreTable::AnalyticsEvent, row.name.text(), payload_.write(row.payload),
-                      row.time);
+    const auto& [message, top] = row.built();
+    const std::string_view payload =
+        top.key.isNone() ? payload_.write(message) : payload_.write(message, top);
+    return insertInto(StoreTable::AnalyticsEvent, row.name.text(), payload, row.time);
 }
 
 StoreResult StoreDatabase::insert(const StoreEnergyRow& row) {

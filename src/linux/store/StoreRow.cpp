@@ -16,7 +16,9 @@ struct Bytes {
     std::size_t operator()(const StoreSingleRow& row) const {
         return storeBytes(row.sessionInfo) + storeBytes(row.userInfo) + storeBytes(row.payload);
     }
-    std::size_t operator()(const StoreAnalyticsRow& row) const { return storeBytes(row.payload); }
+    std::size_t operator()(const StoreAnalyticsRow& row) const {
+        return row.isBuilt() ? storeBytes(row.built()) : 0;
+    }
     std::size_t operator()(const StoreEnergyRow& row) const { return storeBytes(row.payload); }
     std::size_t operator()(const StoreMetricRow& row) const { return row.message.size(); }
     std::size_t operator()(const StoreIncidentRow& row) const {
@@ -29,6 +31,19 @@ struct Bytes {
 
 std::size_t storeBytes(const Dictionary& dictionary) {
     return bytesOf(dictionary);
+}
+
+std::size_t storeBytes(const platform::EventPayload& payload) {
+    const auto& [key, value] = payload.top;
+    return bytesOf(payload.message) + bytesOf(key) + bytesOf(value);
+}
+
+void StoreAnalyticsRow::build() {
+    if (auto* const builder = std::get_if<Builder>(&payload)) {
+        // It holds the session, which may end with it.
+        const Builder called = std::move(*builder);
+        payload = called();
+    }
 }
 
 StoreTable tableOf(const StoreRow& row) {

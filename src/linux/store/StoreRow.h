@@ -14,6 +14,7 @@
 #include "common/Value.h"
 #include "linux/store/Schema.h"
 #include "platform/ClientBudget.h"
+#include "platform/EventServices.h"
 #include "platform/RelayReporting.h"
 
 namespace halyard::linux_ {
@@ -61,9 +62,18 @@ struct StoreSingleRow {
     double time;
 };
 struct StoreAnalyticsRow {
+    using Builder = platform::AnalyticsService::PayloadBuilder;
+
+    // Calls the builder, unless that has been done.
+    void build();
+    bool isBuilt() const { return std::holds_alternative<platform::EventPayload>(payload); }
+    // Requires isBuilt().
+    const platform::EventPayload& built() const {
+        return std::get<platform::EventPayload>(payload);
+    }
+
     Value name;
-    std::function<Dictionary()> builder; // null once it has been called
-    Dictionary payload;
+    std::variant<Builder, platform::EventPayload> payload;
     double time;
 };
 struct StoreEnergyRow {
@@ -104,5 +114,6 @@ StoreTable tableOf(const StoreRow& row);
 // About how much memory a row keeps alive, contents shared with others included.
 std::size_t storeBytes(const StoreRow& row);
 std::size_t storeBytes(const Dictionary& dictionary);
+std::size_t storeBytes(const platform::EventPayload& payload);
 
 } // namespace halyard::linux_

@@ -373,10 +373,9 @@ StoreResult StoreWriter::trim(const StoreLimits& bounds, bool ageDue, bool& more
 // What was built is kept in the row: its group may be written again.
 void StoreWriter::buildPayload(StoreItem& item) {
     auto* const event = std::get_if<StoreAnalyticsRow>(&item.row);
-    if (event != nullptr && event->builder) {
-        event->payload = event->builder();
-        event->builder = nullptr;
-        queue_->payloadsOf(item.client).note(storeBytes(event->payload));
+    if (event != nullptr && !event->isBuilt()) {
+        event->build();
+        queue_->payloadsOf(item.client).note(storeBytes(event->built()));
     }
 }
 
