@@ -1,9 +1,14 @@
 #include <gtest/gtest.h>
+#include <string>
+#include <thread>
+#include <vector>
 
 #include "common/Value.h"
 
 namespace halyard {
 namespace {
+
+const std::string kLongText = "a text that does not fit inside the value";
 
 // Keys that sort differently from their order of insertion.
 std::string keyAt(int index) {
@@ -190,6 +195,58 @@ TEST(DictionaryTest, CopiesShareTheirContents) {
     copy.set("more", 1);
     // The entries were copied, what they refer to was not.
     EXPECT_EQ(copy["inner"].dictionary().begin(), inner.begin());
+}
+
+Dictionary withRoomForOneMore() {
+    Dictionary::Builder builder(2);
+    builder.add("a", 1);
+    return builder.finish();
+}
+
+TEST(DictionaryTest, WhatIsSharedTakesAnotherEntryThatOthersDoNotSee) {
+    const Dictionary original = withRoomForOneMore();
+    Dictionary copy = original;
+    copy.set("b", kLongText);
+    EXPECT_EQ(copy.begin(), original.begin()) << "copied, although there was room";
+    EXPECT_EQ(copy, (Dictionary{{"a", 1}, {"b", kLongText}}));
+    EXPECT_EQ(original, (Dictionary{{"a", 1}}));
+    EXPECT_FALSE(original.contains("b"));
+}
+
+TEST(DictionaryTest, TheRoomInWhatIsSharedIsForOneOfThose) {
+    Dictionary original = withRoomForOneMore();
+    Dictionary first = original;
+    Dictionary second = original;
+    first.set("b", 2);
+    second.set("c", 3);
+    original.set("d", 4);
+    EXPECT_EQ(first, (Dictionary{{"a", 1}, {"b", 2}}));
+    EXPECT_EQ(second, (Dictionary{{"a", 1}, {"c", 3}}));
+    EXPECT_EQ(original, (Dictionary{{"a", 1}, {"d", 4}}));
+}
+
+TEST(DictionaryTest, WhatSomebodyWhoHasGoneHasAddedIsForgotten) {
+    Dictionary dictionary = withRoomForOneMore();
+    Dictionary(dictionary).set("b", kLongText);
+    dictionary.set("c", 3);
+    EXPECT_EQ(dictionary, (Dictionary{{"a", 1}, {"c", 3}}));
+}
+
+TEST(DictionaryTest, ThreadsThatAddToWhatTheyShareSeeTheirOwnEntryOnly) {
+    for (int round = 0; round < 200; ++round) {
+        const Dictionary original = withRoomForOneMore();
+        std::vector<std::thread> threads;
+        for (int i = 0; i < 2; ++i) {
+            threads.emplace_back([copy = original, i]() mutable {
+                copy.set("own", i);
+                EXPECT_EQ(copy, (Dictionary{{"a", 1}, {"own", i}}));
+            });
+        }
+        for (std::thread& thread : threads) {
+            thread.join();
+        }
+        EXPECT_EQ(original, (Dictionary{{"a", 1}}));
+    }
 }
 
 TEST(DictionaryTest, SortedEntriesFollowTheBytesOfTheKeys) {

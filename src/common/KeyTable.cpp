@@ -1,7 +1,6 @@
 #include "common/KeyTable.h"
 
 #include "common/Mutex.h"
-#include "common/ValueBlocks.h"
 
 namespace halyard {
 namespace {
@@ -33,8 +32,8 @@ Value KeyTable::intern(std::string_view key) {
             return Value(key);
         }
         Value interned(key);
-        interned.wide_.string->references.store(detail::Counted::kImmortal,
-                                                std::memory_order_relaxed);
+        interned.wide_.block->references.store(detail::Counted::kImmortal,
+                                               std::memory_order_relaxed);
         at = shared.keys.emplace(interned.text(), interned).first;
     }
     known_.emplace(at->first, at->second);

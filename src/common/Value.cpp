@@ -9,8 +9,6 @@
 #include <new>
 #include <optional>
 
-#include "common/ValueBlocks.h"
-
 namespace halyard {
 
 using detail::DictionaryBlock;
@@ -81,9 +79,7 @@ Value::Value(std::string_view text) {
         }
         return;
     }
-    wide_.string = StringBlock::make(text);
-    wide_.kind = Kind::String;
-    wide_.inlineLength = kOnHeap;
+    setBlock(Kind::String, StringBlock::make(text));
 }
 
 Value::Value(Date date) noexcept {
@@ -101,48 +97,43 @@ Value::Value(Dictionary dictionary) noexcept : Value(std::move(dictionary.holder
     wide_.kind = Kind::Dictionary;
 }
 
-void Value::retainBlock() const noexcept {
-    switch (kind()) {
-    case Kind::String:
-        wide_.string->retain();
-        break;
-    case Kind::List:
-        wide_.list->retain();
-        break;
-    default:
-        wide_.dictionary->retain();
-        break;
+Value Value::detached() const {
+    if (!onHeap() || !wide_.block->isPart()) {
+        return *this;
     }
+    if (isString()) {
+        return Value(text());
+    }
+    if (isList()) {
+        List copy;
+        for (const Value& item : List::itemsOf(*this)) {
+            copy.append(item.detached());
+        }
+        return copy;
+    }
+    Dictionary copy;
+    for (const auto& [key, value] : Dictionary::entriesOf(*this)) {
+        copy.set(key.detached(), value.detached());
+    }
+    return copy;
 }
 
-void Value::releaseBlock() noexcept {
+void Value::freeBlock() noexcept {
+    if (wide_.block->isPart()) {
+        DictionaryBlock::free(static_cast<DictionaryBlock*>(wide_.block->whole()));
+        return;
+    }
     switch (kind()) {
     case Kind::String:
-        if (wide_.string->release()) {
-            StringBlock::free(wide_.string);
-        }
+        StringBlock::free(static_cast<StringBlock*>(wide_.block));
         break;
     case Kind::List:
-        if (wide_.list->release()) {
-            delete wide_.list;
-        }
+        ListBlock::free(static_cast<ListBlock*>(wide_.block));
         break;
     default:
-        if (wide_.dictionary->release()) {
-            delete wide_.dictionary;
-        }
+        DictionaryBlock::free(static_cast<DictionaryBlock*>(wide_.block));
         break;
     }
-}
-
-std::string_view Value::text() const noexcept {
-    if (!isString()) {
-        return {};
-    }
-    if (onHeap()) {
-        return wide_.string->view();
-    }
-    return {small_.text, small_.inlineLength};
 }
 
 namespace {
@@ -278,24 +269,6 @@ bool numbersEqual(const Value& left, const Value& right) noexcept {
 
 } // namespace
 
-// Null stands for an empty dictionary.
-static bool equalBlocks(const DictionaryBlock* left, const DictionaryBlock* right) noexcept {
-    const std::size_t size = left != nullptr ? left->entries.size() : 0;
-    if (size != (right != nullptr ? right->entries.size() : 0)) {
-        return false;
-    }
-    for (std::size_t i = 0; i < size; ++i) {
-        const Dictionary::Entry& entry = left->entries[i];
-        // Messages of one kind carry their keys in one order: try that first.
-        const Dictionary::Entry* counterpart =
-            right->entries[i].key == entry.key ? &right->entries[i] : right->find(entry.key.text());
-        if (counterpart == nullptr || !(entry.value == counterpart->value)) {
-            return false;
-        }
-    }
-    return true;
-}
-
 bool operator==(const Value& left, const Value& right) noexcept {
     if (left.isNumber()) {
         return right.isNumber() && numbersEqual(left, right);
@@ -305,7 +278,7 @@ bool operator==(const Value& left, const Value& right) noexcept {
     }
     switch (left.kind()) {
     case Value::Kind::String:
-        if (left.onHeap() && right.onHeap() && left.wide_.string == right.wide_.string) {
+        if (left.onHeap() && right.onHeap() && left.wide_.block == right.wide_.block) {
             return true;
         }
         return left.text() == right.text();
@@ -314,297 +287,11 @@ bool operator==(const Value& left, const Value& right) noexcept {
     case Value::Kind::List:
         return std::ranges::equal(List::itemsOf(left), List::itemsOf(right));
     case Value::Kind::Dictionary:
-        return equalBlocks(left.onHeap() ? left.wide_.dictionary : nullptr,
-                           right.onHeap() ? right.wide_.dictionary : nullptr);
+        return detail::areEqual(Dictionary::entriesOf(left), Dictionary::entriesOf(right),
+                                static_cast<DictionaryBlock*>(right.wide_.block));
     default:
         return true;
     }
-}
-
-// List
-
-List::List(std::initializer_list<Value> values) : List(std::vector<Value>(values)) {}
-
-List::List(std::vector<Value> values) {
-    if (values.empty()) {
-        return;
-    }
-    auto* block = new ListBlock;
-    block->items = std::move(values);
-    holder_.wide_.kind = Value::Kind::List;
-    holder_.wide_.inlineLength = Value::kOnHeap;
-    holder_.wide_.list = block;
-}
-
-std::size_t List::size() const noexcept {
-    return holder_.onHeap() ? holder_.wide_.list->items.size() : 0;
-}
-
-const Value& List::operator[](std::size_t index) const noexcept {
-    assert(index < size());
-    return holder_.wide_.list->items[index];
-}
-
-const Value* List::begin() const noexcept {
-    return holder_.onHeap() ? holder_.wide_.list->items.data() : nullptr;
-}
-
-const Value* List::end() const noexcept {
-    return begin() + size();
-}
-
-void List::append(Value value) {
-    if (!holder_.onHeap()) {
-        std::vector<Value> first;
-        first.push_back(std::move(value));
-        *this = List(std::move(first));
-        return;
-    }
-    if (holder_.wide_.list->isShared()) {
-        std::vector<Value> copy;
-        copy.reserve(size() + 1);
-        copy.assign(begin(), end());
-        *this = List(std::move(copy));
-    }
-    holder_.wide_.list->items.push_back(std::move(value));
-}
-
-std::span<const Value> List::itemsOf(const Value& value) noexcept {
-    if (!value.isList() || !value.onHeap()) {
-        return {};
-    }
-    return value.wide_.list->items;
-}
-
-bool operator==(const List& left, const List& right) noexcept {
-    return std::equal(left.begin(), left.end(), right.begin(), right.end());
-}
-
-// Dictionary
-
-namespace detail {
-
-std::size_t DictionaryBlock::lowerBound(std::string_view key) const noexcept {
-    const auto at = std::lower_bound(order.begin(), order.end(), key,
-                                     [this](std::uint32_t index, std::string_view wanted) {
-                                         return entries[index].key.text() < wanted;
-                                     });
-    return static_cast<std::size_t>(at - order.begin());
-}
-
-const Dictionary::Entry* DictionaryBlock::find(std::string_view key) const noexcept {
-    if (order.empty()) {
-        for (const auto& entry : entries) {
-            if (entry.key.text() == key) {
-                return &entry;
-            }
-        }
-        return nullptr;
-    }
-    const std::size_t at = lowerBound(key);
-    if (at < order.size() && entries[order[at]].key.text() == key) {
-        return &entries[order[at]];
-    }
-    return nullptr;
-}
-
-void DictionaryBlock::rebuildOrder() {
-    order.clear();
-    if (entries.size() <= Dictionary::kIndexedAbove) {
-        return;
-    }
-    order.resize(entries.size());
-    for (std::uint32_t i = 0; i < order.size(); ++i) {
-        order[i] = i;
-    }
-    std::stable_sort(order.begin(), order.end(), [this](std::uint32_t a, std::uint32_t b) {
-        return entries[a].key.text() < entries[b].key.text();
-    });
-}
-
-void DictionaryBlock::removeDuplicatesAndNone() {
-    rebuildOrder();
-    if (order.empty()) {
-        std::array<std::string_view, Dictionary::kIndexedAbove> keys;
-        for (std::size_t i = 0; i < entries.size(); ++i) {
-            keys[i] = entries[i].key.text();
-            for (std::size_t j = 0; j < i; ++j) {
-                if (keys[j] == keys[i]) {
-                    entries[j].value = Value(); // The later one wins.
-                }
-            }
-        }
-    } else {
-        for (std::size_t i = 1; i < order.size(); ++i) {
-            if (entries[order[i - 1]].key == entries[order[i]].key) {
-                entries[order[i - 1]].value = Value();
-            }
-        }
-    }
-    const std::size_t removed =
-        std::erase_if(entries, [](const auto& entry) { return entry.value.isNone(); });
-    if (removed > 0) {
-        rebuildOrder();
-    }
-}
-
-// Key by key, each new one would move those behind it in `order`.
-void DictionaryBlock::merge(std::span<const Dictionary::Entry> others) {
-    const std::size_t before = entries.size();
-    for (const Dictionary::Entry& other : others) {
-        const auto at = indexOf(other.key.text(), before);
-        if (at < before) {
-            entries[at].value = other.value;
-        } else {
-            entries.push_back(other);
-        }
-    }
-    if (order.empty()) {
-        rebuildOrder();
-        return;
-    }
-    for (std::size_t i = before; i < entries.size(); ++i) {
-        order.push_back(static_cast<std::uint32_t>(i));
-    }
-    const auto earlier = [this](std::uint32_t a, std::uint32_t b) {
-        return entries[a].key.text() < entries[b].key.text();
-    };
-    const auto added = order.begin() + static_cast<std::ptrdiff_t>(before);
-    std::sort(added, order.end(), earlier);
-    std::inplace_merge(order.begin(), added, order.end(), earlier);
-}
-
-std::size_t DictionaryBlock::indexOf(std::string_view key, std::size_t size) const noexcept {
-    if (order.empty()) {
-        const auto end = entries.begin() + static_cast<std::ptrdiff_t>(size);
-        const auto at = std::find_if(entries.begin(), end,
-                                     [&](const auto& entry) { return entry.key.text() == key; });
-        return static_cast<std::size_t>(at - entries.begin());
-    }
-    const std::size_t at = lowerBound(key);
-    const bool known = at < order.size() && entries[order[at]].key.text() == key;
-    return known ? order[at] : size;
-}
-
-} // namespace detail
-
-Dictionary::Dictionary(std::initializer_list<Entry> entries)
-    : Dictionary(std::vector<Entry>(entries)) {}
-
-Dictionary::Dictionary(std::vector<Entry> entries) {
-    if (entries.empty()) {
-        return;
-    }
-    auto* block = new DictionaryBlock;
-    block->entries = std::move(entries);
-    block->removeDuplicatesAndNone();
-    holder_.wide_.kind = Value::Kind::Dictionary;
-    holder_.wide_.inlineLength = Value::kOnHeap;
-    holder_.wide_.dictionary = block;
-}
-
-DictionaryBlock* Dictionary::block() const noexcept {
-    return holder_.onHeap() ? holder_.wide_.dictionary : nullptr;
-}
-
-DictionaryBlock& Dictionary::ownBlock() {
-    DictionaryBlock* current = block();
-    if (current != nullptr && !current->isShared()) {
-        return *current;
-    }
-    auto* copy = new DictionaryBlock;
-    if (current != nullptr) {
-        copy->entries.reserve(current->entries.size() + 1);
-        copy->entries.assign(current->entries.begin(), current->entries.end());
-        copy->order = current->order;
-    }
-    holder_ = Value();
-    holder_.wide_.kind = Value::Kind::Dictionary;
-    holder_.wide_.inlineLength = Value::kOnHeap;
-    holder_.wide_.dictionary = copy;
-    return *copy;
-}
-
-std::size_t Dictionary::size() const noexcept {
-    return block() != nullptr ? block()->entries.size() : 0;
-}
-
-const Dictionary::Entry* Dictionary::begin() const noexcept {
-    return block() != nullptr ? block()->entries.data() : nullptr;
-}
-
-const Dictionary::Entry* Dictionary::end() const noexcept {
-    return begin() + size();
-}
-
-const Value* Dictionary::find(std::string_view key) const noexcept {
-    if (block() == nullptr) {
-        return nullptr;
-    }
-    const Entry* entry = block()->find(key);
-    return entry != nullptr ? &entry->value : nullptr;
-}
-
-const Value& Dictionary::operator[](std::string_view key) const noexcept {
-    static const Value none;
-    const Value* found = find(key);
-    return found != nullptr ? *found : none;
-}
-
-void Dictionary::set(Value key, Value value) {
-    assert(key.isString());
-    if (value.isNone()) {
-        erase(key.text());
-        return;
-    }
-    DictionaryBlock& own = ownBlock();
-    if (const Entry* present = own.find(key.text())) {
-        own.entries[static_cast<std::size_t>(present - own.entries.data())].value =
-            std::move(value);
-        return;
-    }
-    if (!own.order.empty()) {
-        const auto at = own.order.begin() + static_cast<std::ptrdiff_t>(own.lowerBound(key.text()));
-        own.order.insert(at, static_cast<std::uint32_t>(own.entries.size()));
-        own.entries.push_back({std::move(key), std::move(value)});
-        return;
-    }
-    own.entries.push_back({std::move(key), std::move(value)});
-    if (own.entries.size() > kIndexedAbove) {
-        own.rebuildOrder();
-    }
-}
-
-void Dictionary::erase(std::string_view key) {
-    const Entry* present = block() != nullptr ? block()->find(key) : nullptr;
-    if (present == nullptr) {
-        return;
-    }
-    // `key` may lie in the entries, which do not outlive the next line.
-    const std::ptrdiff_t index = present - begin();
-    DictionaryBlock& own = ownBlock();
-    own.entries.erase(own.entries.begin() + index);
-    own.rebuildOrder();
-}
-
-void Dictionary::merge(const Dictionary& other) {
-    if (empty() || other.empty()) {
-        *this = empty() ? other : *this;
-        return;
-    }
-    const Dictionary kept = other; // It may be this very one.
-    ownBlock().merge(kept.block()->entries);
-}
-
-bool operator==(const Dictionary& left, const Dictionary& right) noexcept {
-    return equalBlocks(left.block(), right.block());
-}
-
-std::span<const Dictionary::Entry> Dictionary::entriesOf(const Value& value) noexcept {
-    if (!value.isDictionary() || !value.onHeap()) {
-        return {};
-    }
-    return value.wide_.dictionary->entries;
 }
 
 std::vector<const Dictionary::Entry*> sortedEntries(std::span<const Dictionary::Entry> entries) {

@@ -29,6 +29,7 @@ namespace halyard {
 
 class Dictionary;
 class List;
+class ValueArena;
 
 // A moment in UTC: seconds since 1970 (may be negative) and, counted forward
 // from there, 0 to 999,999,999 nanoseconds.
@@ -40,9 +41,43 @@ struct Date {
 };
 
 namespace detail {
+
+struct Counted {
+    // A block whose count is kImmortal is never freed and never written again,
+    // so threads share it without passing a cache line to and fro.
+    static constexpr std::uint32_t kImmortal = 0xFFFFFFFF;
+
+    std::atomic<std::uint32_t> references{1};
+    // How far before this the block begins that it is a part of, which is counted in its
+    // stead: see ValueArena.h. 0: none.
+    std::uint32_t offset = 0;
+
+    Counted* whole() noexcept {
+        return reinterpret_cast<Counted*>(reinterpret_cast<char*>(this) - offset);
+    }
+    bool isPart() const noexcept { return offset != 0; }
+    bool isImmortal() const noexcept {
+        return references.load(std::memory_order_relaxed) == kImmortal;
+    }
+    void retain() noexcept {
+        if (!isImmortal()) {
+            whole()->references.fetch_add(1, std::memory_order_relaxed);
+        }
+    }
+    // True when the caller held the last reference and must free the whole.
+    [[nodiscard]] bool release() noexcept {
+        return !isImmortal() && whole()->references.fetch_sub(1, std::memory_order_acq_rel) == 1;
+    }
+    bool isShared() const noexcept {
+        return isPart() || references.load(std::memory_order_acquire) != 1;
+    }
+};
+
+struct BlockOf;
 struct StringBlock;
 struct ListBlock;
 struct DictionaryBlock;
+
 } // namespace detail
 
 class Value {
@@ -114,6 +149,10 @@ public:
     // Requires kind() == Kind::Float.
     float floatValue() const noexcept { return wide_.float32; }
 
+    // One that keeps nothing alive of what this is a part of: for who keeps a piece of a
+    // message for long.
+    Value detached() const;
+
     Date date() const noexcept { return {wide_.int64, wide_.extra}; }
     // Empty for every other kind.
     List list() const noexcept;
@@ -127,6 +166,8 @@ private:
     friend class List;
     friend class Dictionary;
     friend class KeyTable;
+    friend class ValueArena;
+    friend struct detail::BlockOf;
 
     static constexpr std::uint8_t kMaxInline = 14;
     static constexpr std::uint8_t kOnHeap = 0xFF;
@@ -136,15 +177,13 @@ private:
     struct Wide {
         Kind kind = Kind::None;
         std::uint8_t inlineLength = 0;
-        std::uint32_t extra = 0; // nanoseconds of a date
+        std::uint32_t extra = 0; // nanoseconds of a date, entries of a dictionary
         union {
             std::int64_t int64 = 0;
             std::uint64_t uint64;
             float float32;
             double float64;
-            detail::StringBlock* string;
-            detail::ListBlock* list;
-            detail::DictionaryBlock* dictionary;
+            detail::Counted* block; // of the kind
         };
     };
     struct Small {
@@ -165,19 +204,24 @@ private:
             wide_.kind = Kind::UInt;
         }
     }
+    void setBlock(Kind kind, detail::Counted* block, std::uint32_t extra = 0) noexcept {
+        wide_.kind = kind;
+        wide_.inlineLength = kOnHeap;
+        wide_.extra = extra;
+        wide_.block = block;
+    }
     bool onHeap() const noexcept { return wide_.inlineLength == kOnHeap; }
     void retain() const noexcept {
         if (onHeap()) {
-            retainBlock();
+            wide_.block->retain();
         }
     }
     void release() noexcept {
-        if (onHeap()) {
-            releaseBlock();
+        if (onHeap() && wide_.block->release()) {
+            freeBlock();
         }
     }
-    void retainBlock() const noexcept;
-    void releaseBlock() noexcept;
+    void freeBlock() noexcept;
 
     union {
         Wide wide_;
@@ -189,6 +233,8 @@ private:
 // first when they are shared.
 class List {
 public:
+    class Builder;
+
     List() noexcept = default;
     List(std::initializer_list<Value> values);
     explicit List(std::vector<Value> values);
@@ -210,7 +256,23 @@ public:
 
 private:
     friend class Value;
+    detail::ListBlock* block() const noexcept;
     Value holder_; // none while empty, else of kind List
+};
+
+// Makes a list of so many items at most in one piece.
+class List::Builder {
+public:
+    explicit Builder(std::size_t capacity);
+    ~Builder();
+    Builder(const Builder&) = delete;
+    Builder& operator=(const Builder&) = delete;
+
+    void add(Value item) noexcept;
+    List finish() noexcept;
+
+private:
+    detail::ListBlock* block_;
 };
 
 // String keys to values, iterated in the order of insertion. An entry never
@@ -226,6 +288,8 @@ public:
     };
 
     static constexpr std::size_t kIndexedAbove = 16;
+
+    class Builder;
 
     Dictionary() noexcept = default;
     Dictionary(std::initializer_list<Entry> entries);
@@ -243,8 +307,9 @@ public:
     // None when absent.
     const Value& operator[](std::string_view key) const noexcept;
 
-    // Replaces in place or appends; a value of none erases. Requires that `key`
-    // is a string.
+    // Replaces in place or appends, the latter without a copy also of what is shared,
+    // where a builder has left room; a value of none erases. Requires that `key` is a
+    // string.
     void set(Value key, Value value);
     void erase(std::string_view key);
     // Sets every entry of `other` here, in its order.
@@ -257,12 +322,38 @@ public:
 
 private:
     friend class Value;
+    friend class ValueArena;
+    friend struct detail::BlockOf;
     detail::DictionaryBlock* block() const noexcept;
-    detail::DictionaryBlock& ownBlock();
+    // Of nobody else, with room for so many entries.
+    detail::DictionaryBlock& ownBlock(std::size_t capacity);
+    void append(Value&& key, Value&& value);
+    bool appendShared(Value& key, Value& value) noexcept;
+    void hold(detail::DictionaryBlock* block) noexcept;
     Value holder_; // none while empty, else of kind Dictionary
+};
+
+// Makes a dictionary of so many entries at most in one piece. Its capacity beyond what is
+// added is room for entries that are set later.
+class Dictionary::Builder {
+public:
+    explicit Builder(std::size_t capacity);
+    ~Builder();
+    Builder(const Builder&) = delete;
+    Builder& operator=(const Builder&) = delete;
+
+    // Requires that `key` is a string.
+    void add(Value key, Value value) noexcept;
+    // Of equal keys the last one wins.
+    Dictionary finish();
+
+private:
+    detail::DictionaryBlock* block_;
 };
 
 // Sorted pairs, for the writers whose output must not depend on insertion order.
 std::vector<const Dictionary::Entry*> sortedEntries(std::span<const Dictionary::Entry> entries);
 
 } // namespace halyard
+
+#include "common/ValueBlocks.h"

@@ -45,7 +45,9 @@ std::string shown(std::string_view text) {
 // leaves the reason in `complaint_`.
 class ArgumentReader {
 public:
-    ArgumentReader(ValueDecoder& decoder, Arguments& out) : decoder_(decoder), out_(out) {}
+    // Configurations are merged, and so kept by their parts; messages are not.
+    ArgumentReader(ValueDecoder& decoder, Arguments& out, Method method)
+        : decoder_(decoder), out_(out), isMessage_(method == Method::SendMessage) {}
 
     bool take(Argument argument);
     // "is nil, not a string"
@@ -60,6 +62,7 @@ private:
 
     ValueDecoder& decoder_;
     Arguments& out_;
+    const bool isMessage_;
     Argument current_ = Argument::ReporterID;
     std::string complaint_;
 };
@@ -110,7 +113,8 @@ bool ArgumentReader::takeDictionary(const Token& token) {
     if (token.family != Family::Map) {
         return wrongType(token);
     }
-    out_.dictionary = decoder_.dictionary(token, kArgumentDepth, kSpareEntries);
+    out_.dictionary = isMessage_ ? decoder_.message(token, kArgumentDepth, kSpareEntries)
+                                 : decoder_.dictionary(token, kArgumentDepth);
     if (decoder_.problem() != ValueDecoder::Problem::None) {
         complaint_ = "holds " + decoder_.problemText();
         return false;
@@ -172,7 +176,7 @@ void decodeParams(ValueDecoder& decoder, std::string_view name, std::size_t coun
                                           entry->count + 1, name, entry->count));
         return;
     }
-    ArgumentReader reader(decoder, call.arguments);
+    ArgumentReader reader(decoder, call.arguments, entry->method);
     for (std::size_t i = 0; i < count; ++i) {
         if (!reader.take(entry->list[i])) {
             return fail(i, reader.complaint());

@@ -2,7 +2,7 @@
 
 #include <bit>
 #include <fmt/format.h>
-#include <vector>
+#include <utility>
 
 #include "protocol/Wire.h"
 
@@ -56,15 +56,90 @@ Value ValueDecoder::value(const Token& token, int depth) {
     case Family::Float64:
         return std::bit_cast<double>(loadBig<std::uint64_t>(token.payload));
     case Family::Text:
-        return token.bytes();
+        return arena_ != nullptr ? arena_->text(token.bytes()) : Value(token.bytes());
     case Family::Array:
-        return list(token, depth);
+        return arena_ != nullptr ? listInPiece(token, depth) : Value(list(token, depth));
     case Family::Map:
-        return dictionary(token, depth);
+        return arena_ != nullptr ? dictionaryInPiece(token, depth)
+                                 : Value(dictionary(token, depth));
     case Family::Extension:
         return date(token);
     }
     return {};
+}
+
+// None when it is not worth while, or no MessagePack.
+std::optional<ValueArena::Size> ValueDecoder::sizeInPiece(const Token& map) const noexcept {
+    Reader ahead = reader_;
+    ValueArena::Size size;
+    std::size_t left = std::size_t{2} * map.size;
+    for (; left > 0; --left) {
+        const Token token = ahead.next();
+        if (token.family == Family::Text) {
+            size.addText(token.bytes().size());
+        } else if (token.family == Family::Array) {
+            size.addList(token.size);
+            left += token.size;
+        } else if (token.family == Family::Map) {
+            size.addDictionary(token.size);
+            left += std::size_t{2} * token.size;
+        }
+        const bool isIndexed =
+            token.family == Family::Map && token.size > Dictionary::kIndexedAbove;
+        if (token.family == Family::Invalid || isIndexed || size.bytes() > kMostInPiece) {
+            return std::nullopt;
+        }
+    }
+    return size;
+}
+
+Dictionary ValueDecoder::message(const Token& map, int depth, std::size_t spare) {
+    const auto inside = map.size <= Dictionary::kIndexedAbove ? sizeInPiece(map) : std::nullopt;
+    if (!inside || depth >= kMaxDepth) {
+        return dictionary(map, depth, spare);
+    }
+    ValueArena arena(map.size + spare, *inside);
+    arena_ = &arena;
+    fillInPiece(arena.root(), map, depth);
+    arena_ = nullptr;
+    return problem_ == Problem::None ? arena.finish() : Dictionary();
+}
+
+void ValueDecoder::fillInPiece(detail::DictionaryBlock& block, const Token& map, int depth) {
+    for (std::size_t i = 0; i < map.size && problem_ == Problem::None; ++i) {
+        const Token key = next();
+        if (key.family != Family::Text) {
+            fail(key.family == Family::Invalid ? Problem::Malformed : Problem::KeyIsNoString);
+            return;
+        }
+        Value name =
+            keys_ != nullptr ? arena_->key(keys_->intern(key.bytes())) : arena_->text(key.bytes());
+        block.add(std::move(name), value(next(), depth + 1));
+    }
+}
+
+Value ValueDecoder::dictionaryInPiece(const Token& map, int depth) {
+    if (depth >= kMaxDepth) {
+        fail(Problem::Malformed);
+        return {};
+    }
+    detail::DictionaryBlock* const block = arena_->dictionary(map.size);
+    if (block != nullptr) {
+        fillInPiece(*block, map, depth);
+    }
+    return ValueArena::finish(block);
+}
+
+Value ValueDecoder::listInPiece(const Token& array, int depth) {
+    if (depth >= kMaxDepth) {
+        fail(Problem::Malformed);
+        return {};
+    }
+    detail::ListBlock* const block = arena_->list(array.size);
+    for (std::size_t i = 0; i < array.size && problem_ == Problem::None; ++i) {
+        block->add(value(next(), depth + 1));
+    }
+    return ValueArena::finish(block);
 }
 
 Dictionary ValueDecoder::dictionary(const Token& map, int depth, std::size_t spare) {
@@ -72,19 +147,18 @@ Dictionary ValueDecoder::dictionary(const Token& map, int depth, std::size_t spa
         fail(Problem::Malformed);
         return {};
     }
-    std::vector<Dictionary::Entry> entries;
-    entries.reserve(map.size + spare);
+    Dictionary::Builder entries(map.size + spare);
     for (std::size_t i = 0; i < map.size && problem_ == Problem::None; ++i) {
         const Token key = next();
         if (key.family != Family::Text) {
             fail(key.family == Family::Invalid ? Problem::Malformed : Problem::KeyIsNoString);
             break;
         }
-        // In the braces' order: the key's bytes come before the value's.
-        entries.push_back({keys_ != nullptr ? keys_->intern(key.bytes()) : Value(key.bytes()),
-                           value(next(), depth + 1)});
+        // The key's bytes come before the value's.
+        Value name = keys_ != nullptr ? keys_->intern(key.bytes()) : Value(key.bytes());
+        entries.add(std::move(name), value(next(), depth + 1));
     }
-    return Dictionary(std::move(entries));
+    return entries.finish();
 }
 
 List ValueDecoder::list(const Token& array, int depth) {
@@ -92,12 +166,11 @@ List ValueDecoder::list(const Token& array, int depth) {
         fail(Problem::Malformed);
         return {};
     }
-    std::vector<Value> items;
-    items.reserve(array.size);
+    List::Builder items(array.size);
     for (std::size_t i = 0; i < array.size && problem_ == Problem::None; ++i) {
-        items.push_back(value(next(), depth + 1));
+        items.add(value(next(), depth + 1));
     }
-    return List(std::move(items));
+    return items.finish();
 }
 
 Value ValueDecoder::date(const Token& extension) {

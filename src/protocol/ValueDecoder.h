@@ -9,6 +9,7 @@
 
 #include "common/KeyTable.h"
 #include "common/Value.h"
+#include "common/ValueArena.h"
 #include "protocol/MessagePack.h"
 
 namespace halyard::protocol {
@@ -89,18 +90,28 @@ public:
     Value value(const Token& token, int depth);
     // Requires a map. Keeps room for as many entries more as `spare` says.
     Dictionary dictionary(const Token& map, int depth, std::size_t spare = 0);
+    // The same in one piece of memory, unless it is large: for what comes, is looked at
+    // and goes as a whole.
+    Dictionary message(const Token& map, int depth, std::size_t spare);
 
     Problem problem() const noexcept { return problem_; }
     // "a dictionary key that is no string"
     std::string problemText() const;
 
 private:
+    static constexpr std::size_t kMostInPiece = 8192;
+
     List list(const Token& array, int depth);
+    std::optional<ValueArena::Size> sizeInPiece(const Token& map) const noexcept;
+    void fillInPiece(detail::DictionaryBlock& block, const Token& map, int depth);
+    Value dictionaryInPiece(const Token& map, int depth);
+    Value listInPiece(const Token& array, int depth);
     Value date(const Token& extension);
     void fail(Problem problem) noexcept;
 
     Reader reader_;
     KeyTable* keys_;
+    ValueArena* arena_ = nullptr; // while a message is decoded
     Problem problem_ = Problem::None;
     int extensionType_ = 0;
 };

@@ -27,11 +27,11 @@ void VolumeStretches::take(const Dictionary& message) {
         if (key == HYReportingMessageKeyVolume) {
             volume = &value;
         } else if (key == HYReportingMessageKeySelectedFormat) {
-            format_ = value;
+            format_ = value.detached();
         } else if (key == HYReportingMessageKeyActiveDevices) {
-            devices_ = value;
+            devices_ = value.detached();
         } else if (key == HYReportingMessageKeyVolumeProcess) {
-            process_ = value;
+            process_ = value.detached();
         }
     }
     if (volume != nullptr) {
@@ -43,12 +43,12 @@ void VolumeStretches::takeVolume(const Value& volume, const Dictionary& message)
     const bool playing = message[HYReportingMessageKeyPlayingState].integerValue() != 0;
     const Value& time = message[HYReportingMessageKeyHYTimestamp];
     if (startTime_.isNone()) {
-        startTime_ = playing ? time : Value();
+        startTime_ = playing ? time.detached() : Value();
     } else if (!playing || volume.doubleValue() != lastVolume_.doubleValue()) {
         endStretch(time.doubleValue() - startTime_.doubleValue());
-        startTime_ = playing ? time : Value();
+        startTime_ = playing ? time.detached() : Value();
     }
-    lastVolume_ = volume;
+    lastVolume_ = volume.detached();
 }
 
 void VolumeStretches::endStretch(double length) {
@@ -131,7 +131,7 @@ SummaryTexts::Joined* SummaryTexts::joinedFor(const Value& key, std::size_t plac
     } else if (!hasRoomFor(kKeyBytes + key.text().size(), sender)) {
         return nullptr;
     } else {
-        guess = &joined_.emplace_back(Joined{key, {}});
+        guess = &joined_.emplace_back(Joined{key.detached(), {}});
         positions_.emplace(guess->key.text(), guess);
     }
     return guess;
