@@ -49,15 +49,14 @@ class Present:
 
     `rows` are its numbers in the order of the rows' ids, `required` those that had to be
     there, in the order of sending. What retention, a purge or somebody's rm took lies before
-    the first that is left; what is missing behind that is a hole.
+    `first`, the lowest in the store of now (None: none is); what is missing behind is a hole.
     """
 
-    def __init__(self, who, rows_, required, last_sent):
+    def __init__(self, who, rows_, required, last_sent, first):
         self.who = who
         self.rows = rows_
         self.last_sent = last_sent
         there = set(rows_)
-        first = min(there, default=None)
         missing = [n for n in required if n not in there]
         self.before = [n for n in missing if first is None or n < first]
         self.holes = [n for n in missing if first is not None and n > first]

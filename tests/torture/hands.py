@@ -66,8 +66,8 @@ def configure(daemon, number):
 
 def read(path, seconds):
     """A reader that stays in one transaction."""
-    database = sqlite3.connect(f"file:{path}?mode=ro", uri=True, isolation_level=None)
     try:
+        database = sqlite3.connect(f"file:{path}?mode=ro", uri=True, isolation_level=None)
         database.execute("BEGIN")
         database.execute("SELECT count(*) FROM upload_message").fetchall()
         time.sleep(seconds)
@@ -76,8 +76,9 @@ def read(path, seconds):
 
 
 def lock(path, seconds):
-    database = sqlite3.connect(path, isolation_level=None)
     try:
+        # Not one that makes a file where there is none.
+        database = sqlite3.connect(f"file:{path}?mode=rw", uri=True, isolation_level=None)
         database.execute("BEGIN IMMEDIATE")
         time.sleep(seconds)
         database.execute("ROLLBACK")

@@ -253,20 +253,25 @@ class LifeRun:
         try:
             client = self.daemon.client()
             client.result("admin.flush")
-            for _ in range(20):
+            for _ in range(100):
                 status = client.result("admin.status")
                 self.rows_at_rest = self.count_rows(self.daemon.store_path)
-                if client.result("admin.status")["store"]["rows"] == status["store"]["rows"]:
+                after = client.result("admin.status")["store"]
+                # Retention may still be at work, a slab at a time.
+                if all(after[what] == status["store"][what] for what in ("rows", "removed")):
                     self.last_status = status
                     break
+                time.sleep(0.2)
             client.close()
         except (OSError, AssertionError, sqlite3.Error) as error:
             self.fault(f"no look at the daemon at rest: {error!r}")
 
     @staticmethod
     def count_rows(path):
-        database = sqlite3.connect(f"file:{path}?mode=ro", uri=True, timeout=20)
+        database = sqlite3.connect(f"file:{path}?mode=ro", uri=True, timeout=20,
+                                   isolation_level=None)
         try:
+            database.execute("BEGIN")
             return {table: database.execute(f"SELECT count(*) FROM {table}").fetchone()[0]
                     for (table,) in database.execute(
                         "SELECT name FROM sqlite_master WHERE type = 'table'").fetchall()}
@@ -364,15 +369,17 @@ class LifeRun:
     def account_of_clients(self):
         rows = {}
         for snapshot in [*self.moved, self.after]:
+            first = {}  # Of the last store, which is the one that retention looks after.
             for who, n in snapshot.messages:
                 rows.setdefault(who, []).append(n)
+                first[who] = min(n, first.get(who, n))
         self.library_rows = rows.get("library", [])
         presents = []
         sent_at = {}
         for ledger in self.ledgers:
             required = self.required(ledger)
             presents.append(checks.Present(ledger["who"], rows.get(ledger["who"], []), required,
-                                           ledger["written"] - 1))
+                                           ledger["written"] - 1, first.get(ledger["who"])))
             sent_at.update({(ledger["who"], n): at for n, at in ledger["answered"]})
             self.place.honest_answered += len(ledger["answered"])
         self.counted = self.not_kept()

@@ -59,8 +59,8 @@ class Sheets(unittest.TestCase):
 
 class Promises(unittest.TestCase):
     def faults(self, rows, required, counted=0, may_lack_first=False, last_sent=9, **more):
-        return checks.kept([Present("a", rows, required, last_sent)], counted, may_lack_first,
-                           **more)
+        present = Present("a", rows, required, last_sent, min(rows, default=None))
+        return checks.kept([present], counted, may_lack_first, **more)
 
     def test_all_that_was_promised_is_there(self):
         self.assertEqual(self.faults([0, 1, 2, 3], [0, 1, 2]), [])
@@ -80,6 +80,11 @@ class Promises(unittest.TestCase):
     def test_all_may_be_missing_only_where_they_were_removed(self):
         self.assertTrue(self.faults([], [0, 1]))
         self.assertEqual(self.faults([], [0, 1], may_lack_first=True), [])
+
+    def test_the_first_of_the_store_of_now_count_when_another_was_moved_away(self):
+        moved = Present("a", [0, 1, 5, 6], [0, 1, 2, 3, 5, 6], 9, first=5)
+        self.assertEqual(checks.kept([moved], 0, True), [])
+        self.assertTrue(checks.kept([moved], 0, False))
 
     def test_a_single_one_may_be_excused(self):
         self.assertEqual(self.faults([0, 2], [0, 1, 2], excused=lambda who, n: n == 1), [])

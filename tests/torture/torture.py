@@ -12,6 +12,7 @@ minute and the last acts, leaves the run's directory, and ends with 1.
 import argparse
 import collections
 import json
+import math
 import os
 import random
 import shutil
@@ -104,12 +105,14 @@ class Library:
         self.process = start(library.run, run.programs.libhalyard, run.daemon.socket_path,
                              self.stop, self.path)
         self.stored = set()
+        self.last_end = 0
         self.excused = []  # (from, until): what was sent then may be missing
 
     def lived(self, life):
         rows = getattr(life, "library_rows", [])
         self.stored.update(rows)
         began, ended = getattr(life, "began", 0), getattr(life, "ended", time.monotonic())
+        self.last_end = ended
         orderly = life.plan.end != "sigkill" and not life.hands.moved
         if not orderly or not hasattr(life, "counted") or life.counted or life.removed():
             self.excused.append((began - 5, ended))
@@ -134,6 +137,7 @@ class Library:
     def faults(self):
         with open(self.path, encoding="utf-8") as file:
             ledger = json.load(file)
+        self.excused.append((self.last_end - 1, math.inf))  # Nobody took these.
         missing = [(n, at) for n, at in ledger["taken"] if n not in self.stored and
                    not any(start <= at <= end for start, end in self.excused)]
         figures = ledger["statistics"]
