@@ -320,7 +320,7 @@ void LinuxPlatform::finishShutdown(bool inTime) {
 void LinuxPlatform::saveWhatWasAccepted() {
     const BlockingSection blocking;
     const auto drained = std::make_shared<std::promise<void>>();
-    queues_->drain([drained] { drained->set_value(); });
+    flush([drained] { drained->set_value(); });
     (void)drained->get_future().wait_for(kShutdownLimit);
     (void)store_->store.close(kCloseLimit);
     logAccounts();

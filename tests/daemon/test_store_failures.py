@@ -158,6 +158,17 @@ class OnAFaultyDisk(unittest.TestCase):
         self.assertIsNotNone(lost, self.daemon.log())
         self.assertGreaterEqual(int(lost.group(1)), self.sent - self.messages())
 
+    def test_a_service_that_is_killed_waits_for_a_disk_that_is_slow(self):
+        self.send()
+        self.client.result("admin.flush")
+        self.disk.tell("slow", 2500)
+        for _ in range(5):
+            self.send()
+        self.client.start("killService")
+        self.assertEqual(self.daemon.process.wait(PATIENCE), 2)
+        self.assertEqual(self.messages(), self.sent)
+        self.assertIn('"waiting":0,', self.daemon.log().splitlines()[-1])
+
     def test_read_errors_for_a_while_cost_nothing(self):
         for _ in range(100):
             self.send()

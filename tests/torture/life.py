@@ -301,6 +301,8 @@ class LifeRun:
         log = self.daemon.log()
         found = SHEET.findall(log)
         self.sheet = json.loads(found[-1]) if found else None
+        # A disk so slow that even an end within its limits cannot wait for it.
+        self.faulty_end = self.faulty_end or "the file system does not answer" in log[-3000:]
         # A storm may leave the log's level where the sheet is not told.
         if self.plan.end != "sigkill" and self.sheet is None and not self.plan.has("storm"):
             self.fault("the log lacks the last sheet")
