@@ -21,16 +21,21 @@ Result<Places> placesOf(const std::optional<std::string>& state, const Environme
     std::error_code none;
     const bool isSystem = uid == 0 || fs::is_directory(system, none);
     const std::uint32_t as = isSystem ? 0 : uid;
-    const auto store =
-        linux_::resolveDirectory(&Directories::state, withoutManager(environment), as);
     const auto configuration =
         linux_::resolveDirectory(&Directories::configuration, environment, as);
-    if (!store.ok() || !configuration.ok()) {
-        return store.ok() ? configuration.failure() : store.failure();
+    if (!configuration.ok()) {
+        return configuration.failure();
     }
-    Places places{isSystem ? system : store.value(), configuration.value(), {}};
+    Places places{isSystem ? system : fs::path(), configuration.value(), {}};
     if (state) {
         places.store = *state;
+    } else if (!isSystem) {
+        const auto store =
+            linux_::resolveDirectory(&Directories::state, withoutManager(environment), as);
+        if (!store.ok()) {
+            return store.failure();
+        }
+        places.store = store.value();
     }
     const auto own = environment("STATE_DIRECTORY");
     if (own && !own->empty()) {
