@@ -12,7 +12,7 @@ namespace halyard::exporting {
 
 class Wait {
 public:
-    // Both must outlive nothing: paths are looked up again whenever they were missing.
+    // Directories that are missing are looked for again at each wait.
     Wait(std::filesystem::path state, std::filesystem::path configuration);
     ~Wait();
     Wait(const Wait&) = delete;

@@ -13,10 +13,13 @@ public:
     struct Note {
         bool given = false;
         double time = 0;
+
+        bool operator==(const Note&) const = default;
     };
 
     // Nobody ever agreed.
     ConsentHistory() = default;
+    bool operator==(const ConsentHistory&) const = default;
     // In the order in which they were made.
     explicit ConsentHistory(std::vector<Note> notes) : notes_(std::move(notes)) {}
     // For who only wants to see what would leave.
@@ -25,7 +28,6 @@ public:
     bool isGivenAt(double time) const;
     // From one to the other, both included.
     bool isGivenThroughout(double from, double to) const;
-    bool isGivenNow() const { return always_ || (!notes_.empty() && notes_.back().given); }
 
 private:
     double endOfRefusal(std::size_t refusal) const;

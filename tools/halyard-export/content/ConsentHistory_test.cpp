@@ -7,12 +7,10 @@ namespace {
 
 TEST(ConsentHistoryTest, TimeWithoutANoteIsRefused) {
     EXPECT_FALSE(ConsentHistory().isGivenAt(5));
-    EXPECT_FALSE(ConsentHistory().isGivenNow());
     const ConsentHistory history({{true, 10}});
     EXPECT_FALSE(history.isGivenAt(9.9));
     EXPECT_TRUE(history.isGivenAt(10));
     EXPECT_TRUE(history.isGivenAt(1e12));
-    EXPECT_TRUE(history.isGivenNow());
 }
 
 TEST(ConsentHistoryTest, WhatWasRefusedStaysRefusedAfterANewConsent) {
@@ -34,7 +32,6 @@ TEST(ConsentHistoryTest, AStretchIsAgreedToWhereAllOfItIs) {
 
 TEST(ConsentHistoryTest, AClockThatWasSetBackLeavesTheDoubtfulRefused) {
     const ConsentHistory history({{true, 10}, {false, 20}, {true, 12}});
-    EXPECT_TRUE(history.isGivenNow());
     EXPECT_TRUE(history.isGivenAt(13));
     EXPECT_FALSE(history.isGivenAt(21));
     const ConsentHistory later({{true, 10}, {false, 20}, {true, 12}, {false, 40}, {true, 50}});

@@ -66,7 +66,6 @@ void Metrics::addPoint(std::string_view name, std::string_view unit, Kind kind,
     series.kind = kind;
     series.description = description;
     Writer(series.points).add_message(metric::kDataPoints, point);
-    bytes_ += point.size();
 }
 
 void Metrics::addDriver(Writer& point, Tag tag, const DriverFacts& facts) {
@@ -215,7 +214,6 @@ std::size_t Metrics::finish(RequestBody& body) {
         body.add(bytes);
     }
     series_.clear();
-    bytes_ = 0;
     return totals;
 }
 

@@ -41,7 +41,6 @@ public:
     void addTotal(std::string_view name, std::string_view description, std::string_view reason,
                   std::uint64_t value, Stretch stretch);
 
-    std::size_t bytes() const { return bytes_; }
     // One metric for each name and unit. Returns how many of them are totals.
     std::size_t finish(otlp::RequestBody& body);
 
@@ -73,7 +72,6 @@ private:
     reading::JsonFields fields_;
     std::map<std::pair<std::string, std::string>, Series> series_; // by name and unit
     std::map<std::string, Lengths, std::less<>> glitches_;         // by cause
-    std::size_t bytes_ = 0;
 };
 
 } // namespace halyard::exporting
