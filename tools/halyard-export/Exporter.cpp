@@ -33,6 +33,8 @@ void Exporter::follow(Plan plan) {
     scope_.omission = Omission(plan_.options.omit);
     scope_.drivers = plan_.drivers;
     scope_.analyticsEvents = plan_.options.analyticsEvents;
+    scope_.sharesSessions =
+        plan_.options.isSent(Signal::Traces) && plan_.options.isSent(Signal::Metrics);
     scope_.limits = plan_.options.limits;
     resource_.deviceName = plan_.deviceName;
     resource_.system = systemFacts();

@@ -107,6 +107,61 @@ TEST_F(ExporterTest, ALeapOfIdsIsNoLoss) {
     EXPECT_EQ(lost(Signal::Logs, Loss::Removed), 0U);
 }
 
+TEST_F(ExporterTest, RowsThatAreSavedLaterBelowALeapAreSentOnce) {
+    const auto insert = [this](std::int64_t id, double at) {
+        store_.execute(fmt::format("INSERT INTO upload_message(id, category, type, payload, time) "
+                                   "VALUES({}, 4, 1, '{{}}', {})",
+                                   id, kBegin + at));
+    };
+    insert(1, 1);
+    run();
+    insert(std::int64_t{1} << 40, 9);
+    run();
+    insert(3, 2);
+    restarted();
+    run();
+    insert((std::int64_t{1} << 40) + 1, 10);
+    insert(4, 3);
+    run();
+    run();
+    std::vector<std::string> times;
+    for (const auto& record : receiver_.items(Signal::Logs)) {
+        times.emplace_back(record["timeUnixNano"].GetString(), 10);
+    }
+    EXPECT_EQ(times, (std::vector<std::string>{"1700000001", "1700000009", "1700000002",
+                                               "1700000003", "1700000010"}));
+    EXPECT_EQ(lost(Signal::Logs, Loss::Removed), 0U);
+}
+
+TEST_F(ExporterTest, SessionsThatAreSavedLaterBelowALeapAreSentOnce) {
+    store_.addSession("first", kBegin + 1, kBegin + 2);
+    const auto moved = store_.addSession("second", kBegin + 5, kBegin + 6);
+    store_.execute(fmt::format("UPDATE upload_session SET id = {} WHERE id = {}",
+                               std::int64_t{1} << 40, moved));
+    run();
+    store_.execute(fmt::format("UPDATE upload_session SET id = 2 WHERE id = {}",
+                               store_.addSession("late", kBegin + 3, kBegin + 4)));
+    run();
+    run();
+    EXPECT_EQ(receiver_.items(Signal::Traces).size(), 3U);
+    EXPECT_EQ(lost(Signal::Traces, Loss::Removed), 0U);
+}
+
+TEST_F(ExporterTest, OfAnyNumberOfOpenSessionsEachIsSentOnceItIsClosed) {
+    constexpr std::size_t kMany = SessionWalk::kMostOpen + 2;
+    store_.execute(fmt::format("WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n "
+                               "WHERE i < {}) INSERT INTO upload_session(session_id, session_info, "
+                               "user_info, opened) SELECT i, '{{}}', '{{}}', {} FROM n",
+                               kMany, kBegin + 1));
+    run();
+    store_.execute(fmt::format("UPDATE upload_session SET closed = {} WHERE id IN (1, {})",
+                               kBegin + 2, kMany));
+    run();
+    EXPECT_EQ(receiver_.items(Signal::Traces).size(), 2U);
+    run();
+    EXPECT_EQ(receiver_.items(Signal::Traces).size(), 2U);
+}
+
 TEST_F(ExporterTest, WhatIsSentAgainHasTheSameIdentity) {
     message(1);
     receiver_.answerWith(503);

@@ -20,8 +20,6 @@
 
 namespace halyard::exporting {
 
-inline constexpr std::size_t kSignals = kSignalNames.size();
-
 struct Options {
     using Headers = std::vector<std::pair<std::string, std::string>>;
 

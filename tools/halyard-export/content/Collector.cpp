@@ -6,6 +6,7 @@
 
 #include "common/HYReportingUtility.h"
 #include "content/SessionSpans.h"
+#include "content/TablePlace.h"
 
 namespace halyard::exporting {
 namespace {
@@ -14,57 +15,11 @@ using reading::Outcome;
 using reading::Row;
 using reading::StoreReader;
 
-constexpr const char* kSessions = "upload_session";
 constexpr const char* kMessages = "upload_message";
-// Of one batch.
-constexpr std::size_t kMostSessions = 64;
-// Open sessions that are looked at again for one batch.
-constexpr std::size_t kMostOpen = 8192;
 constexpr std::size_t kMostSingles = 1024;
-// More rows than any store had: ids leap where the daemon makes room for rows that it may
-// still save from a damaged file.
-constexpr std::int64_t kLeap = std::int64_t{1} << 32;
-
-// A place in a table whose rows began anew, because a store was emptied or replaced, is
-// none. `time` is the table's column.
-Outcome<Position> startIn(StoreReader& reader, const std::string& table, const char* time,
-                          Position position) {
-    if (position.id == 0) {
-        return position;
-    }
-    bool isThere = false;
-    bool isOther = false;
-    const auto looked =
-        reader.forEach({table, time, "", position.id - 1, position.id}, [&](const Row& row) {
-            isThere = true;
-            isOther = row.real(1) != position.time;
-            return false;
-        });
-    if (!looked.ok()) {
-        return looked.failure();
-    }
-    if (!isThere) {
-        const auto newest = reader.integer(fmt::format("SELECT max(id) FROM {}", table));
-        if (!newest.ok()) {
-            return newest.failure();
-        }
-        // An empty table may be about to go on where it was.
-        isOther = newest.value().value_or(position.id) < position.id;
-    }
-    return isOther ? Position{} : position;
-}
-
-// Counts the rows between where it was and `row` as lost, unless they were never to leave.
-void passTo(Position& position, std::int64_t id, double time, const ConsentHistory& consent,
-            PlaceChange& change) {
-    const std::int64_t missing = id - position.id - 1;
-    if (position.id > 0 && missing > 0 && missing < kLeap &&
-        (consent.isGivenAt(position.time) || consent.isGivenAt(time))) {
-        change.losses[Loss::Removed] += static_cast<std::uint64_t>(missing);
-    }
-    position = {id, time};
-}
-
+// For how long what was read of sessions is good for another signal: their last messages may
+// still be on their way. Seconds.
+constexpr double kFresh = 2;
 } // namespace
 
 Outcome<Batch> Collector::collect(Signal signal, StoreReader& reader, const ExportPlace& place,
@@ -73,7 +28,7 @@ Outcome<Batch> Collector::collect(Signal signal, StoreReader& reader, const Expo
     case Signal::Logs:
         return collectLogs(reader, place);
     case Signal::Traces:
-        return collectTraces(reader, place);
+        return collectTraces(reader, place, now);
     default:
         return collectMetrics(reader, place, now);
     }
@@ -105,17 +60,13 @@ Outcome<Batch> Collector::collectLogs(StoreReader& reader, const ExportPlace& pl
     return batch;
 }
 
-Outcome<void> Collector::collectTable(std::size_t table, StoreReader& reader,
-                                      const ExportPlace& place, Batch& batch) {
-    const std::string name(kLogTables[table].name);
-    const Position before = place.positionOf(Signal::Logs, name);
-    const auto start = startIn(reader, name, "time", before);
-    if (!start.ok()) {
-        return start.failure();
-    }
-    Position position = start.value();
-    const auto done =
-        reader.forEach({name, kLogTables[table].columns, "", position.id}, [&](const Row& row) {
+// One pass over rows of a table. `pass` is told of each that the batch holds then, or that is
+// not to leave.
+Outcome<void> Collector::collectRows(std::size_t table, StoreReader& reader, Rows rows,
+                                     Batch& batch, const std::function<void(Position)>& pass) {
+    return reader.forEach(
+        {std::string(kLogTables[table].name), kLogTables[table].columns, "", rows.after, rows.upTo},
+        [&](const Row& row) {
             const double time = timeOf(table, row);
             const bool leaves = scope_.consent.isGivenAt(time);
             const std::string* const record =
@@ -125,7 +76,7 @@ Outcome<void> Collector::collectTable(std::size_t table, StoreReader& reader,
                 batch.hasMore = true;
                 return false;
             }
-            passTo(position, row.integer(0), time, scope_.consent, batch.change);
+            pass({row.integer(0), time});
             if (record != nullptr && record->size() > scope_.limits.bytes) {
                 ++batch.change.losses[Loss::TooLarge];
             } else if (record != nullptr) {
@@ -135,83 +86,69 @@ Outcome<void> Collector::collectTable(std::size_t table, StoreReader& reader,
             batch.hasMore = batch.body.count() >= scope_.limits.records;
             return !batch.hasMore;
         });
+}
+
+Outcome<void> Collector::collectTable(std::size_t table, StoreReader& reader,
+                                      const ExportPlace& place, Batch& batch) {
+    const std::string name(kLogTables[table].name);
+    for (const LateRows& late : place.lateRows(Signal::Logs, name)) {
+        const auto done =
+            collectRows(table, reader, {late.after.id, late.before - 1}, batch, [&](Position row) {
+                batch.change.late[{name, late.before}] = row;
+            });
+        if (!done.ok() || batch.hasMore) {
+            return done;
+        }
+    }
+    const Position before = place.positionOf(Signal::Logs, name);
+    const auto start = startIn(reader, name, "time", before);
+    if (!start.ok()) {
+        return start.failure();
+    }
+    Position position = start.value();
+    const auto done =
+        collectRows(table, reader, {position.id, INT64_MAX}, batch, [&](Position row) {
+            passTo(position, name, row, scope_.consent, batch.change);
+        });
     if (position != before) {
         batch.change.positions[name] = position;
     }
     return done;
 }
 
-Outcome<void> Collector::walkOpenSessions(Signal signal, StoreReader& reader,
-                                          const ExportPlace& place, SessionWalk& walk) {
-    for (const std::int64_t id : place.openSessions(signal, kMostOpen)) {
-        if (walk.closed.size() >= kMostSessions) {
-            walk.hasMore = true;
-            break;
-        }
-        std::optional<BookedSession> session;
-        const auto looked = reader.forEach({kSessions, sessionColumns(reader), "", id - 1, id},
-                                           [&](const Row& row) {
-                                               session = sessions_.read(row);
-                                               return false;
-                                           });
-        if (!looked.ok()) {
-            return looked.failure();
-        }
-        if (!session) {
-            ++walk.change.losses[Loss::Removed];
-            walk.change.done.push_back(id);
-        } else if (session->closed) {
-            walk.change.done.push_back(id);
-            walk.closed.push_back(*std::move(session));
-        }
+// To pass over the messages is most of the work, and traces and metrics mostly have got to the
+// same sessions.
+Outcome<Collector::Contents> Collector::contentsOf(const SessionGroup& walk, Wanted wanted,
+                                                   StoreReader& reader, double now) {
+    Gathered gathered{{}, scope_.consent, now, {}};
+    for (const BookedSession& session : walk.closed) {
+        gathered.sessions.emplace_back(session.row, session.opened);
     }
-    return {};
+    const auto known = std::exchange(gathered_, std::nullopt);
+    if (known && known->sessions == gathered.sessions && known->consent == gathered.consent &&
+        now >= known->at && now - known->at < kFresh) {
+        return known->contents;
+    }
+    const bool isKept = scope_.sharesSessions && wanted == Wanted::Events;
+    auto contents =
+        gatherContents(reader, walk.closed, scope_.consent, isKept ? Wanted::Both : wanted);
+    if (!contents.ok()) {
+        return contents.failure();
+    }
+    gathered.contents = std::make_shared<ContentsOf>(std::move(contents.value()));
+    auto shared = gathered.contents;
+    if (isKept) {
+        gathered_ = std::move(gathered);
+    }
+    return shared;
 }
 
-Outcome<Collector::SessionWalk> Collector::walkSessions(Signal signal, StoreReader& reader,
-                                                        const ExportPlace& place) {
-    SessionWalk walk;
-    const Position before = place.positionOf(signal, kSessions);
-    const auto start = startIn(reader, kSessions, "opened", before);
-    if (!start.ok()) {
-        return start.failure();
-    }
-    if (auto opened = walkOpenSessions(signal, reader, place, walk); !opened.ok()) {
-        return opened.failure();
-    }
-    Position position = start.value();
-    const auto done =
-        reader.forEach({kSessions, sessionColumns(reader), "", position.id}, [&](const Row& row) {
-            if (walk.closed.size() >= kMostSessions) {
-                walk.hasMore = true;
-                return false;
-            }
-            BookedSession session = sessions_.read(row);
-            passTo(position, session.row, session.opened, scope_.consent, walk.change);
-            if (!session.closed) {
-                walk.change.opened.push_back(session.row);
-            } else {
-                walk.closed.push_back(std::move(session));
-            }
-            return walk.change.opened.size() < kMostOpen;
-        });
-    if (position != before) {
-        walk.change.positions[kSessions] = position;
-    }
-    // Those from a time without consent are passed, and leave nothing.
-    std::erase_if(walk.closed, [this](const BookedSession& session) {
-        return !scope_.consent.isGivenAt(session.opened) ||
-               !scope_.consent.isGivenAt(session.closed.value_or(session.opened));
-    });
-    return done.ok() ? Outcome<SessionWalk>(std::move(walk)) : done.failure();
-}
-
-Outcome<Batch> Collector::collectTraces(StoreReader& reader, const ExportPlace& place) {
-    auto walk = walkSessions(Signal::Traces, reader, place);
+Outcome<Batch> Collector::collectTraces(StoreReader& reader, const ExportPlace& place, double now) {
+    auto walk = walk_.next(Signal::Traces, reader, place);
     if (!walk.ok()) {
         return walk.failure();
     }
-    auto contents = gatherContents(reader, walk.value().closed, scope_.consent, Wanted::Events);
+    auto contents = contentsOf(walk.value(), Wanted::Events, reader, now);
     if (!contents.ok()) {
         return contents.failure();
     }
@@ -220,7 +157,7 @@ Outcome<Batch> Collector::collectTraces(StoreReader& reader, const ExportPlace& 
     batch.hasMore = walk.value().hasMore;
     SessionSpans spans(scope_.identity, scope_.omission);
     for (const BookedSession& session : walk.value().closed) {
-        const SessionContents& of = contents.value()[session.row];
+        const SessionContents& of = (*contents.value())[session.row];
         if (of.glitchesLeftOut > 0) {
             batch.change.losses[Loss::TooLarge] += of.glitchesLeftOut;
         }
@@ -263,17 +200,15 @@ Outcome<void> Collector::addSingles(StoreReader& reader, const ExportPlace& plac
     if (!found.ok() || newest == before) {
         return found;
     }
-    enum Column : int { kID, kCategory, kTime, kPayload };
+    enum Column : int { kID, kTime, kPayload };
     std::map<std::pair<double, std::string>, GlitchFacts> glitches;
     reading::JsonFields fields;
     const auto done = reader.forEach(
-        {kMessages, "category, time, payload",
+        {kMessages, "time, payload",
          fmt::format("upload_session IS NULL AND type = {}", kAudioEventTypeIssueDetector),
          start.value().id, newest.id},
         [&](const Row& row) {
-            auto glitch =
-                glitchFactsIn(fields, row.text(kPayload),
-                              static_cast<std::uint32_t>(row.integer(kCategory)), row.real(kTime));
+            auto glitch = glitchFactsIn(fields, row.text(kPayload), row.real(kTime));
             if (glitch && scope_.consent.isGivenAt(row.real(kTime))) {
                 auto key = std::pair(glitch->start, glitch->node);
                 glitches.insert_or_assign(std::move(key), *std::move(glitch));
@@ -317,11 +252,11 @@ void Collector::addTotals(const ExportPlace& place, Metrics& metrics, double now
 
 Outcome<Batch> Collector::collectMetrics(StoreReader& reader, const ExportPlace& place,
                                          double now) {
-    auto walk = walkSessions(Signal::Metrics, reader, place);
+    auto walk = walk_.next(Signal::Metrics, reader, place);
     if (!walk.ok()) {
         return walk.failure();
     }
-    auto contents = gatherContents(reader, walk.value().closed, scope_.consent, Wanted::Statistics);
+    auto contents = contentsOf(walk.value(), Wanted::Statistics, reader, now);
     if (!contents.ok()) {
         return contents.failure();
     }
@@ -330,7 +265,11 @@ Outcome<Batch> Collector::collectMetrics(StoreReader& reader, const ExportPlace&
     batch.hasMore = walk.value().hasMore;
     Metrics metrics(scope_.omission, scope_.drivers);
     for (const BookedSession& session : walk.value().closed) {
-        addSession(metrics, session, contents.value()[session.row]);
+        const SessionContents& of = (*contents.value())[session.row];
+        if (of.statisticsLeftOut > 0) {
+            batch.change.losses[Loss::TooLarge] += of.statisticsLeftOut;
+        }
+        addSession(metrics, session, of);
     }
     if (auto singles = addSingles(reader, place, metrics, batch.change); !singles.ok()) {
         return singles.failure();

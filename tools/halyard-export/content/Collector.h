@@ -5,8 +5,11 @@
 #pragma once
 
 #include <cstddef>
+#include <cstdint>
 #include <functional>
 #include <map>
+#include <memory>
+#include <optional>
 #include <set>
 #include <string>
 #include <utility>
@@ -20,6 +23,7 @@
 #include "content/Omission.h"
 #include "content/SessionBook.h"
 #include "content/SessionContents.h"
+#include "content/SessionWalk.h"
 #include "otlp/RequestBody.h"
 #include "place/ExportPlace.h"
 #include "reading/StoreReader.h"
@@ -50,6 +54,8 @@ struct ExportScope {
     ConsentHistory consent;
     DriverNames drivers;
     bool analyticsEvents = false;
+    // Traces and metrics both leave: what is read for the one is kept for the other.
+    bool sharesSessions = false;
     BatchLimits limits;
 };
 
@@ -57,7 +63,7 @@ class Collector {
 public:
     // Borrows `scope`; one collector for one store and one scope.
     explicit Collector(const ExportScope& scope)
-        : scope_(scope), sessions_(scope.identity),
+        : scope_(scope), sessions_(scope.identity), walk_(sessions_, scope.consent),
           records_(scope.identity, scope.omission, scope.consent, sessions_) {}
 
     reading::Outcome<Batch> collect(Signal signal, reading::StoreReader& reader,
@@ -66,23 +72,31 @@ public:
     void arrived(Signal signal);
 
 private:
-    struct SessionWalk {
-        std::vector<BookedSession> closed;
-        PlaceChange change;
-        bool hasMore = false;
+    struct Rows {
+        std::int64_t after = 0;
+        std::int64_t upTo = INT64_MAX;
+    };
+    using Contents = std::shared_ptr<ContentsOf>;
+    // What the messages of the sessions in a walk told.
+    struct Gathered {
+        std::vector<std::pair<std::int64_t, double>> sessions; // rows, and when they were opened
+        ConsentHistory consent;
+        double at = 0;
+        Contents contents;
     };
     using Totals = std::map<Loss, std::uint64_t>;
 
     reading::Outcome<Batch> collectLogs(reading::StoreReader& reader, const ExportPlace& place);
-    reading::Outcome<Batch> collectTraces(reading::StoreReader& reader, const ExportPlace& place);
+    reading::Outcome<Batch> collectTraces(reading::StoreReader& reader, const ExportPlace& place,
+                                          double now);
     reading::Outcome<Batch> collectMetrics(reading::StoreReader& reader, const ExportPlace& place,
                                            double now);
     reading::Outcome<void> collectTable(std::size_t table, reading::StoreReader& reader,
                                         const ExportPlace& place, Batch& batch);
-    reading::Outcome<SessionWalk> walkSessions(Signal signal, reading::StoreReader& reader,
-                                               const ExportPlace& place);
-    reading::Outcome<void> walkOpenSessions(Signal signal, reading::StoreReader& reader,
-                                            const ExportPlace& place, SessionWalk& walk);
+    reading::Outcome<void> collectRows(std::size_t table, reading::StoreReader& reader, Rows rows,
+                                       Batch& batch, const std::function<void(Position)>& pass);
+    reading::Outcome<Contents> contentsOf(const SessionGroup& walk, Wanted wanted,
+                                          reading::StoreReader& reader, double now);
     void addSession(Metrics& metrics, const BookedSession& session,
                     const SessionContents& contents);
     reading::Outcome<void> addSingles(reading::StoreReader& reader, const ExportPlace& place,
@@ -91,7 +105,9 @@ private:
 
     const ExportScope& scope_;
     SessionBook sessions_;
+    SessionWalk walk_;
     LogRecords records_;
+    std::optional<Gathered> gathered_; // for the signal that comes second
     Totals told_;
     Totals telling_;
     // Single messages tell one glitch more than once: those that were counted already.

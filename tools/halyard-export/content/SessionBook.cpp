@@ -28,12 +28,12 @@ const char* sessionColumns(reading::StoreReader& reader) {
 }
 
 BookedSession SessionBook::read(const reading::Row& row) {
-    enum Column : int { kID, kSession, kSessionInfo, kUserInfo, kOpened, kClosed, kEnded };
+    enum Column : int { kID, kSession, kSessionInfo, kUserInfo, kOpened, kClosedAt, kEnded };
     BookedSession session;
     session.row = row.integer(kID);
     session.sessionID = row.maybeInteger(kSession);
     session.opened = row.real(kOpened);
-    session.closed = row.maybeReal(kClosed);
+    session.closed = row.maybeReal(kClosedAt);
     session.ended = row.text(kEnded);
     session.names = reading::namesIn(fields_, row.text(kSessionInfo), row.text(kUserInfo));
     session.userInfo = row.text(kUserInfo);
@@ -48,13 +48,13 @@ const BookedSession* SessionBook::find(reading::StoreReader& reader, std::int64_
         if (known_.size() >= kMostKnown) {
             known_.clear();
         }
-        std::optional<BookedSession> session;
-        (void)reader.forEach({"upload_session", sessionColumns(reader), "", row - 1, row},
-                             [&](const reading::Row& each) {
-                                 session = read(each);
-                                 return false;
+        (void)reader.forEach({"upload_session", sessionColumns(reader), "", row - 1,
+                              row > INT64_MAX - kAhead ? row : row + kAhead - 1},
+                             [this](const reading::Row& each) {
+                                 known_.insert_or_assign(each.integer(0), read(each));
+                                 return true;
                              });
-        found = known_.emplace(row, std::move(session)).first;
+        found = known_.try_emplace(row).first;
     }
     return found->second ? &*found->second : nullptr;
 }

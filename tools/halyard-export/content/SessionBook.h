@@ -38,6 +38,7 @@ public:
     // What it reads of a row, after the id.
     static constexpr const char* kColumns =
         "session_id, session_info, user_info, opened, closed, ended";
+    static constexpr int kClosed = 5; // of them, with the id
     // In a store of version 1.
     static constexpr const char* kColumnsBefore =
         "session_id, session_info, user_info, opened, closed, NULL";
@@ -52,6 +53,8 @@ public:
 
 private:
     static constexpr std::size_t kMostKnown = 4096;
+    // Sessions that are read at a time: messages rise with them.
+    static constexpr std::int64_t kAhead = 8;
 
     const Identity& identity_;
     reading::JsonFields fields_;

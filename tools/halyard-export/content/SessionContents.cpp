@@ -19,8 +19,10 @@ enum Column : int { kID, kSession, kCategory, kType, kTime, kPayload };
 constexpr std::size_t kMostChanges = 512;
 constexpr std::size_t kMostGlitches = 4096;
 constexpr std::size_t kMostStatistics = 64;
-// Of all sessions of a group, so that a group of the worst stays within bounds.
+// Of all sessions of a group, so that a group of the worst stays within bounds: of what
+// traces tell, and of statistics.
 constexpr std::size_t kMostBytes = 8 * 1024 * 1024;
+constexpr std::size_t kMostStatisticsBytes = 4 * 1024 * 1024;
 // A session's last messages are written moments after it was closed, and its first may
 // have been taken before.
 constexpr double kMargin = 10;
@@ -43,25 +45,27 @@ public:
         const auto category = static_cast<std::uint32_t>(row.integer(kCategory));
         const auto type = static_cast<std::uint16_t>(row.integer(kType));
         if (type == kAudioEventTypeIssueDetector) {
-            takeGlitch(contents, row, category);
+            takeGlitch(contents, row);
         } else if (category == kAudioEventCategoryHWReporting) {
-            keep(contents.statistics, kMostStatistics, row, contents.changesLeftOut);
+            const bool fits = contents.statistics.size() < kMostStatistics;
+            keep(contents.statistics, fits, statisticsRoom_, row, contents.statisticsLeftOut);
         } else if (type == kAudioEventTypeActivate && (category == kAudioEventCategoryRouteChange ||
                                                        category == kAudioEventCategoryVolume)) {
-            keep(contents.changes, kMostChanges, row, contents.changesLeftOut);
+            const bool fits = contents.changes.size() < kMostChanges;
+            keep(contents.changes, fits, room_, row, contents.changesLeftOut);
         }
     }
     ContentsOf taken() { return std::move(contents_); }
 
 private:
-    bool hasRoom(std::size_t bytes) {
-        const bool fits = bytes_ + bytes <= kMostBytes;
-        bytes_ += fits ? bytes : 0;
+    static bool takeRoom(std::size_t& room, std::size_t bytes) {
+        const bool fits = bytes <= room;
+        room -= fits ? bytes : 0;
         return fits;
     }
-    void keep(std::vector<TimedPayload>& into, std::size_t most, const Row& row,
-              std::uint64_t& leftOut) {
-        if (into.size() >= most || !hasRoom(row.text(kPayload).size())) {
+    static void keep(std::vector<TimedPayload>& into, bool fits, std::size_t& room, const Row& row,
+                     std::uint64_t& leftOut) {
+        if (!fits || !takeRoom(room, row.text(kPayload).size())) {
             ++leftOut;
             return;
         }
@@ -69,15 +73,15 @@ private:
                         static_cast<std::uint16_t>(row.integer(kType)), row.real(kTime),
                         std::string(row.text(kPayload))});
     }
-    void takeGlitch(SessionContents& contents, const Row& row, std::uint32_t category) {
-        auto glitch = glitchFactsIn(fields_, row.text(kPayload), category, row.real(kTime));
+    void takeGlitch(SessionContents& contents, const Row& row) {
+        auto glitch = glitchFactsIn(fields_, row.text(kPayload), row.real(kTime));
         if (!glitch) {
             return;
         }
         const auto key = std::pair(glitch->start, glitch->node);
         const bool isKnown = contents.glitches.contains(key);
         if (!isKnown && (contents.glitches.size() >= kMostGlitches ||
-                         !hasRoom(glitch->payload.size() + sizeof(GlitchFacts)))) {
+                         !takeRoom(room_, glitch->payload.size() + sizeof(GlitchFacts)))) {
             ++contents.glitchesLeftOut;
             return;
         }
@@ -87,7 +91,8 @@ private:
     const ConsentHistory& consent_;
     ContentsOf contents_;
     reading::JsonFields fields_;
-    std::size_t bytes_ = 0;
+    std::size_t room_ = kMostBytes;
+    std::size_t statisticsRoom_ = kMostStatisticsBytes;
 };
 
 reading::TimeRange rangeOf(const std::vector<BookedSession>& sessions) {
@@ -103,21 +108,32 @@ reading::TimeRange rangeOf(const std::vector<BookedSession>& sessions) {
     return range;
 }
 
+std::string conditionFor(Wanted wanted) {
+    std::string types = fmt::format("type = {}", kAudioEventTypeIssueDetector);
+    if (wanted != Wanted::Statistics) {
+        types += fmt::format(" OR (type = {} AND category IN ({}, {}))", kAudioEventTypeActivate,
+                             kAudioEventCategoryRouteChange, kAudioEventCategoryVolume);
+    }
+    if (wanted != Wanted::Events) {
+        types += fmt::format(" OR category = {}", kAudioEventCategoryHWReporting);
+    }
+    return "upload_session IS NOT NULL AND (" + types + ")";
+}
+
 } // namespace
 
 std::optional<GlitchFacts> glitchFactsIn(reading::JsonFields& fields, std::string_view payload,
-                                         std::uint32_t category, double told) {
+                                         double told) {
     if (!fields.parse(payload)) {
         return std::nullopt;
     }
     GlitchFacts glitch;
     glitch.start = fields.number("glitch_start").value_or(told);
     glitch.node = fields.text("node").value_or("");
-    glitch.cause = fields.text("issue_type").value_or("unknown");
-    glitch.seconds = fields.number("any_channel_silence_seconds");
+    glitch.cause = fields.text(kGlitchCause).value_or("unknown");
+    glitch.seconds = fields.number(kGlitchSeconds);
     glitch.told = told;
     glitch.payload = payload;
-    glitch.category = category;
     return glitch;
 }
 
@@ -131,20 +147,14 @@ Outcome<ContentsOf> gatherContents(reading::StoreReader& reader,
     if (!ids.ok()) {
         return ids.failure();
     }
-    const std::string changes =
-        fmt::format(" OR (type = {} AND category IN ({}, {}))", kAudioEventTypeActivate,
-                    kAudioEventCategoryRouteChange, kAudioEventCategoryVolume);
-    const std::string statistics = fmt::format(" OR category = {}", kAudioEventCategoryHWReporting);
     Gatherer gatherer(sessions, consent);
-    const auto done = reader.forEach(
-        {"upload_message", "upload_session, category, type, time, payload",
-         fmt::format("upload_session IS NOT NULL AND (type = {}{})", kAudioEventTypeIssueDetector,
-                     wanted == Wanted::Events ? changes : statistics),
-         ids.value().after, ids.value().upTo},
-        [&gatherer](const Row& row) {
-            gatherer.take(row);
-            return true;
-        });
+    const auto done =
+        reader.forEach({"upload_message", "upload_session, category, type, time, payload",
+                        conditionFor(wanted), ids.value().after, ids.value().upTo},
+                       [&gatherer](const Row& row) {
+                           gatherer.take(row);
+                           return true;
+                       });
     return done.ok() ? Outcome<ContentsOf>(gatherer.taken()) : done.failure();
 }
 

@@ -20,6 +20,10 @@
 
 namespace halyard::exporting {
 
+// Keys of a message that tells of a glitch.
+inline constexpr const char* kGlitchCause = "issue_type";
+inline constexpr const char* kGlitchSeconds = "any_channel_silence_seconds";
+
 struct GlitchFacts {
     double start = 0;
     std::string node;
@@ -27,7 +31,6 @@ struct GlitchFacts {
     std::optional<double> seconds;
     double told = 0;
     std::string payload; // of the last message that told it
-    std::uint32_t category = 0;
 };
 
 struct TimedPayload {
@@ -44,10 +47,11 @@ struct SessionContents {
     std::vector<TimedPayload> statistics; // of drivers
     std::uint64_t changesLeftOut = 0;
     std::uint64_t glitchesLeftOut = 0;
+    std::uint64_t statisticsLeftOut = 0;
 };
 
-// Which of it is wanted.
-enum class Wanted : std::uint8_t { Events, Statistics };
+// Which of it is wanted, beside the glitches.
+enum class Wanted : std::uint8_t { Events, Statistics, Both };
 
 // By the session's row. Messages from a time without consent are not looked at.
 using ContentsOf = std::unordered_map<std::int64_t, SessionContents>;
@@ -57,6 +61,6 @@ reading::Outcome<ContentsOf> gatherContents(reading::StoreReader& reader,
 
 // None when the payload tells of no glitch.
 std::optional<GlitchFacts> glitchFactsIn(reading::JsonFields& fields, std::string_view payload,
-                                         std::uint32_t category, double told);
+                                         double told);
 
 } // namespace halyard::exporting

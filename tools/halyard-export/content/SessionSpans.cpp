@@ -16,6 +16,15 @@ constexpr std::string_view kFrameworkKeys = "kRelay";
 constexpr const char* kPid = "application_pid";
 constexpr const char* kBinary = "application_binary";
 
+// What only says when a message was made, and what repeats its event's name. The log record of
+// the same message has them.
+constexpr std::string_view kStamps[] = {"hyreporting_timestamp", "systemuptime_sec",
+                                        "processuptime_ms", "audiotag"};
+
+bool isStamp(std::string_view key) {
+    return std::find(std::begin(kStamps), std::end(kStamps), key) != std::end(kStamps);
+}
+
 void addID(Writer& span, Tag tag, std::string_view id) {
     span.add_bytes(tag, id.data(), id.size());
 }
@@ -99,27 +108,37 @@ void SessionSpans::addProcess(const BookedSession& session) {
 
 void SessionSpans::addPayload(std::string& bytes, Tag tag, std::string_view payload) {
     attributes_.clear();
-    payload_.add(attributes_, tag, payload);
+    payload_.add(attributes_, tag, payload, isStamp);
     bytes.append(attributes_.texts).append(attributes_.numbers);
 }
 
 void SessionSpans::addEvents(Writer& span, const SessionContents& contents) {
     std::string event;
-    const auto addEvent = [&](double time, std::string_view name, std::string_view payload) {
+    const auto begin = [&event](double time, std::string_view name) {
         event.clear();
         Writer writer(event);
-        writer.add_fixed64(span::kEventTime, nanoseconds(time));
         writer.add_string(span::kEventName, name.data(), name.size());
-        addPayload(event, span::kEventAttributes, payload);
-        span.add_message(span::kEvents, event);
+        writer.add_fixed64(span::kEventTime, nanoseconds(time));
     };
     for (const TimedPayload& change : contents.changes) {
-        addEvent(change.time,
-                 change.category == kAudioEventCategoryVolume ? "halyard.volume" : "halyard.route",
-                 change.payload);
+        begin(change.time,
+              change.category == kAudioEventCategoryVolume ? "halyard.volume" : "halyard.route");
+        addPayload(event, span::kEventAttributes, change.payload);
+        span.add_message(span::kEvents, event);
     }
     for (const auto& [key, glitch] : contents.glitches) {
-        addEvent(glitch.start, "halyard.glitch", glitch.payload);
+        begin(glitch.start, "halyard.glitch");
+        addGlitch(event, glitch);
+        span.add_message(span::kEvents, event);
+    }
+}
+
+// Its cause and length; the child span has the rest.
+void SessionSpans::addGlitch(std::string& event, const GlitchFacts& glitch) {
+    payload_.addText(event, span::kEventAttributes, kGlitchCause, glitch.cause);
+    if (glitch.seconds && !omission_.omits(kGlitchSeconds)) {
+        appendAttribute(event, span::kEventAttributes, kPrefix, kGlitchSeconds,
+                        AnyValue::ofReal(*glitch.seconds));
     }
 }
 

@@ -24,6 +24,7 @@ public:
 
 private:
     void addEvents(otlp::Writer& span, const SessionContents& contents);
+    void addGlitch(std::string& event, const GlitchFacts& glitch);
     void addFacts(std::string& bytes, const BookedSession& session);
     void addProcess(const BookedSession& session);
     void addPayload(std::string& bytes, otlp::Tag tag, std::string_view payload);

@@ -19,9 +19,13 @@ using reading::Trouble;
 
 constexpr int kSchema = 1;
 constexpr int kBusyMilliseconds = 2000;
+// Of all tables of a signal.
+constexpr std::int64_t kMostLate = 64;
 constexpr const char* kTables =
     "CREATE TABLE IF NOT EXISTS place(signal TEXT, source TEXT, id INTEGER, time REAL,"
     " PRIMARY KEY(signal, source)) WITHOUT ROWID;"
+    "CREATE TABLE IF NOT EXISTS late(signal TEXT, source TEXT, before INTEGER, id INTEGER,"
+    " time REAL, PRIMARY KEY(signal, source, before)) WITHOUT ROWID;"
     "CREATE TABLE IF NOT EXISTS open_session(signal TEXT, id INTEGER, PRIMARY KEY(signal, id))"
     " WITHOUT ROWID;"
     "CREATE TABLE IF NOT EXISTS loss(signal TEXT, reason INTEGER, count INTEGER,"
@@ -172,7 +176,8 @@ Outcome<void> ExportPlace::follow(const std::string& device) {
     if (fact("device") == device) {
         return {};
     }
-    const auto begun = execute("BEGIN IMMEDIATE; DELETE FROM place; DELETE FROM open_session");
+    const auto begun = execute("BEGIN IMMEDIATE; DELETE FROM place; DELETE FROM late; "
+                               "DELETE FROM open_session");
     const bool isNoted = begun.ok() && setFact("device", device);
     const auto ended = execute(isNoted ? "COMMIT" : "ROLLBACK");
     return isNoted ? ended : trouble();
@@ -190,12 +195,26 @@ Position ExportPlace::positionOf(Signal signal, const std::string& table) const 
                                           : Position{};
 }
 
-std::vector<std::int64_t> ExportPlace::openSessions(Signal signal, std::size_t most) const {
+std::vector<LateRows> ExportPlace::lateRows(Signal signal, const std::string& table) const {
+    std::vector<LateRows> all;
+    StoreStatement statement;
+    if (statement.prepare(database_.get(), "SELECT id, time, before FROM late WHERE signal = ? "
+                                           "AND source = ? ORDER BY before") == SQLITE_OK) {
+        statement.bindFrom(1, nameOf(signal), std::string_view(table));
+        while (statement.step() == SQLITE_ROW) {
+            all.push_back({{statement.integer(0), statement.real(1)}, statement.integer(2)});
+        }
+    }
+    return all;
+}
+
+std::vector<std::int64_t> ExportPlace::openSessions(Signal signal, std::int64_t after,
+                                                    std::size_t most) const {
     std::vector<std::int64_t> rows;
     StoreStatement statement;
-    if (statement.prepare(database_.get(), "SELECT id FROM open_session WHERE signal = ? "
-                                           "ORDER BY id LIMIT ?") == SQLITE_OK) {
-        statement.bindFrom(1, nameOf(signal), static_cast<std::int64_t>(most));
+    if (statement.prepare(database_.get(), "SELECT id FROM open_session WHERE signal = ? AND "
+                                           "id > ? ORDER BY id LIMIT ?") == SQLITE_OK) {
+        statement.bindFrom(1, nameOf(signal), after, static_cast<std::int64_t>(most));
         while (statement.step() == SQLITE_ROW) {
             rows.push_back(statement.integer(0));
         }
@@ -228,6 +247,17 @@ Outcome<void> ExportPlace::write(Signal signal, const PlaceChange& change, doubl
     for (const auto& [table, position] : change.positions) {
         isGood = isGood && run("INSERT OR REPLACE INTO place VALUES(?, ?, ?, ?)",
                                std::string_view(table), position.id, position.time);
+    }
+    for (const auto& [where, position] : change.late) {
+        isGood =
+            isGood && run("INSERT OR REPLACE INTO late VALUES(?, ?, ?, ?, ?)",
+                          std::string_view(where.first), where.second, position.id, position.time);
+    }
+    if (isGood && !change.late.empty()) {
+        // Ids leap at each start that still has something to save: not without end.
+        isGood = run("DELETE FROM late WHERE signal = ?1 AND (source, before) NOT IN (SELECT "
+                     "source, before FROM late WHERE signal = ?1 ORDER BY before DESC LIMIT ?2)",
+                     kMostLate);
     }
     for (const std::int64_t id : change.opened) {
         isGood = isGood && run("INSERT OR REPLACE INTO open_session VALUES(?, ?)", id);

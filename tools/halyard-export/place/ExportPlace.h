@@ -23,6 +23,7 @@ namespace halyard::exporting {
 
 enum class Signal : std::uint8_t { Logs, Metrics, Traces };
 inline constexpr std::array<std::string_view, 3> kSignalNames = {"logs", "metrics", "traces"};
+inline constexpr std::size_t kSignals = kSignalNames.size();
 inline std::string_view nameOf(Signal signal) {
     return kSignalNames[static_cast<std::size_t>(signal)];
 }
@@ -33,6 +34,13 @@ struct Position {
     double time = 0;
 
     bool operator==(const Position&) const = default;
+};
+
+// Rows that may come yet between others that were passed: the daemon leaves room for what it
+// may still save from a damaged file. Those up to `after` have come.
+struct LateRows {
+    Position after;
+    std::int64_t before = 0;
 };
 
 // Why something did not arrive.
@@ -52,6 +60,7 @@ inline bool isLost(Loss loss) {
 // What changes together.
 struct PlaceChange {
     std::map<std::string, Position> positions;
+    std::map<std::pair<std::string, std::int64_t>, Position> late; // by table and LateRows::before
     std::vector<std::int64_t> opened; // sessions that are not closed yet
     std::vector<std::int64_t> done;   // of those that were open
     std::map<Loss, std::uint64_t> losses;
@@ -59,8 +68,8 @@ struct PlaceChange {
     std::uint64_t records = 0;
 
     bool isNothing() const {
-        return positions.empty() && opened.empty() && done.empty() && losses.empty() &&
-               bytesSent == 0;
+        return positions.empty() && late.empty() && opened.empty() && done.empty() &&
+               losses.empty() && bytesSent == 0;
     }
 };
 
@@ -89,8 +98,11 @@ public:
     reading::Outcome<void> follow(const std::string& device);
 
     Position positionOf(Signal signal, const std::string& table) const;
+    // Those of a table, by rising rows.
+    std::vector<LateRows> lateRows(Signal signal, const std::string& table) const;
     // Open sessions that were passed, by rising rows.
-    std::vector<std::int64_t> openSessions(Signal signal, std::size_t most) const;
+    std::vector<std::int64_t> openSessions(Signal signal, std::int64_t after,
+                                           std::size_t most) const;
 
     // The day of `now` is what bytesSent counts for.
     reading::Outcome<void> commit(Signal signal, const PlaceChange& change, double now);
