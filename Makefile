@@ -78,8 +78,8 @@ pictures: run
 test: deps
 	cmake --preset test
 	cmake --build --preset test --parallel $(JOBS)
-	scripts/fetch-axe.sh build/test/axe
-	scripts/fetch-otlp.sh build/test/otlp
+	scripts/fetch-npm.sh tests/report build/test/axe
+	scripts/fetch-npm.sh tests/otlp build/test/otlp
 	$(CTEST) --preset test $(CTEST_FLAGS)
 
 torture: deps
@@ -94,8 +94,8 @@ check: deps
 		wrapper=; case $$preset in *-tsan) wrapper="$(FIXED_ADDRESSES)";; esac; \
 		cmake --preset $$preset; \
 		$$wrapper cmake --build --preset $$preset --parallel $(JOBS); \
-		scripts/fetch-axe.sh build/$$preset/axe; \
-		scripts/fetch-otlp.sh build/$$preset/otlp; \
+		scripts/fetch-npm.sh tests/report build/$$preset/axe; \
+		scripts/fetch-npm.sh tests/otlp build/$$preset/otlp; \
 		$$wrapper $(CTEST) --preset $$preset $(CTEST_FLAGS); \
 	done
 	$(MAKE) fuzz
