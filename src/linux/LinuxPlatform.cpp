@@ -13,6 +13,7 @@
 #include "linux/queues/BlockingSection.h"
 #include "linux/system/CollectedFiles.h"
 #include "linux/system/PrivateFiles.h"
+#include "platform/HYReportingUtilityDevice.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {
@@ -187,6 +188,9 @@ Result<void> LinuxPlatform::open(platform::ListenerDelegate* delegate) {
         std::make_unique<SocketListener>(context_, pressure_, listening.value(),
                                          [this](const Peer& peer) { return rightsOfPeer(peer); });
     listener_->setDelegate(delegate);
+    if (HYReportingUtilityIsInternalBuild()) {
+        listener_->keepThread(); // Sessions write a file when they end.
+    }
     removeUnfinished(directories_.state, directories_.logs); // Nobody else runs here.
     listener_->setLimits(configuration_.configuration.settings()->clients);
     listener_->onClientRelieved([this] { queues_->clientRelieved(); });

@@ -114,14 +114,16 @@ class NotOpened(unittest.TestCase):
         self.assertEqual(len(aside), 1)
 
 
-class OnAFaultyDisk(unittest.TestCase):
+class FaultyDiskTest(unittest.TestCase):
     """A disk that answers late, with errors, or not at all."""
+
+    configuration = ""
 
     def setUp(self):
         library = os.environ.get("FAULTY_DISK_LIBRARY", "")
         if not os.path.exists(library):
             self.skipTest("FAULTY_DISK_LIBRARY names no library")
-        self.daemon = Daemon()
+        self.daemon = Daemon(self.configuration)
         self.addCleanup(self.daemon.remove)
         self.disk = FaultyDisk(library, self.daemon.path("disk"))
         self.daemon.start(extra=self.disk.environment())
@@ -141,6 +143,8 @@ class OnAFaultyDisk(unittest.TestCase):
     def messages(self):
         return self.daemon.rows("SELECT count(*) FROM upload_message WHERE category = 4")[0][0]
 
+
+class OnAFaultyDisk(FaultyDiskTest):
     def test_a_hang_is_told_and_so_is_what_it_costs(self):
         self.send()
         self.client.result("admin.flush")
@@ -204,6 +208,19 @@ class OnAFaultyDisk(unittest.TestCase):
         self.daemon.wait_for(lambda: "what was in it is kept" in self.daemon.log())
         self.daemon.kill()
         self.assertEqual(self.messages(), self.sent)
+
+
+class AnInternalBuild(FaultyDiskTest):
+    configuration = "[device_properties]\nInternalBuild = true\n"
+
+    def test_ends_though_a_session_writes_its_file_to_a_disk_that_hangs(self):
+        self.send()
+        self.client.result("admin.flush")
+        syncs = self.disk.syncs()
+        self.disk.tell("hang")
+        self.client.start("stopReportingSessionForID", 1)
+        self.daemon.wait_for(lambda: self.disk.syncs() > syncs)
+        self.assertEqual(self.daemon.terminate(), 0)
 
 
 if __name__ == "__main__":

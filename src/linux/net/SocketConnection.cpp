@@ -277,8 +277,9 @@ void SocketConnection::chargePending() {
 std::size_t SocketConnection::takeFrames(std::string_view stream) {
     const auto charge = std::make_shared<ReadCharge>(shared_from_this());
     const ChargeScope scope(charge);
-    WakeUpScope wakeUps(stream.size() <= kFewBytes ? WakeUpScope::Thread::Lent
-                                                   : WakeUpScope::Thread::Kept);
+    WakeUpScope wakeUps(shared_.lendsThread && stream.size() <= kFewBytes
+                            ? WakeUpScope::Thread::Lent
+                            : WakeUpScope::Thread::Kept);
     std::size_t taken = 0;
     framesWait_ = false;
     while (taken < stream.size() && !ended_) {

@@ -58,6 +58,7 @@ struct ListenerShared {
 
     Pressure& pressure;
     asio::io_context& context;
+    bool lendsThread = true;                   // for what single requests lead to
     const SocketConnection* reading = nullptr; // the one whose requests are being taken
     std::string buffer;
     protocol::CallDecoder decoder;

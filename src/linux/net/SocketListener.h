@@ -58,6 +58,9 @@ public:
 
     // Any thread. What one client process may make the daemon keep.
     void setLimits(const platform::ClientLimits& limits) { budgets_.setLimits(limits); }
+    // What requests lead to may wait for a disk, so that this thread, which sees to signals
+    // as well, is not lent for it.
+    void keepThread() { shared_.lendsThread = false; }
     // Called on any thread when a client whose work had piled up may go on; it is read
     // from again by itself.
     void onClientRelieved(std::function<void()> relieved);
