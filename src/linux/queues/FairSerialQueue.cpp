@@ -101,9 +101,12 @@ void FairSerialQueue::clientRelieved() {
 }
 
 bool FairSerialQueue::isNextBehindLocked() const {
-    return !behind_.empty() && std::all_of(lanes_.begin(), lanes_.end(), [this](const auto& each) {
-        return each.second->items.empty() ||
-               each.second->items.front().number > behind_.front().number;
+    if (behind_.empty()) {
+        return false;
+    }
+    const std::uint64_t number = behind_.front().number;
+    return std::all_of(lanes_.begin(), lanes_.end(), [number](const auto& each) {
+        return each.second->items.empty() || each.second->items.front().number > number;
     });
 }
 
