@@ -264,7 +264,10 @@ void LinuxPlatform::armWatchdog() {
     });
 }
 
+// Who waits for an answer waits for this thread as for the service queue's. Those that are
+// there already keep their own priority.
 void LinuxPlatform::serve() {
+    applyPriority(platform::QueuePriority::UserInteractive);
     armWatchdog();
     ::sd_notify(0, "READY=1");
     listener_->resume();

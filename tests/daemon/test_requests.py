@@ -1,6 +1,7 @@
 """The eleven requests, as python3-msgpack sends them."""
 
 import json
+import pathlib
 import unittest
 
 import msgpack
@@ -206,6 +207,14 @@ class Requests(DaemonTest):
         messages = [json.loads(row[0]) for row in rows]
         self.assertEqual([each["n"] for each in messages if "n" in each], list(range(101)))
         self.assertEqual([each for each in messages if "single" in each], [{"single": True}])
+
+    def test_who_reads_has_the_priority_of_who_serves(self):
+        self.connect().result("getAllReporters")
+        nice = {}
+        for task in pathlib.Path(f"/proc/{self.daemon.process.pid}/task").iterdir():
+            name, facts = (task / "stat").read_text().split("(", 1)[1].rsplit(")", 1)
+            nice[name] = int(facts.split()[16])
+        self.assertEqual(nice["halyardd"], nice["hy-service"])
 
     def test_sigterm_delivers_commits_and_exits_0(self):
         client = self.connect()

@@ -16,6 +16,14 @@ constexpr int kInteractiveNice = -10;
 constexpr int kUtilityNice = 5;
 constexpr std::chrono::milliseconds kMeetingLimit{20};
 
+void blockSignals() {
+    sigset_t all;
+    sigfillset(&all);
+    pthread_sigmask(SIG_BLOCK, &all, nullptr);
+}
+
+} // namespace
+
 // Best effort: without the right to raise it, the default priority stays.
 void applyPriority(platform::QueuePriority priority) {
     switch (priority) {
@@ -32,14 +40,6 @@ void applyPriority(platform::QueuePriority priority) {
     }
     }
 }
-
-void blockSignals() {
-    sigset_t all;
-    sigfillset(&all);
-    pthread_sigmask(SIG_BLOCK, &all, nullptr);
-}
-
-} // namespace
 
 Worker::Worker(std::string name, int threads, platform::QueuePriority priority)
     : name_(std::move(name)), context_(threads), guard_(context_.get_executor()) {

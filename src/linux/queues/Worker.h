@@ -14,6 +14,9 @@
 
 namespace halyard::linux_ {
 
+// Of the calling thread, as far as the system lets us.
+void applyPriority(platform::QueuePriority priority);
+
 class Worker {
 public:
     // `priority` is applied as far as the system lets us.
