@@ -357,6 +357,7 @@ TEST_F(StoreFailureTest, ASessionOpenedWhileNothingWasTakenGetsItsRowWithItsFirs
 TEST_F(StoreFailureTest, AReaderThatNeverEndsCannotGrowTheLogWithoutBound) {
     options_.limits.maxBytes = 1024 * 1024;
     options_.groupRows = 64; // Half a megabyte.
+    options_.mostGroups = 1;
     open();
     addSingles(1, {});
     flush();

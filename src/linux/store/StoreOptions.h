@@ -24,6 +24,8 @@ struct StoreOptions {
     // first of fewer came. A slow disk gets larger ones, and so does one that is to be
     // written to more seldom than kPromptInterval.
     std::size_t groupRows = 1024;
+    // So many groups become one where they wait for it: that writes less, and syncs once.
+    std::size_t mostGroups = 4;
     std::size_t patientRows = 6144;
     // Few rows at a time write less with smaller pages. Of a new file.
     int patientPageBytes = 4096;

@@ -52,16 +52,6 @@ int pageBytes(const StoreOptions& options) {
 
 } // namespace
 
-// While rows wait as long as the operator asks, they must not hold anybody back: a group
-// is ready below the low mark.
-StoreQueue::Window storeWindow(const StoreOptions& options, const StoreLimits& limits) {
-    if (limits.syncInterval <= kPromptInterval) {
-        return {limits.syncInterval, options.groupRows, options.marks.lowBytes};
-    }
-    return {limits.syncInterval, std::max(options.groupRows, options.patientRows),
-            options.marks.lowBytes};
-}
-
 StoreWriter::StoreWriter(const StoreOptions& options, const platform::Clock& clock,
                          std::shared_ptr<StoreQueue> queue, std::function<void()> onWork)
     : options_(options), clock_(clock), queue_(std::move(queue)),
@@ -134,11 +124,12 @@ std::chrono::nanoseconds StoreWriter::idleDelay() const {
     return std::min(idle, keeper_.untilRereading().value_or(idle));
 }
 
-// A disk that takes long for each commit gets fewer and larger ones, so that what has
-// been taken is through in about the time of two.
+// What has piled up is written in fewer and larger groups; all at once on a disk that takes
+// long for each commit, so that what has been taken is through in about the time of two.
 void StoreWriter::writeTaken() {
     for (std::size_t from = 0; from < taken_.size();) {
-        std::size_t rows = storeWindow(options_, limits()).rows;
+        std::size_t rows = std::max(storeWindow(options_, limits()).rows,
+                                    options_.groupRows * options_.mostGroups);
         rows = commitTime_ > kSlowCommit ? taken_.size() : rows;
         rows = std::min(rows, taken_.size() - from);
         writeGroup(std::span(taken_).subspan(from, rows));

@@ -1,10 +1,21 @@
 // What of StoreWriter counts rows and tells of them.
+#include <algorithm>
 #include <utility>
 
 #include "linux/store/StoreWriter.h"
 #include "platform/Log.h"
 
 namespace halyard::linux_ {
+
+// While rows wait as long as the operator asks, they must not hold anybody back: a group
+// is ready below the low mark.
+StoreQueue::Window storeWindow(const StoreOptions& options, const StoreLimits& limits) {
+    if (limits.syncInterval <= kPromptInterval) {
+        return {limits.syncInterval, options.groupRows, options.marks.lowBytes};
+    }
+    return {limits.syncInterval, std::max(options.groupRows, options.patientRows),
+            options.marks.lowBytes};
+}
 
 void StoreWriter::settle(std::span<StoreItem> group) {
     {

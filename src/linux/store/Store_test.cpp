@@ -178,6 +178,7 @@ TEST_F(StoreTest, ClosingStoresWhatIsWaitingAndLeavesOneFile) {
 TEST_F(StoreTest, CommitsAtTheGroupsSizeAndNotBefore) {
     std::promise<void> full;
     options_.groupRows = 4;
+    options_.mostGroups = 1;
     open();
     addSingles(3, {});
     EXPECT_EQ(store_->status().commits, 0U);
@@ -189,6 +190,25 @@ TEST_F(StoreTest, CommitsAtTheGroupsSizeAndNotBefore) {
     addSingles(5, {});        // one group and one row more
     flush();
     EXPECT_EQ(store_->status().commits, 3U);
+}
+
+TEST_F(StoreTest, GroupsThatWaitForTheWriterBecomeOneUpToABound) {
+    std::promise<void> begun;
+    std::promise<void> hold;
+    options_.groupRows = 4;
+    options_.mostGroups = 3;
+    open();
+    addSingles(3, {});
+    store_->addAnalyticsEvent("held", [&] {
+        begun.set_value();
+        hold.get_future().wait();
+        return Dictionary();
+    });
+    begun.get_future().wait();
+    addSingles(13, {});
+    hold.set_value();
+    flush();
+    EXPECT_EQ(store_->status().commits, 3U); // of 4, 12 and 1 rows
 }
 
 TEST_F(StoreTest, CommitsAfterTheDelayToo) {
