@@ -316,7 +316,9 @@ void LinuxPlatform::stopReading() {
 
 void LinuxPlatform::finishShutdown(bool inTime) {
     if (!inTime) {
-        HY_LOG_ERROR(HYReportingPlatformCategory, "stopping with work left undone");
+        HY_LOG_ERROR(HYReportingPlatformCategory,
+                     "stopping with work left undone: {} requests were not looked at",
+                     queues_->waitingRequests());
     }
     context_.stop();
 }

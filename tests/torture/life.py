@@ -16,6 +16,7 @@ from hands import FORK, SUFFIXES, Hands, start
 
 WHO = re.compile(r'"who":"([^"]+)","n":(\d+)')
 SHEET = re.compile(r"messages since the start: (\{.*\})")
+UNDONE = re.compile(r"stopping with work left undone: (\d+) requests were not looked at")
 # What an orderly end may take: 10 s for the disk and 5 for the clients, and a busy machine.
 END = 30
 # How long memory, threads and descriptors may take to come back.
@@ -394,6 +395,7 @@ class LifeRun:
         """How many messages the daemon says it could not keep, or did not upload."""
         # What waits at the end, on a disk that hangs, is lost and told.
         lost = self.sheet["lost"] + self.sheet["waiting"] if self.sheet else 0
+        lost += sum(int(count) for count in UNDONE.findall(self.daemon.log()))
         messages = self.sheet or {}
         if self.sheet is None and self.statuses:
             status = self.statuses[-1][2]

@@ -100,6 +100,15 @@ void FairSerialQueue::clientRelieved() {
     scheduleLocked();
 }
 
+std::size_t FairSerialQueue::waitingTasks() const {
+    const MutexLock lock(mutex_);
+    std::size_t tasks = 0;
+    for (const auto& [key, lane] : lanes_) {
+        tasks += lane->client != nullptr ? lane->items.size() : 0;
+    }
+    return tasks;
+}
+
 bool FairSerialQueue::isNextBehindLocked() const {
     if (behind_.empty()) {
         return false;

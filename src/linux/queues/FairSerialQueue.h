@@ -50,6 +50,9 @@ public:
 
     void clientRelieved() HY_EXCLUDES(mutex_);
 
+    // How many tasks of clients wait for their turn, also those of clients held back.
+    std::size_t waitingTasks() const HY_EXCLUDES(mutex_);
+
 private:
     struct Item {
         platform::Task task;

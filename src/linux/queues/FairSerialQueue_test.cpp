@@ -137,6 +137,20 @@ TEST_F(FairSerialQueueTest, ASuspendedQueueRunsNothingBeforeItIsResumed) {
     EXPECT_THAT(std::vector(ran_.begin(), ran_.begin() + 2), ElementsAre("suspends", "first"));
 }
 
+TEST_F(FairSerialQueueTest, WhatWaitsIsCountedAlsoOfAClientThatIsHeldBack) {
+    one_->setReliefHandler([this] { queue_->clientRelieved(); });
+    one_->begin(ClientBudget::Work::Rows, std::size_t{1} << 30);
+    submit(one_, note("one"));
+    submit(one_, note("another"));
+    std::promise<void> ran;
+    submit(two_, [&] { ran.set_value(); });
+    ran.get_future().wait();
+    EXPECT_EQ(queue_->waitingTasks(), 2U);
+    one_->end(ClientBudget::Work::Rows, 1, std::size_t{1} << 30);
+    waitUntilAllHasRun();
+    EXPECT_EQ(queue_->waitingTasks(), 0U);
+}
+
 TEST_F(FairSerialQueueTest, ALentThreadRunsWhatItSubmits) {
     {
         const WakeUpScope scope(WakeUpScope::Thread::Lent);

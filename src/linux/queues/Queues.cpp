@@ -113,6 +113,11 @@ void Queues::onServiceQueue(platform::Task task) {
     }
 }
 
+std::size_t Queues::waitingRequests() {
+    const auto service = serviceQueue();
+    return service != nullptr ? service->waitingTasks() : 0;
+}
+
 void Queues::clientRelieved() {
     if (const auto service = serviceQueue()) {
         service->clientRelieved();

@@ -52,6 +52,8 @@ public:
     void onEachThread(const platform::Task& task);
 
     std::size_t delayedTasks() const { return delayedCount_.load(); }
+    // What clients asked for and the service queue has not come to.
+    std::size_t waitingRequests() HY_EXCLUDES(mutex_);
     void stop();
 
 private:
