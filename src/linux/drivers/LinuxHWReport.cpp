@@ -177,31 +177,23 @@ std::vector<Reading> LinuxHWReport::readConfigured(const ChannelList& list,
 platform::HWReportResult<platform::HWReportSamplesRef>
 LinuxHWReport::createSamples(platform::HWReportSubscription* subscription,
                              const platform::HWReportChannels* channels) {
-    auto* const own = dynamic_cast<Subscription*>(subscription);
+    const auto* const own = dynamic_cast<const Subscription*>(subscription);
     if (own == nullptr || own->list.get() != channels) {
         return {nullptr, kInvalid};
     }
     const platform::SteadyTime now = clock_.steadyTime();
-    if (own->latest == nullptr || now - own->latest->time() >= kCurrent) {
-        own->latest = read(own->list, now);
-    }
-    return {own->latest, std::nullopt};
-}
-
-std::shared_ptr<const SampleSet> LinuxHWReport::read(const ChannelListRef& list,
-                                                     platform::SteadyTime now) {
-    auto configured = readConfigured(*list, now);
-    auto samples = std::make_shared<SampleSet>(list, now);
+    auto configured = readConfigured(*own->list, now);
+    auto samples = std::make_shared<SampleSet>(own->list, now);
     std::size_t next = 0;
-    for (const std::size_t place : list->places) {
+    for (const std::size_t place : own->list->places) {
         Channel& channel = channels_[place];
         const Reading reading =
             channel.configured ? std::move(configured[next++]) : channel.source->read(now);
         noteChange(*channel.facts, channel.failing, reading.status != ReadStatus::Read, reading);
         samples->add(reading);
     }
-    sampleCycles(*list, now, *samples);
-    return samples;
+    sampleCycles(*own->list, now, *samples);
+    return {samples, std::nullopt};
 }
 
 void LinuxHWReport::sampleCycles(const ChannelList& list, platform::SteadyTime now,

@@ -31,10 +31,6 @@ namespace halyard::linux_ {
 
 class LinuxHWReport final : public platform::HWReport {
 public:
-    // What was read so lately is what there is: sessions that begin and end one after the
-    // other need not have everything read for each of them.
-    static constexpr std::chrono::milliseconds kCurrent{1};
-
     struct Options {
         std::filesystem::path root = "/"; // of every source
         std::chrono::milliseconds patience{500};
@@ -77,13 +73,11 @@ private:
     };
     struct Subscription final : platform::HWReportSubscription {
         ChannelListRef list;
-        std::shared_ptr<const SampleSet> latest; // null before the first
     };
 
     void add(const DriverChannel& names, bool configured);
     void addCycles(const Options& options);
     bool hasChannel(const DriverChannel& names) const;
-    std::shared_ptr<const SampleSet> read(const ChannelListRef& list, platform::SteadyTime now);
     void sampleCycles(const ChannelList& list, platform::SteadyTime now, SampleSet& samples);
     std::vector<Reading> readConfigured(const ChannelList& list, platform::SteadyTime now);
 

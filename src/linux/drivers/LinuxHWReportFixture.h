@@ -33,12 +33,7 @@ protected:
         const Listing listed = library_->copyChannelsInGroup(group, std::nullopt);
         subscribed_ = library_->createSubscription(*listed.value);
     }
-    // Once what was read before is not current any more.
     platform::HWReportSamplesRef sample() {
-        platform_.clock.advance(LinuxHWReport::kCurrent);
-        return sampleAgain();
-    }
-    platform::HWReportSamplesRef sampleAgain() {
         auto result = library_->createSamples(subscribed_.subscription, subscribed_.channels.get());
         EXPECT_FALSE(result.error);
         return result.value;

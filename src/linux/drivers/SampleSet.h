@@ -54,7 +54,6 @@ public:
     void iterate(const std::function<int(const platform::HWReportChannel&)>& callback) const;
 
     const ChannelListRef& list() const { return list_; }
-    platform::SteadyTime time() const { return time_; }
     // In bytes, contents included.
     std::size_t footprint() const;
 
