@@ -1,8 +1,8 @@
 #include "linux/system/CollectedFiles.h"
 
 #include <fmt/format.h>
-#include <regex>
 #include <string>
+#include <string_view>
 #include <system_error>
 #include <vector>
 
@@ -48,12 +48,26 @@ Result<void> removeAll(const std::vector<fs::path>& paths) {
     return result;
 }
 
+bool isNumber(std::string_view text) {
+    return !text.empty() && text.find_first_not_of("0123456789") == std::string_view::npos;
+}
+
 // ".name.PID-N", see AtomicFile.
+bool isTemporaryName(std::string_view name) {
+    const std::size_t dot = name.rfind('.');
+    if (!name.starts_with('.') || dot < 2) {
+        return false;
+    }
+    const std::string_view numbers = name.substr(dot + 1);
+    const std::size_t dash = numbers.find('-');
+    return dash != std::string_view::npos && isNumber(numbers.substr(0, dash)) &&
+           isNumber(numbers.substr(dash + 1));
+}
+
 bool isTemporary(const fs::directory_entry& entry) {
-    static const std::regex form(R"(\..+\.[0-9]+-[0-9]+)");
     std::error_code ignored;
     return entry.symlink_status(ignored).type() == fs::file_type::regular &&
-           std::regex_match(entry.path().filename().string(), form);
+           isTemporaryName(entry.path().filename().native());
 }
 
 void removeTemporaries(const fs::path& tree) {
