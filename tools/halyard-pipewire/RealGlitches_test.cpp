@@ -115,7 +115,8 @@ protected:
         EXPECT_LE(told_.start(),
                   realSeconds(disturbance_.realtimeBefore + most - least) + 1.2 * cycle);
         EXPECT_GE(cycles, std::floor(realSeconds(least) / cycle) - 1) << graph_->notes();
-        EXPECT_LE(cycles, std::floor(realSeconds(most) / cycle) + 1) << graph_->notes();
+        // Who is let go on does so when the machine comes to it.
+        EXPECT_LE(cycles, std::floor(realSeconds(most) / cycle) + 3) << graph_->notes();
         EXPECT_NEAR(told_.silence(), cycles * cycle, 1e-6);
         EXPECT_NEAR(told_.contents.get<double>("glitch_quantum_seconds"), cycle, 1e-8);
         EXPECT_EQ(told_.contents.get<std::int64_t>("glitch_inferred"), 0);
