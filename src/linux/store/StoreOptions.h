@@ -28,7 +28,7 @@ struct StoreOptions {
     std::size_t mostGroups = 4;
     std::size_t patientRows = 6144;
     // Few rows at a time write less with smaller pages. Of a new file.
-    int patientPageBytes = 4096;
+    int patientPageBytes = 2048;
     std::chrono::milliseconds busyTimeout{1000};
     std::chrono::nanoseconds firstRetry = std::chrono::milliseconds(100);
     std::chrono::nanoseconds lastRetry = std::chrono::seconds(5);

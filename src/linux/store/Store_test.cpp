@@ -324,7 +324,8 @@ TEST_F(StoreTest, PressesBetweenTheMarksAndDropsNothing) {
 }
 
 TEST_F(StoreTest, AFileThatIsWrittenToSeldomIsMadeOfSmallerPages) {
-    options_.patientPageBytes = 4096;
+    options_.patientPageBytes = StoreOptions().patientPageBytes;
+    ASSERT_LT(options_.patientPageBytes, StoreDatabase::kPageBytes);
     options_.limits.syncInterval = kPromptInterval;
     open();
     EXPECT_EQ(reader().number("PRAGMA page_size"), StoreDatabase::kPageBytes);
@@ -332,7 +333,7 @@ TEST_F(StoreTest, AFileThatIsWrittenToSeldomIsMadeOfSmallerPages) {
     std::filesystem::remove(options_.path);
     options_.limits.syncInterval = kPromptInterval + std::chrono::milliseconds(1);
     open();
-    EXPECT_EQ(reader().number("PRAGMA page_size"), 4096);
+    EXPECT_EQ(reader().number("PRAGMA page_size"), options_.patientPageBytes);
 }
 
 TEST_F(StoreTest, ReplacesAFileThatWasRemovedWhileOpen) {
