@@ -45,19 +45,6 @@ StoreOptions storeOptions(const std::filesystem::path& directory, const Settings
     return options;
 }
 
-Dictionary describe(const ListenerCounters& counters) {
-    return Dictionary{{"accepted", counters.accepted.load()},
-                      {"refused", counters.refused.load()},
-                      {"broken", counters.broken.load()},
-                      {"requests", counters.requests.load()},
-                      {"bad_requests", counters.badRequests.load()},
-                      {"bytes_read", counters.bytesRead.load()}};
-}
-
-Error errorOf(const Failure& failure) {
-    return {"posix", static_cast<std::int64_t>(failure.code), "cannot purge: " + failure.message()};
-}
-
 } // namespace
 
 LinuxPlatform::LinuxPlatform(Directories directories, platform::TraceMarks& traceMarks)
@@ -285,7 +272,10 @@ void LinuxPlatform::beginShutdown() {
         return;
     }
     ::sd_notify(0, "STOPPING=1");
-    lastResort_.emplace(kEndLimit, [this] { endAsItIs(); });
+    lastResort_.emplace(kEndLimit, [this] {
+        tellUndone();
+        endAsItIs();
+    });
     if (!socketInherited_) {
         listener_->acceptTheLast();
     }
@@ -316,11 +306,19 @@ void LinuxPlatform::stopReading() {
 
 void LinuxPlatform::finishShutdown(bool inTime) {
     if (!inTime) {
-        HY_LOG_ERROR(HYReportingPlatformCategory,
-                     "stopping with work left undone: {} requests were not looked at",
-                     queues_->waitingRequests());
+        tellUndone();
     }
     context_.stop();
+}
+
+// On any thread; once.
+void LinuxPlatform::tellUndone() {
+    if (undoneTold_.exchange(true)) {
+        return;
+    }
+    HY_LOG_ERROR(HYReportingPlatformCategory,
+                 "stopping with work left undone: {} requests were not looked at",
+                 queues_->waitingRequests());
 }
 
 // The service was asked to die at once; what it has answered need not. This runs
@@ -346,51 +344,6 @@ void LinuxPlatform::logAccounts() const {
 
 void LinuxPlatform::flush(std::function<void()> done) {
     queues_->drain([this, done = std::move(done)] { store_->store.flush(done); });
-}
-
-// In the order in which things are made of each other: what is on its way becomes rows
-// and incidents, an incident becomes a folder and a row.
-void LinuxPlatform::purge(PurgeReply reply) {
-    queues_->drain([this, reply = std::move(reply)] {
-        incidents_->whenIdle([this, reply] {
-            const Result<void> removed = removeCollectedState(directories_.state);
-            store_->store.flush([this, reply, removed] { purgeStore(reply, removed); });
-        });
-    });
-}
-
-void LinuxPlatform::purgeStore(const PurgeReply& reply, const Result<void>& incidents) {
-    store_->store.purge([this, reply, incidents](const auto& rows) {
-        // Again: a file that turned out to be damaged was set aside just now.
-        const Result<void> state = removeCollectedState(directories_.state);
-        const Result<void> logs = removeCollectedLogs(directories_.logs);
-        for (const Result<void>* const result : {&incidents, &state, &logs}) {
-            if (!result->ok()) {
-                return reply(errorOf(result->failure()), 0);
-            }
-        }
-        if (!rows.ok()) {
-            return reply(errorOf(rows.failure()), 0);
-        }
-        HY_LOG_DEFAULT(HYReportingPlatformCategory, "purged {} rows", rows.value());
-        reply(std::nullopt, rows.value());
-    });
-}
-
-Dictionary LinuxPlatform::status() const {
-    const std::chrono::duration<double> uptime = system_.clock.steadyTime() - startTime_;
-    const StoreStatus store = store_->store.status();
-    return Dictionary{{"version", HALYARD_VERSION},
-                      {"pid", ownProcess_.pid()},
-                      {"uptime_sec", uptime.count()},
-                      {"under_pressure", pressure_.isOn()},
-                      {"delayed_messages", queues_->delayedTasks()},
-                      {"log_lines_dropped", log_.droppedLines()},
-                      {"listener", describe(listener_->counters())},
-                      {"incidents", Dictionary{{"refused", incidents_->refusedSnapshots()},
-                                               {"failed", incidents_->failedSnapshots()}}},
-                      {"messages", platform_.messageAccounts.describe(settledMessages(store))},
-                      {"store", describe(store)}};
 }
 
 } // namespace halyard::linux_

@@ -8,6 +8,7 @@
 #include <asio/io_context.hpp>
 #include <asio/signal_set.hpp>
 #include <asio/steady_timer.hpp>
+#include <atomic>
 #include <cstdint>
 #include <memory>
 #include <optional>
@@ -73,6 +74,7 @@ private:
     void stopReading();
     void logAccounts() const;
     void finishShutdown(bool inTime);
+    void tellUndone();
     void saveWhatWasAccepted();
     [[noreturn]] void endAsItIs();
     PeerRights rightsOfPeer(const Peer& peer) const;
@@ -105,6 +107,7 @@ private:
     platform::SteadyTime startTime_;
     bool socketInherited_ = false;
     bool stopping_ = false;
+    std::atomic<bool> undoneTold_ = false;
     std::optional<LastResort> lastResort_; // Goes first.
 };
 

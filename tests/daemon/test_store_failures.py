@@ -222,6 +222,21 @@ class AnInternalBuild(FaultyDiskTest):
         self.daemon.wait_for(lambda: self.disk.syncs() > syncs)
         self.assertEqual(self.daemon.terminate(), 0)
 
+    def test_tells_the_requests_that_a_disk_that_hangs_kept_it_from(self):
+        self.send()
+        self.client.result("admin.flush")
+        syncs = self.disk.syncs()
+        self.disk.tell("hang")
+        self.client.start("stopReportingSessionForID", 1)
+        self.daemon.wait_for(lambda: self.disk.syncs() > syncs)
+        for n in range(20):
+            self.client.notify("sendMessage", {"n": n}, 4, 1, [1])
+        self.assertEqual(self.daemon.terminate(), 0)
+        undone = re.search(r"work left undone: (\d+) requests were not looked at",
+                           self.daemon.log())
+        self.assertIsNotNone(undone, self.daemon.log())
+        self.assertIn(int(undone.group(1)) - 20, [0, 1])  # The client's end is one.
+
 
 if __name__ == "__main__":
     unittest.main()
