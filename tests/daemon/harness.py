@@ -125,6 +125,14 @@ class Daemon(launcher.Launcher):
     def terminate(self, seconds=PATIENCE):
         return super().terminate(seconds)
 
+    def has_open(self, path):
+        folder = f"/proc/{self.process.pid}/fd"
+        try:
+            return any(os.readlink(os.path.join(folder, name)) == path
+                       for name in os.listdir(folder))
+        except OSError:  # It ended, or closed one just now.
+            return False
+
     def remove(self):
         if self.process is not None and self.process.poll() is None:
             self.kill()

@@ -175,7 +175,9 @@ class Hands:
         output.close()
 
     def remove_log(self, act):
-        self.each_file(os.remove, [act.name])
+        # Rows in a log that nobody has open go with it, which no daemon can help.
+        if self.daemon.has_open(self.daemon.store_path + act.name):
+            self.each_file(os.remove, [act.name])
 
     def move_store(self, act):
         folder = self.file(f"moved-{len(self.moved)}")
