@@ -69,18 +69,18 @@ Outcome<void> Collector::collectRows(std::size_t table, StoreReader& reader, Row
         [&](const Row& row) {
             const double time = timeOf(table, row);
             const bool leaves = scope_.consent.isGivenAt(time);
-            const std::string* const record =
-                leaves ? &records_.recordOf(reader, table, row) : nullptr;
-            if (record != nullptr && batch.body.count() > 0 &&
-                batch.body.bytes() + record->size() > scope_.limits.bytes) {
+            const LogRecords::Record record =
+                leaves ? records_.recordOf(reader, table, row) : LogRecords::Record();
+            if (leaves && batch.body.count() > 0 &&
+                batch.body.bytes() + record.bytes.size() > scope_.limits.bytes) {
                 batch.hasMore = true;
                 return false;
             }
             pass({row.integer(0), time});
-            if (record != nullptr && record->size() > scope_.limits.bytes) {
+            if (leaves && record.bytes.size() > scope_.limits.bytes) {
                 ++batch.change.losses[Loss::TooLarge];
-            } else if (record != nullptr) {
-                batch.body.add(*record);
+            } else if (leaves) {
+                batch.body.add(record.bytes, record.event);
             }
             // Full: asking for another row would read as many again, only to leave them.
             batch.hasMore = batch.body.count() >= scope_.limits.records;

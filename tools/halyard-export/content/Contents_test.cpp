@@ -1,5 +1,6 @@
 // What rows become.
 #include <fmt/format.h>
+#include <set>
 
 #include "ExporterTesting.h"
 
@@ -99,6 +100,30 @@ TEST_F(ContentsTest, ALogRecordBelongsToTheSpanOfItsSession) {
     EXPECT_STREQ(spans[0]["startTimeUnixNano"].GetString(), "1700000001000000000");
     EXPECT_STREQ(spans[0]["endTimeUnixNano"].GetString(), "1700000100000000000");
     EXPECT_FALSE(spans[0].HasMember("status"));
+}
+
+TEST_F(ContentsTest, RecordsOfAKindStandTogetherInTheirOrder) {
+    const auto row = session();
+    message(1, R"({"n":1})", row, 14, 3);
+    message(2, R"({"n":2})", row, 10, 3);
+    message(3, R"({"n":3})", row, 14, 3);
+    message(4, R"({"n":4})", row, 10, 3);
+    run();
+    std::vector<std::string> order;
+    for (const auto& record : receiver_.items(Signal::Logs)) {
+        order.push_back(attribute(record, "halyard.n"));
+    }
+    EXPECT_EQ(order, (std::vector<std::string>{"1", "3", "2", "4"}));
+}
+
+TEST_F(ContentsTest, AnyNumberOfKindsLeavesWhole) {
+    for (int i = 0; i < 100; ++i) {
+        message(1, "{}", {}, 1 + i % 14, 1 + i / 14);
+    }
+    run();
+    const auto names = eventNames();
+    EXPECT_EQ(names.size(), 100U);
+    EXPECT_GT(std::set<std::string>(names.begin(), names.end()).size(), 40U);
 }
 
 TEST_F(ContentsTest, AnInterruptedSessionIsAnError) {

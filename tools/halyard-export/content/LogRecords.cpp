@@ -69,6 +69,7 @@ void LogRecords::begin(std::string_view event, int severity) {
     const auto* const level =
         std::find_if(std::begin(kSeverities), std::end(kSeverities),
                      [severity](const Severity& each) { return each.number == severity; });
+    event_ = event;
     record_.clear();
     attributes_.clear();
     Writer writer(record_);
@@ -89,7 +90,7 @@ void LogRecords::end(std::size_t table, const reading::Row& row) {
     record_ += attributes_.numbers;
 }
 
-const std::string& LogRecords::recordOf(reading::StoreReader& reader, std::size_t table,
+LogRecords::Record LogRecords::recordOf(reading::StoreReader& reader, std::size_t table,
                                         const reading::Row& row) {
     switch (table) {
     case kMessages:
@@ -106,7 +107,7 @@ const std::string& LogRecords::recordOf(reading::StoreReader& reader, std::size_
         break;
     }
     end(table, row);
-    return record_;
+    return {event_, record_};
 }
 
 void LogRecords::addMessage(reading::StoreReader& reader, const reading::Row& row) {

@@ -44,10 +44,13 @@ public:
         : identity_(identity), omission_(omission), consent_(consent), sessions_(sessions),
           payload_(omission) {}
 
-    // The row of kLogTables[table] as an encoded LogRecord. Valid until the next call.
-    // `reader` is for what belongs to it.
-    const std::string& recordOf(reading::StoreReader& reader, std::size_t table,
-                                const reading::Row& row);
+    struct Record {
+        std::string_view event; // its name
+        std::string_view bytes; // an encoded LogRecord
+    };
+    // Of a row of kLogTables[table]. Valid until the next call. `reader` is for what belongs
+    // to it.
+    Record recordOf(reading::StoreReader& reader, std::size_t table, const reading::Row& row);
 
     // Sessions are looked up again.
     void forget();
@@ -70,6 +73,7 @@ private:
     PayloadAttributes payload_;
     reading::JsonFields fields_;
     AttributeBytes attributes_;
+    std::string_view event_;
     std::string record_;
     std::string uid_;
     // Fields of each record of the session that was met last.

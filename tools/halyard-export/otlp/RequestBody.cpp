@@ -1,5 +1,7 @@
 #include "otlp/RequestBody.h"
 
+#include <algorithm>
+
 #include <protozero/varint.hpp>
 
 namespace halyard::exporting::otlp {
@@ -26,6 +28,24 @@ std::string scopeField() {
 
 } // namespace
 
+RequestBody::Items& RequestBody::itemsOf(std::string_view kind) {
+    const auto found = std::find_if(kinds_.begin(), kinds_.end(),
+                                    [kind](const Items& each) { return each.kind == kind; });
+    if (found != kinds_.end()) {
+        return *found;
+    }
+    return kinds_.size() < kMostKinds ? kinds_.emplace_back(Items{std::string(kind), {}})
+                                      : kinds_.back();
+}
+
+void RequestBody::add(std::string_view item, std::string_view kind) {
+    std::string& bytes = itemsOf(kind).bytes;
+    const std::size_t before = bytes.size();
+    Writer(bytes).add_message(request::kItem, item.data(), item.size());
+    bytes_ += bytes.size() - before;
+    ++count_;
+}
+
 // The items are copied once, although they are three messages deep.
 void RequestBody::finish(std::string_view attributes, std::string& body) const {
     body.clear();
@@ -35,11 +55,14 @@ void RequestBody::finish(std::string_view attributes, std::string& body) const {
     const std::string scope = scopeField();
     std::string resource = headOf(request::kResource, attributes.size());
     resource.append(attributes);
-    resource += headOf(request::kScopeItems, scope.size() + items_.size());
-    const std::size_t inner = resource.size() + scope.size() + items_.size();
+    resource += headOf(request::kScopeItems, scope.size() + bytes_);
+    const std::size_t inner = resource.size() + scope.size() + bytes_;
     body = headOf(request::kResourceItems, inner);
     body.reserve(body.size() + inner);
-    body.append(resource).append(scope).append(items_);
+    body.append(resource).append(scope);
+    for (const Items& items : kinds_) {
+        body.append(items.bytes);
+    }
 }
 
 } // namespace halyard::exporting::otlp
