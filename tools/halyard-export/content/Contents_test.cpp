@@ -12,6 +12,15 @@ protected:
     std::int64_t session(const std::string& more = "", const std::string& name = "player") {
         return store_.addSession(name, kBegin + 1, kBegin + 100, more);
     }
+    // As an event has it: field 1, eight bytes, the lowest first.
+    static std::string timeField(double at) {
+        const std::uint64_t nanoseconds = otlp::nanoseconds(kBegin + at);
+        std::string field = "\x09";
+        for (unsigned shift = 0; shift < 64; shift += 8) {
+            field += static_cast<char>(nanoseconds >> shift);
+        }
+        return field;
+    }
     std::string everythingSent() const {
         std::string all;
         for (const auto& request : receiver_.requests) {
@@ -158,6 +167,18 @@ TEST_F(ContentsTest, ChangesOfRouteAndVolumeAreEvents) {
     ASSERT_EQ(spans.at(0)["events"].Size(), 2U);
     EXPECT_STREQ(spans[0]["events"][0]["name"].GetString(), "halyard.route");
     EXPECT_EQ(attribute(spans[0]["events"][1], "halyard.VQSessionVolume"), "0.5");
+}
+
+TEST_F(ContentsTest, AnEventEndsWithItsTimeWhichIsNeverLikeTheLast) {
+    message(10, R"({"VQSessionVolume":0.5})", session(), 14, 3);
+    run();
+    std::string body;
+    for (const auto& request : receiver_.requests) {
+        body = request.signal == Signal::Traces ? request.body : body;
+    }
+    ASSERT_NE(body.find(timeField(10)), std::string::npos);
+    EXPECT_LT(body.find("halyard.volume"), body.find("halyard.VQSessionVolume"));
+    EXPECT_LT(body.find("halyard.VQSessionVolume"), body.find(timeField(10)));
 }
 
 TEST_F(ContentsTest, AGlitchToldTwiceCountsOnceWithTheLast) {

@@ -114,22 +114,25 @@ void SessionSpans::addPayload(std::string& bytes, Tag tag, std::string_view payl
 
 void SessionSpans::addEvents(Writer& span, const SessionContents& contents) {
     std::string event;
-    const auto begin = [&event](double time, std::string_view name) {
+    Writer writer(event);
+    const auto begin = [&](std::string_view name) {
         event.clear();
-        Writer writer(event);
         writer.add_string(span::kEventName, name.data(), name.size());
+    };
+    // Its time last, which is never alike.
+    const auto end = [&](double time) {
         writer.add_fixed64(span::kEventTime, nanoseconds(time));
+        span.add_message(span::kEvents, event);
     };
     for (const TimedPayload& change : contents.changes) {
-        begin(change.time,
-              change.category == kAudioEventCategoryVolume ? "halyard.volume" : "halyard.route");
+        begin(change.category == kAudioEventCategoryVolume ? "halyard.volume" : "halyard.route");
         addPayload(event, span::kEventAttributes, change.payload);
-        span.add_message(span::kEvents, event);
+        end(change.time);
     }
     for (const auto& [key, glitch] : contents.glitches) {
-        begin(glitch.start, "halyard.glitch");
+        begin("halyard.glitch");
         addGlitch(event, glitch);
-        span.add_message(span::kEvents, event);
+        end(glitch.start);
     }
 }
 
