@@ -111,6 +111,14 @@ TEST_F(ContentsTest, ALogRecordBelongsToTheSpanOfItsSession) {
     EXPECT_FALSE(spans[0].HasMember("status"));
 }
 
+TEST_F(ContentsTest, TheTimeOfARecordIsToldOnce) {
+    message(2);
+    run();
+    const auto records = receiver_.items(Signal::Logs);
+    EXPECT_STREQ(records.at(0)["timeUnixNano"].GetString(), "1700000002000000000");
+    EXPECT_FALSE(records[0].HasMember("observedTimeUnixNano"));
+}
+
 TEST_F(ContentsTest, RecordsOfAKindStandTogetherInTheirOrder) {
     const auto row = session();
     message(1, R"({"n":1})", row, 14, 3);

@@ -86,7 +86,6 @@ void LogRecords::end(std::size_t table, const reading::Row& row) {
     appendAttribute(record_, log_record::kAttributes, {}, "log.record.uid", AnyValue::ofText(uid_));
     Writer writer(record_);
     writer.add_fixed64(log_record::kTime, nanoseconds(time));
-    writer.add_fixed64(log_record::kObservedTime, nanoseconds(time));
     record_ += attributes_.numbers;
 }
 
