@@ -85,7 +85,7 @@ class Store:
             "INSERT INTO upload_message(upload_session, category, type, payload, time)"
             " VALUES(?, ?, ?, ?, ?)", (session, category, kind, text, time))
         self.rows += 1
-        self.logs.add(f"{self.device}/upload_message/{self.rows}/{mixed(time):04x}")
+        self.logs.add(f"{self.device}/upload_message/{mixed(self.open[1]):04x}/{self.rows}")
 
     def open_session(self):
         self.sessions += 1

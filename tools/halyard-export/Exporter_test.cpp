@@ -1,6 +1,7 @@
 #include "ExporterTesting.h"
 
 #include <fmt/format.h>
+#include <set>
 
 namespace halyard::exporting {
 namespace {
@@ -172,6 +173,35 @@ TEST_F(ExporterTest, WhatIsSentAgainHasTheSameIdentity) {
     ASSERT_EQ(records.size(), 2U);
     EXPECT_NE(attribute(records[0], "log.record.uid"), "none");
     EXPECT_EQ(attribute(records[0], "log.record.uid"), attribute(records[1], "log.record.uid"));
+}
+
+TEST_F(ExporterTest, RowsThatGotTheIdsOfOthersHaveIdentitiesOfTheirOwn) {
+    const auto opened = [this](double at) {
+        const auto session = store_.addSession("player", kBegin + at, kBegin + at + 5);
+        message(at + 1, "{}", session);
+        message(at + 1);
+        run();
+        // As a power cut does, or who puts a store back to an earlier state.
+        store_.execute("DELETE FROM upload_message; DELETE FROM upload_session");
+    };
+    opened(10);
+    opened(20);
+    std::set<std::string> names;
+    for (const auto& record : receiver_.items(Signal::Logs)) {
+        names.insert(attribute(record, "log.record.uid"));
+    }
+    EXPECT_EQ(names.size(), 4U);
+}
+
+TEST_F(ExporterTest, OfRowsOfASessionOnlyTheRowDiffersInTheirIdentity) {
+    const auto session = store_.addSession("player", kBegin + 1, kBegin + 9);
+    message(2, "{}", session);
+    message(3, "{}", session);
+    run();
+    const auto records = receiver_.items(Signal::Logs);
+    const std::string first = attribute(records.at(0), "log.record.uid");
+    EXPECT_TRUE(first.ends_with("/1")) << first;
+    EXPECT_EQ(attribute(records.at(1), "log.record.uid"), first.substr(0, first.size() - 1) + "2");
 }
 
 TEST_F(ExporterTest, ARetryWaitsAsLongAsTheReceiverAsks) {

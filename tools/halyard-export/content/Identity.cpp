@@ -59,8 +59,8 @@ SpanID Identity::spanOfGlitch(std::int64_t row, double opened, double start,
 
 void Identity::appendRecord(std::string& text, std::string_view table, std::int64_t row,
                             double time) const {
-    fmt::format_to(std::back_inserter(text), FMT_COMPILE("{}/{}/{}/{:04x}"), device_, table, row,
-                   mixed(time));
+    fmt::format_to(std::back_inserter(text), FMT_COMPILE("{}/{}/{:04x}/{}"), device_, table,
+                   mixed(time), row);
 }
 
 } // namespace halyard::exporting

@@ -29,9 +29,10 @@ public:
     SpanID spanOf(std::int64_t row, double opened) const;
     // Of a glitch of that session.
     SpanID spanOfGlitch(std::int64_t row, double opened, double start, std::string_view node) const;
-    // Of a row of a table: the device, the table, the row, and 16 bits of its time, which tell
-    // apart the rows of a store that was put back to an earlier state. A text that mostly
-    // repeats the one before it, for a UUID's digits are most of what a record weighs.
+    // Of a row of a table: the device, the table, 16 bits of a time, and the row. The time tells
+    // apart the rows of a store that was put back to an earlier state; it is when the row's
+    // session was opened, or when a row without one was made. A text that mostly repeats the one
+    // before it, for a UUID's digits are most of what a record weighs.
     void appendRecord(std::string& text, std::string_view table, std::int64_t row,
                       double time) const;
 

@@ -14,7 +14,7 @@ std::string recordOf(const char* device, const char* table, std::int64_t row, do
 
 TEST(IdentityTest, ARecordIsNamedByDeviceTableRowAndTime) {
     const std::string one = recordOf("6f3a", "incident", 12, 1.7e9);
-    EXPECT_EQ(one.substr(0, one.size() - 4), "6f3a/incident/12/");
+    EXPECT_TRUE(one.starts_with("6f3a/incident/") && one.ends_with("/12")) << one;
     EXPECT_EQ(one, recordOf("6f3a", "incident", 12, 1.7e9));
     const std::set<std::string> others = {
         recordOf("6f3b", "incident", 12, 1.7e9), recordOf("6f3a", "energy_event", 12, 1.7e9),

@@ -62,7 +62,12 @@ std::string_view LogRecords::eventOf(std::uint32_t category, std::uint16_t type)
 
 void LogRecords::forget() {
     sessions_.forget();
+    forgetSession();
+}
+
+void LogRecords::forgetSession() {
     session_.reset();
+    opened_.reset();
 }
 
 void LogRecords::begin(std::string_view event, int severity) {
@@ -81,7 +86,7 @@ void LogRecords::begin(std::string_view event, int severity) {
 void LogRecords::end(std::size_t table, const reading::Row& row) {
     const double time = timeOf(table, row);
     uid_.clear();
-    identity_.appendRecord(uid_, kLogTables[table].name, row.integer(kID), time);
+    identity_.appendRecord(uid_, kLogTables[table].name, row.integer(kID), opened_.value_or(time));
     record_ += attributes_.texts;
     appendAttribute(record_, log_record::kAttributes, {}, "log.record.uid", AnyValue::ofText(uid_));
     Writer writer(record_);
@@ -118,9 +123,10 @@ void LogRecords::addMessage(reading::StoreReader& reader, const reading::Row& ro
         session_ = session;
         sessionBytes_.clear();
         const BookedSession* const booked = sessions_.find(reader, *session);
+        opened_ = booked != nullptr ? std::optional(booked->opened) : std::nullopt;
         booked != nullptr ? addSession(*booked) : payload_.setNames({});
     } else if (!session) {
-        session_.reset();
+        forgetSession();
         const auto names = reading::namesIn(fields_, row.text(kSessionInfo), row.text(kUserInfo));
         setNames(names, row.text(kUserInfo));
         addNames(record_, names);
@@ -161,7 +167,7 @@ void LogRecords::addNames(std::string& bytes, const reading::SessionNames& names
 void LogRecords::addIncident(const reading::Row& row) {
     constexpr int kSignature = 1;
     begin("halyard.incident", log_record::kError);
-    session_.reset();
+    forgetSession();
     payload_.setNames({});
     payload_.add(attributes_, log_record::kAttributes, row.text(kSignature));
 }
@@ -170,7 +176,7 @@ void LogRecords::addNamedEvent(std::string_view event, std::size_t table, const 
     const bool isEnergy = table == kEnergy;
     const int name = isEnergy ? 2 : 1;
     begin(event, log_record::kInfo);
-    session_.reset();
+    forgetSession();
     setNames({}, row.text(name + 1));
     if (isEnergy && !omission_.omits("client")) {
         appendAttribute(attributes_.numbers, log_record::kAttributes, kPrefix, "client",

@@ -56,6 +56,7 @@ public:
     void forget();
 
 private:
+    void forgetSession();
     void begin(std::string_view event, int severity);
     void end(std::size_t table, const reading::Row& row);
     void addMessage(reading::StoreReader& reader, const reading::Row& row);
@@ -79,6 +80,8 @@ private:
     // Fields of each record of the session that was met last.
     std::optional<std::int64_t> session_;
     std::string sessionBytes_;
+    // When it was opened; none for a row without a session that is known.
+    std::optional<double> opened_;
     std::unordered_map<std::uint64_t, std::string> events_; // names of messages
 };
 
