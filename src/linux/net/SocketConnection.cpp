@@ -7,6 +7,7 @@
 #include <sys/socket.h>
 #include <utility>
 
+#include "linux/net/SpareCapacity.h"
 #include "linux/queues/PooledSerialQueue.h"
 #include "platform/Log.h"
 
@@ -16,7 +17,6 @@ namespace {
 using protocol::FrameScanner;
 using protocol::Method;
 
-constexpr std::size_t kKeptCapacity = 4096;
 // What is done where it was read: more than this is done sooner by several threads.
 constexpr std::size_t kFewBytes = 8 * 1024;
 // What a connection takes that has nothing to do.
@@ -41,17 +41,6 @@ std::string_view reason(FrameScanner::Outcome outcome) {
     default:
         return "bytes that are no MessagePack";
     }
-}
-
-void dropSpareCapacity(std::string& text) {
-    if (text.capacity() > kKeptCapacity) {
-        text = std::string();
-    }
-}
-
-// Small ones are a connection's own.
-std::size_t chargedFor(const std::string& text) {
-    return text.capacity() > kKeptCapacity ? text.capacity() : 0;
 }
 
 } // namespace
@@ -101,22 +90,6 @@ private:
     const std::weak_ptr<SocketConnection> connection_;
     const std::uint32_t messageID_;
 };
-
-void ListenerShared::add(const std::shared_ptr<SocketConnection>& connection, std::int32_t pid) {
-    connections.insert(connection);
-    processes.add(pid);
-    if (connectionsChanged) {
-        connectionsChanged(connections.size());
-    }
-}
-
-void ListenerShared::remove(const std::shared_ptr<SocketConnection>& connection, std::int32_t pid) {
-    connections.erase(connection);
-    processes.remove(pid);
-    if (connectionsChanged) {
-        connectionsChanged(connections.size());
-    }
-}
 
 SocketConnection::SocketConnection(asio::local::stream_protocol::socket socket, Peer peer,
                                    PeerRights rights, platform::ClientBudgetPtr budget,
@@ -348,81 +321,6 @@ void SocketConnection::refuseCall(const protocol::Call& call, MaybeError error) 
     }
 }
 
-void SocketConnection::send(std::string_view bytes) {
-    const MutexLock lock(outMutex_);
-    if (deaf_ || out_.size() > kMaxUnsentBytes) {
-        return; // Gone, or on its way to being closed.
-    }
-    out_ += bytes;
-    unsentBytes_.store(out_.size());
-    if (out_.size() > kMaxUnsentBytes || !outBytes_.resize(chargedFor(out_))) {
-        const bool complete = out_.size() <= kMaxUnsentBytes;
-        asio::post(socket_.get_executor(),
-                   [self = shared_from_this(), complete] { self->closeUnlessLeft(complete); });
-    } else if (!writeScheduled_) {
-        writeScheduled_ = true;
-        scheduleWriting();
-    }
-}
-
-void SocketConnection::scheduleWriting() {
-    if (isReadHere()) {
-        answersWait_ = true;
-    } else {
-        asio::post(socket_.get_executor(), [self = shared_from_this()] { self->writeSome(); });
-    }
-}
-
-SocketConnection::Written SocketConnection::writeOnce() {
-    const MutexLock lock(outMutex_);
-    if (out_.empty()) {
-        return Written::All; // The peer has become deaf meanwhile.
-    }
-    const ssize_t sent =
-        ::send(socket_.native_handle(), out_.data(), out_.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
-    if (sent < 0 && errno != EAGAIN && errno != EINTR) {
-        return Written::Refused;
-    }
-    out_.erase(0, sent > 0 ? static_cast<std::size_t>(sent) : 0);
-    unsentBytes_.store(out_.size());
-    writeScheduled_ = !out_.empty();
-    if (out_.empty()) {
-        dropSpareCapacity(out_);
-        (void)outBytes_.resize(chargedFor(out_)); // Which is less.
-    }
-    return out_.empty() ? Written::All : Written::Some;
-}
-
-void SocketConnection::writeSome() {
-    if (ended_) {
-        return;
-    }
-    const Written written = writeOnce();
-    if (written == Written::Refused) {
-        ending_ = Ending::Broken;
-        stopAnswering();
-    } else if (written == Written::Some) {
-        socket_.async_wait(asio::socket_base::wait_write,
-                           [self = shared_from_this()](const asio::error_code& error) {
-                               if (!error) {
-                                   self->writeSome();
-                               }
-                           });
-    }
-    if (paused_.load()) {
-        readIfAllowed();
-    }
-}
-
-void SocketConnection::stopAnswering() {
-    const MutexLock lock(outMutex_);
-    deaf_ = true;
-    out_ = std::string();
-    (void)outBytes_.resize(0);
-    unsentBytes_.store(0);
-}
-
-// Answers for which there is no room may go at once, if none has been dropped.
 void SocketConnection::closeUnlessLeft(bool complete) {
     writeSome();
     if (finishing_) {

@@ -52,6 +52,22 @@ Failure inTheWay(std::string what) {
 
 } // namespace
 
+void ListenerShared::add(const std::shared_ptr<SocketConnection>& connection, std::int32_t pid) {
+    connections.insert(connection);
+    processes.add(pid);
+    if (connectionsChanged) {
+        connectionsChanged(connections.size());
+    }
+}
+
+void ListenerShared::remove(const std::shared_ptr<SocketConnection>& connection, std::int32_t pid) {
+    connections.erase(connection);
+    processes.remove(pid);
+    if (connectionsChanged) {
+        connectionsChanged(connections.size());
+    }
+}
+
 Result<int> listenAt(const std::string& path) {
     sockaddr_un address{};
     if (!makeAddress(path, address)) {
