@@ -29,6 +29,10 @@ struct LogPlace {
 [[nodiscard]] bool logEnabled(LogLevel level);
 void logFormatted(LogLevel level, LogCategory category, const LogPlace& where,
                   fmt::string_view format, fmt::format_args arguments);
+// As much of a text as a line has room for.
+[[nodiscard]] std::string cutForLog(std::string text);
+void logText(LogLevel level, LogCategory category, const LogPlace& where, std::string_view text,
+             LogMemo* memo);
 
 template <class... Arguments>
 void log(LogLevel level, LogCategory category, const LogPlace& where,

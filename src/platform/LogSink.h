@@ -3,8 +3,15 @@
 #include <string_view>
 
 #include "common/LogCategory.h"
+#include "common/Value.h"
 
 namespace halyard::platform {
+
+// What a sink has made of a line that will be written again, which it need not make anew
+// then. None until it has.
+struct LogMemo {
+    Value made;
+};
 
 // All but the text are literals: whoever takes a line may keep them.
 struct LogLine {
@@ -14,6 +21,7 @@ struct LogLine {
     int line;
     std::string_view function;
     std::string_view text;
+    LogMemo* memo = nullptr; // of this very line; the caller's
 };
 
 // Where log lines go. Any thread. Must not block on whoever reads the log: an

@@ -2,6 +2,7 @@
 
 #include <cassert>
 #include <fmt/format.h>
+#include <utility>
 
 #include "common/Description.h"
 #include "platform/Device.h"
@@ -50,14 +51,21 @@ void logFormatted(LogLevel level, LogCategory category, const LogPlace& where,
                   fmt::string_view format, fmt::format_args arguments) {
     fmt::memory_buffer text;
     fmt::vformat_to(fmt::appender(text), format, arguments);
-    std::string_view shown(text.data(), text.size());
-    std::string shorter;
-    if (shown.size() > kLongestText) {
-        shorter = shortened(std::string(shown), kLongestText);
-        shown = shorter;
+    if (text.size() <= kLongestText) {
+        logText(level, category, where, {text.data(), text.size()}, nullptr);
+    } else {
+        logText(level, category, where, cutForLog(fmt::to_string(text)), nullptr);
     }
+}
+
+std::string cutForLog(std::string text) {
+    return shortened(std::move(text), kLongestText);
+}
+
+void logText(LogLevel level, LogCategory category, const LogPlace& where, std::string_view text,
+             LogMemo* memo) {
     installed->log->write(
-        {level, category, baseName(where.file), where.line, where.function, shown});
+        {level, category, baseName(where.file), where.line, where.function, text, memo});
 }
 
 } // namespace halyard::platform

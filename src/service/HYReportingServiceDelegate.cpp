@@ -262,8 +262,10 @@ HYReportingServiceDelegate::getAllActiveReportingSessions() const {
             sessionsLeftOut += sessions;
             continue;
         }
-        HY_LOG_DEFAULT(HYReportingServiceDelegateCategory, "sessions for client {} : {}",
-                       client->processIdentifier(), describeSessions(named, sessions));
+        const std::int32_t pid = client->processIdentifier();
+        HY_LOG_KEPT(clientLines_[clients - 1], LogLevel::Default,
+                    HYReportingServiceDelegateCategory, tellSessions(pid, named, sessions),
+                    "sessions for client {} : {}", pid, describeSessions(named, sessions));
     }
     if (clients > kNamedInLog) {
         HY_LOG_DEFAULT(HYReportingServiceDelegateCategory, "sessions for {} more clients : {}",

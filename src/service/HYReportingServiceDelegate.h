@@ -7,6 +7,7 @@
 // delivery threads may use.
 #pragma once
 
+#include <array>
 #include <atomic>
 #include <cstdint>
 #include <memory>
@@ -42,6 +43,7 @@ public:
     std::vector<Client> getAllClients() const override;
     bool isReportingEnabled() const override { return reportingEnabled_; }
     std::vector<Session> getAllActiveReportingSessions() const override;
+    platform::KeptLine& activeSessionsLine() override { return activeSessionsLine_; }
     Session findReportingSessionForID(std::int64_t reporterID) const override;
     Session findReportingSessionForID(std::int64_t reporterID,
                                       SessionLookups& lookups) const override;
@@ -86,6 +88,9 @@ private:
     std::vector<FeatureRecord> features_;
     std::unique_ptr<HYReportingDriverUtility> driverUtility_;
     MessageSinks sinks_;
+    // On the service work queue, like all lines that tell of sessions.
+    platform::KeptLine activeSessionsLine_;
+    mutable std::array<platform::KeptLine, kNamedInLog> clientLines_;
 
     mutable Mutex monitor_;
     std::vector<Client> clients_ HY_GUARDED_BY(monitor_);

@@ -11,6 +11,7 @@
 #include "common/HYReportingUtility.h"
 #include "common/Value.h"
 #include "platform/HWReport.h"
+#include "platform/KeptLine.h"
 
 namespace halyard {
 
@@ -57,6 +58,8 @@ public:
     virtual std::vector<Client> getAllClients() const = 0;
     virtual bool isReportingEnabled() const = 0;
     virtual std::vector<Session> getAllActiveReportingSessions() const = 0;
+    // The line about these that every message without an address writes.
+    virtual platform::KeptLine& activeSessionsLine() = 0;
     virtual Session findReportingSessionForID(std::int64_t reporterID) const = 0;
     // The same for one of many: what is to be told is noted, and told later.
     virtual Session findReportingSessionForID(std::int64_t reporterID,

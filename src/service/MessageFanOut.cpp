@@ -31,6 +31,18 @@ void tellRest(std::vector<Value>& named, std::size_t count) {
     }
 }
 
+std::vector<Value>
+descriptionsOf(const std::vector<std::shared_ptr<HYReportingSession>>& sessions) {
+    constexpr std::size_t kBeside = 2; // what is told with them
+    const std::size_t named = std::min(sessions.size(), kNamedInLog);
+    std::vector<Value> descriptions;
+    descriptions.reserve(named + kBeside);
+    for (std::size_t i = 0; i < named; ++i) {
+        descriptions.emplace_back(sessions[i]->sharedDescription());
+    }
+    return descriptions;
+}
+
 Value describeIDs(const std::optional<std::vector<std::int64_t>>& reporterIDs) {
     if (!reporterIDs) {
         return {};
@@ -46,12 +58,18 @@ Value describeIDs(const std::optional<std::vector<std::int64_t>>& reporterIDs) {
 
 Value describeSessions(const std::vector<std::shared_ptr<HYReportingSession>>& sessions,
                        std::size_t count) {
-    std::vector<Value> descriptions;
-    for (std::size_t i = 0; i < sessions.size() && i < kNamedInLog; ++i) {
-        descriptions.emplace_back(sessions[i]->sharedDescription());
-    }
+    std::vector<Value> descriptions = descriptionsOf(sessions);
     tellRest(descriptions, count);
     return List(std::move(descriptions));
+}
+
+std::vector<Value> tellSessions(std::int64_t number,
+                                const std::vector<std::shared_ptr<HYReportingSession>>& sessions,
+                                std::size_t count) {
+    std::vector<Value> told = descriptionsOf(sessions);
+    told.emplace_back(number);
+    told.emplace_back(count);
+    return told;
 }
 
 bool MessageFanOut::advance(Delegate& delegate, const OwnLookup& findOwn) {
@@ -94,8 +112,10 @@ bool MessageFanOut::findSessions(Delegate& delegate, const OwnLookup& findOwn) {
         delegate.tell(lookups_);
     } else {
         sessions_ = delegate.getAllActiveReportingSessions();
-        HY_LOG_DEFAULT(HYReportingClientCategory, "active reporting sessions {} : {}",
-                       sessions_.size(), describeSessions(sessions_));
+        const std::size_t count = sessions_.size();
+        HY_LOG_KEPT(delegate.activeSessionsLine(), LogLevel::Default, HYReportingClientCategory,
+                    tellSessions(static_cast<std::int64_t>(count), sessions_, count),
+                    "active reporting sessions {} : {}", count, describeSessions(sessions_));
     }
     next_ = 0;
     stage_ = Stage::Offer;

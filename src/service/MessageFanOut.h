@@ -68,7 +68,10 @@ private:
 };
 
 // A list of session descriptions, for log lines, of `count` sessions of which these
-// come first.
+// come first. What a line with one depends on that has a number beside it.
+std::vector<Value> tellSessions(std::int64_t number,
+                                const std::vector<std::shared_ptr<HYReportingSession>>& sessions,
+                                std::size_t count);
 Value describeSessions(const std::vector<std::shared_ptr<HYReportingSession>>& sessions,
                        std::size_t count);
 inline Value describeSessions(const std::vector<std::shared_ptr<HYReportingSession>>& sessions) {

@@ -126,6 +126,33 @@ TEST_F(MessageFanOutTest, ABroadcastTellsWhomItReaches) {
                                                       session(7)->description() + "\"\n)"));
 }
 
+TEST_F(MessageFanOutTest, EachBroadcastTellsWhomItReachesByThen) {
+    const auto broadcast = [this] {
+        platform_.log.clear();
+        client_.send({{"n", 1}}, std::nullopt);
+        return platform_.log.texts(LogLevel::Default);
+    };
+    const auto list = [](const std::string& of) {
+        return of.empty() ? of : "    \"" + of + "\"\n";
+    };
+    const auto expected = [&](const std::string& first, const std::string& second) {
+        return std::vector{"sessions for client 100 : (\n" + list(first) + ")",
+                           "sessions for client 200 : (\n" + list(second) + ")",
+                           "active reporting sessions 1 : (\n" + list(first) + ")"};
+    };
+    client_.createAndStart(7);
+    EXPECT_EQ(broadcast(), expected(session(7)->description(), ""));
+    EXPECT_EQ(broadcast(), expected(session(7)->description(), ""));
+    client_.configure({{"HostApplicationDisplayID", "org.player"}}, 7);
+    EXPECT_EQ(broadcast(), expected(session(7)->description(), ""));
+    EXPECT_NE(session(7)->description().find("org.player"), std::string::npos);
+    other_.create(9);
+    EXPECT_EQ(broadcast(), expected(session(7)->description(), session(9, 1)->description()));
+    other_.connection().invalidate();
+    connect(300);
+    EXPECT_EQ(broadcast()[1], "sessions for client 300 : (\n)");
+}
+
 TEST_F(MessageFanOutTest, WithNoStartedSessionTheMessageLeavesAlone) {
     client_.create(7);
     EXPECT_TRUE(answered(client_.send({{"n", 1}}, std::nullopt)));

@@ -31,6 +31,7 @@ public:
     std::vector<Client> getAllClients() const override { return {}; }
     bool isReportingEnabled() const override { return true; }
     std::vector<Session> getAllActiveReportingSessions() const override { return {}; }
+    platform::KeptLine& activeSessionsLine() override { return line; }
     Session findReportingSessionForID(std::int64_t) const override { return nullptr; }
     Session findReportingSessionForID(std::int64_t, SessionLookups&) const override {
         return nullptr;
@@ -47,6 +48,7 @@ public:
     void setActiveSessionCount(std::int64_t) override {}
 
     RecordingSinks recorded;
+    platform::KeptLine line;
 };
 
 class StandaloneSessionTest : public ::testing::Test {

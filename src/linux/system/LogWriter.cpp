@@ -10,6 +10,7 @@
 #include <deque>
 #include <fmt/format.h>
 #include <iterator>
+#include <optional>
 #include <pthread.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
@@ -23,15 +24,20 @@
 #include <systemd/sd-journal.h>
 
 #include "common/Mutex.h"
+#include "common/TextScan.h"
 #include "linux/queues/BlockingSection.h"
 
 namespace halyard::linux_ {
 namespace {
 
+using Clock = std::chrono::steady_clock;
+
 constexpr std::chrono::seconds kFlushLimit{1};
-// What is kept for the next lines.
+// What is kept for the next lines, and no more than that is gathered.
 constexpr std::size_t kKeptCapacity = 1024; // records
-constexpr std::size_t kKeptBytes = 64 * 1024;
+constexpr std::size_t kKeptBytes = 128 * 1024;
+// What is written to a file at a time, which takes it all in one piece.
+constexpr std::size_t kPieceOfFile = 64 * 1024;
 
 std::string_view levelName(LogLevel level) {
     switch (level) {
@@ -61,10 +67,6 @@ int journalPriority(LogLevel level) {
     return 3;
 }
 
-bool isPlain(char c) {
-    return static_cast<unsigned char>(c) >= 0x20 && c != 0x7F && c != '\\';
-}
-
 void appendEscaped(std::string& out, char c) {
     switch (c) {
     case '\n':
@@ -86,8 +88,7 @@ void appendEscaped(std::string& out, char c) {
 
 void appendEscaped(std::string& out, std::string_view text) {
     while (!text.empty()) {
-        const auto plain = static_cast<std::size_t>(
-            std::find_if_not(text.begin(), text.end(), isPlain) - text.begin());
+        const std::size_t plain = plainLength<'\x7F', '\\'>(text);
         out += text.substr(0, plain);
         if (plain < text.size()) {
             appendEscaped(out, text[plain]);
@@ -109,7 +110,7 @@ void writeAll(int fd, std::string_view text) {
 
 void sendToJournal(const LogRecord& record) {
     const std::string fields[] = {
-        "MESSAGE=" + record.message,
+        fmt::format("MESSAGE={}", record.message.text()),
         fmt::format("PRIORITY={}", journalPriority(record.level)),
         fmt::format("SUBSYSTEM={}", kLogSubsystem),
         fmt::format("CATEGORY={}", record.category),
@@ -142,8 +143,41 @@ bool isConnectedToJournal(int fd) {
     return std::strncmp(peer.sun_path, "/run/systemd/journal/", 21) == 0;
 }
 
+bool isRegularFile(int fd) {
+    struct stat facts {};
+    return ::fstat(fd, &facts) == 0 && S_ISREG(facts.st_mode);
+}
+
 std::size_t cost(const LogRecord& record) {
-    return sizeof record + record.message.size();
+    return sizeof record + record.message.text().size();
+}
+
+void appendMessage(fmt::memory_buffer& out, const platform::LogLine& line) {
+    constexpr std::size_t kFileWidth = 25;
+    constexpr std::size_t kLineWidth = 5;
+    constexpr std::string_view kBlanks = "                         ";
+    static_assert(kBlanks.size() == kFileWidth);
+    const fmt::format_int number(line.line);
+    out.append(kBlanks.substr(std::min(kFileWidth, line.file.size())));
+    out.append(line.file);
+    out.push_back(':');
+    out.append(std::string_view(number.data(), number.size()));
+    out.append(kBlanks.substr(kFileWidth - kLineWidth + std::min(kLineWidth, number.size())));
+    out.push_back(' ');
+    out.append(line.text);
+}
+
+Value messageOf(const platform::LogLine& line) {
+    if (line.memo != nullptr && !line.memo->made.isNone()) {
+        return line.memo->made;
+    }
+    fmt::memory_buffer text;
+    appendMessage(text, line);
+    Value made(std::string_view(text.data(), text.size()));
+    if (line.memo != nullptr) {
+        line.memo->made = made;
+    }
+    return made;
 }
 
 } // namespace
@@ -153,20 +187,14 @@ bool leadsToJournal(int fd) {
 }
 
 std::string logMessage(const platform::LogLine& line) {
-    constexpr std::size_t kFileWidth = 25;
-    constexpr std::size_t kLineWidth = 5;
-    const fmt::format_int number(line.line);
-    std::string out;
-    out.reserve(kFileWidth + 2 * kLineWidth + line.file.size() + line.text.size());
-    out.append(kFileWidth - std::min(kFileWidth, line.file.size()), ' ');
-    out.append(line.file).append(1, ':').append(number.data(), number.size());
-    out.append(kLineWidth - std::min(kLineWidth, number.size()), ' ');
-    return out.append(1, ' ').append(line.text);
+    fmt::memory_buffer text;
+    appendMessage(text, line);
+    return fmt::to_string(text);
 }
 
 void appendStandardErrorLine(std::string& out, const LogRecord& record) {
     out.append(levelName(record.level)).append(1, ' ').append(record.category).append(1, ' ');
-    appendEscaped(out, record.message);
+    appendEscaped(out, record.message.text());
     out += '\n';
 }
 
@@ -177,10 +205,16 @@ std::string standardErrorLine(const LogRecord& record) {
 }
 
 struct LogWriter::State {
+    explicit State(Gathering gathers) : gathering(gathers) {}
+
     // All that waits to be written, once there is some; nothing at the end.
     void take(std::vector<LogRecord>& taken) HY_EXCLUDES(mutex);
+    void waitForLinesLocked() HY_REQUIRES(mutex);
+    void hurryLocked() HY_REQUIRES(mutex);
     void written(std::vector<LogRecord>& records) HY_EXCLUDES(mutex);
     bool isIdleLocked() const HY_REQUIRES(mutex) { return queued.empty() && !writing; }
+
+    const Gathering gathering;
 
     Mutex mutex;
     std::condition_variable_any changed;
@@ -188,16 +222,36 @@ struct LogWriter::State {
     std::deque<LogRecord> recent HY_GUARDED_BY(mutex);
     std::size_t queuedBytes HY_GUARDED_BY(mutex) = 0;
     std::uint64_t untoldDrops HY_GUARDED_BY(mutex) = 0;
+    // Until when lines are gathered; none while they are few.
+    std::optional<Clock::time_point> gatheredUntil HY_GUARDED_BY(mutex);
     bool writing HY_GUARDED_BY(mutex) = false;
+    bool hurried HY_GUARDED_BY(mutex) = false;
     bool stopping HY_GUARDED_BY(mutex) = false;
 };
+
+// A line now and then is written at once. Where they are many, each waking and each write
+// costs more than the lines.
+void LogWriter::State::waitForLinesLocked() {
+    while (!stopping && queued.empty()) {
+        changed.wait(mutex);
+    }
+    while (gatheredUntil && !stopping && !hurried &&
+           changed.wait_until(mutex, *gatheredUntil) != std::cv_status::timeout) {
+    }
+    hurried = false;
+}
+
+// What is there now.
+void LogWriter::State::hurryLocked() {
+    if (!queued.empty() && !std::exchange(hurried, true)) {
+        changed.notify_all();
+    }
+}
 
 void LogWriter::State::take(std::vector<LogRecord>& taken) {
     taken.clear();
     const MutexLock lock(mutex);
-    while (!stopping && queued.empty()) {
-        changed.wait(mutex);
-    }
+    waitForLinesLocked();
     if (queued.empty()) {
         return;
     }
@@ -208,10 +262,10 @@ void LogWriter::State::take(std::vector<LogRecord>& taken) {
     queuedBytes = 0;
     writing = true;
     if (const auto drops = std::exchange(untoldDrops, 0); drops > 0) {
-        taken.push_back(
-            {LogLevel::Error, HYReportingPlatformCategory,
-             fmt::format("{:>25}:{:<5} {} messages dropped", "LogWriter.cpp", __LINE__, drops),
-             "LogWriter.cpp", __LINE__, __func__});
+        taken.push_back({LogLevel::Error, HYReportingPlatformCategory,
+                         Value(fmt::format("{:>25}:{:<5} {} messages dropped", "LogWriter.cpp",
+                                           __LINE__, drops)),
+                         "LogWriter.cpp", __LINE__, __func__});
     }
 }
 
@@ -219,6 +273,8 @@ void LogWriter::State::written(std::vector<LogRecord>& records) {
     const std::size_t newest = std::min(records.size(), kRecentLines);
     const MutexLock lock(mutex);
     writing = false;
+    gatheredUntil = records.size() > gathering.lines ? std::optional(Clock::now() + gathering.time)
+                                                     : std::nullopt;
     std::move(std::prev(records.end(), static_cast<std::ptrdiff_t>(newest)), records.end(),
               std::back_inserter(recent));
     while (recent.size() > kRecentLines) {
@@ -238,11 +294,12 @@ LogWriter::Output LogWriter::defaultOutput() {
 
 // As many lines at a time as a pipe takes in one piece: others may write to it, too.
 LogWriter::Output LogWriter::linesOn(int fd) {
-    return [fd, text = std::string()](std::span<const LogRecord> records) mutable {
+    const std::size_t most = isRegularFile(fd) ? kPieceOfFile : PIPE_BUF;
+    return [fd, most, text = std::string()](std::span<const LogRecord> records) mutable {
         for (const LogRecord& record : records) {
             const std::size_t before = text.size();
             appendStandardErrorLine(text, record);
-            if (text.size() > PIPE_BUF && before > 0) {
+            if (text.size() > most && before > 0) {
                 writeAll(fd, std::string_view(text).substr(0, before));
                 text.erase(0, before);
             }
@@ -255,8 +312,9 @@ LogWriter::Output LogWriter::linesOn(int fd) {
     };
 }
 
-LogWriter::LogWriter(Output output)
-    : state_(std::make_shared<State>()), thread_([state = state_, output = std::move(output)] {
+LogWriter::LogWriter(Output output, Gathering gathering)
+    : state_(std::make_shared<State>(gathering)),
+      thread_([state = state_, output = std::move(output)] {
           sigset_t all;
           sigfillset(&all);
           pthread_sigmask(SIG_BLOCK, &all, nullptr);
@@ -281,7 +339,7 @@ LogWriter::~LogWriter() {
 }
 
 void LogWriter::write(const platform::LogLine& line) {
-    LogRecord record{line.level, line.category, logMessage(line),
+    LogRecord record{line.level, line.category, messageOf(line),
                      line.file,  line.line,     line.function};
     const MutexLock lock(state_->mutex);
     if (state_->queuedBytes + cost(record) > kMaxQueuedBytes) {
@@ -293,6 +351,10 @@ void LogWriter::write(const platform::LogLine& line) {
     state_->queued.push_back(std::move(record));
     if (state_->queued.size() == 1) {
         state_->changed.notify_all();
+    }
+    if (line.level == LogLevel::Error || state_->queued.size() >= kKeptCapacity ||
+        state_->queuedBytes >= kKeptBytes) {
+        state_->hurryLocked();
     }
 }
 
@@ -307,7 +369,8 @@ void LogWriter::run(const std::shared_ptr<State>& state, const Output& output) {
 void LogWriter::flush() {
     const BlockingSection blocking;
     const MutexLock lock(state_->mutex);
-    const auto until = std::chrono::steady_clock::now() + kFlushLimit;
+    const auto until = Clock::now() + kFlushLimit;
+    state_->hurryLocked();
     while (!state_->isIdleLocked() &&
            state_->changed.wait_until(state_->mutex, until) != std::cv_status::timeout) {
     }

@@ -9,6 +9,7 @@
 #pragma once
 
 #include <atomic>
+#include <chrono>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -16,8 +17,10 @@
 #include <string>
 #include <string_view>
 #include <thread>
+#include <utility>
 #include <vector>
 
+#include "common/Value.h"
 #include "platform/LogSink.h"
 
 namespace halyard::linux_ {
@@ -26,7 +29,7 @@ namespace halyard::linux_ {
 struct LogRecord {
     LogLevel level;
     std::string_view category;
-    std::string message; // prefix and text
+    Value message; // prefix and text; one of a line that recurs is shared
     std::string_view file;
     int line;
     std::string_view function;
@@ -49,7 +52,15 @@ public:
     // Where records go, the oldest first; called on the log's own thread.
     using Output = std::function<void(std::span<const LogRecord>)>;
 
-    explicit LogWriter(Output output);
+    // Lines that come this soon after more than so many were written at once are gathered,
+    // unless they are many themselves or one tells of an error.
+    struct Gathering {
+        std::chrono::nanoseconds time = std::chrono::milliseconds(10);
+        std::size_t lines = 64;
+    };
+
+    explicit LogWriter(Output output) : LogWriter(std::move(output), Gathering{}) {}
+    LogWriter(Output output, Gathering gathering);
     // Writes what is queued, for a second at most.
     ~LogWriter() override;
 

@@ -3,7 +3,11 @@
 #include <gtest/gtest.h>
 
 #include <climits>
+#include <condition_variable>
+#include <cstdio>
+#include <fstream>
 #include <future>
+#include <mutex>
 #include <sys/socket.h>
 #include <unistd.h>
 
@@ -14,8 +18,8 @@ platform::LogLine line(std::string_view text, LogLevel level = LogLevel::Default
     return {level, HYReportingClientCategory, "Some.cpp", 42, "some()", text};
 }
 
-LogRecord record(std::string message) {
-    return {LogLevel::Info, "hyrc", std::move(message), "Some.cpp", 42, "some()"};
+LogRecord record(const std::string& message) {
+    return {LogLevel::Info, "hyrc", Value(message), "Some.cpp", 42, "some()"};
 }
 
 TEST(LogMessage, PutsFileAndLineInFront) {
@@ -35,7 +39,7 @@ TEST(LogWriter, WritesInTheOrderOfTheLines) {
     std::vector<std::string> written;
     LogWriter log([&](std::span<const LogRecord> records) {
         for (const LogRecord& each : records) {
-            written.push_back(each.message);
+            written.emplace_back(each.message.text());
         }
     });
     log.write(line("first"));
@@ -45,6 +49,83 @@ TEST(LogWriter, WritesInTheOrderOfTheLines) {
     ASSERT_EQ(written.size(), 2u);
     EXPECT_TRUE(written[0].ends_with("first"));
     EXPECT_TRUE(written[1].ends_with("second"));
+}
+
+// What was written at a time.
+class Batches {
+public:
+    LogWriter::Output output() {
+        return [this](std::span<const LogRecord> records) {
+            const std::lock_guard lock(mutex_);
+            sizes_.push_back(records.size());
+            changed_.notify_all();
+        };
+    }
+    std::vector<std::size_t> waitFor(std::size_t count) {
+        std::unique_lock lock(mutex_);
+        changed_.wait(lock, [&] { return sizes_.size() >= count; });
+        return sizes_;
+    }
+
+private:
+    std::mutex mutex_;
+    std::condition_variable changed_;
+    std::vector<std::size_t> sizes_;
+};
+
+TEST(LogWriter, GathersLinesThatFollowOthersCloselyUntilOneTellsOfAnError) {
+    Batches batches;
+    LogWriter log(batches.output(), {std::chrono::hours(1), 0});
+    log.write(line("first"));
+    EXPECT_EQ(batches.waitFor(1), (std::vector<std::size_t>{1}));
+    log.flush(); // So that the first is done with.
+    log.write(line("gathered"));
+    log.write(line("gathered"));
+    log.write(line("worse", LogLevel::Error));
+    EXPECT_EQ(batches.waitFor(2), (std::vector<std::size_t>{1, 3}));
+}
+
+TEST(LogWriter, GathersNothingWhereLinesAreFew) {
+    Batches batches;
+    LogWriter log(batches.output(), {std::chrono::hours(1), 1});
+    for (std::size_t count = 1; count <= 3; ++count) {
+        log.write(line("by itself"));
+        EXPECT_EQ(batches.waitFor(count), std::vector<std::size_t>(count, 1));
+        log.flush();
+    }
+}
+
+TEST(LogWriter, WritesWhatItHasGatheredWhenThereIsMuchOfIt) {
+    Batches batches;
+    LogWriter log(batches.output(), {std::chrono::hours(1), 0});
+    log.write(line("first"));
+    batches.waitFor(1);
+    log.flush();
+    log.write(line(std::string(200'000, 'x')));
+    batches.waitFor(2);
+    log.flush();
+    for (int i = 0; i < 1024; ++i) {
+        log.write(line("many"));
+    }
+    EXPECT_EQ(batches.waitFor(3), (std::vector<std::size_t>{1, 1, 1024}));
+}
+
+TEST(LogWriter, MakesALineThatRecursOnce) {
+    std::vector<std::string> written;
+    LogWriter log([&](std::span<const LogRecord> records) {
+        for (const LogRecord& each : records) {
+            written.emplace_back(each.message.text());
+        }
+    });
+    platform::LogMemo memo;
+    platform::LogLine recurring = line("the text");
+    recurring.memo = &memo;
+    log.write(recurring);
+    EXPECT_EQ(memo.made, Value(logMessage(line("the text"))));
+    recurring.text = "not looked at";
+    log.write(recurring);
+    log.flush();
+    EXPECT_EQ(written, std::vector(2, logMessage(line("the text"))));
 }
 
 TEST(LogWriter, LevelsBelowTheSetOneAreOff) {
@@ -68,7 +149,7 @@ TEST(LogWriter, AStuckReaderCostsLinesAndTellsHowMany) {
         }
         opened.wait();
         for (const LogRecord& each : records) {
-            written.push_back(each.message);
+            written.emplace_back(each.message.text());
         }
     });
     log.write(line("first"));
@@ -112,6 +193,32 @@ TEST(LinesOn, WritesSeveralWholeLinesAtATimeAndNoMoreThanAPipeTakes) {
     ::close(ends[1]);
     const std::string text = standardErrorLine(records.front());
     EXPECT_EQ(pieces, (std::vector{text + text, text}));
+}
+
+std::uint64_t writesOfThisThread() {
+    std::ifstream counters("/proc/thread-self/io");
+    std::string name;
+    std::uint64_t count = 0;
+    while (counters >> name >> count && name != "syscw:") {
+    }
+    return count;
+}
+
+TEST(LinesOn, WritesManyLinesAtATimeIntoAFile) {
+    std::FILE* const file = std::tmpfile();
+    const std::vector<LogRecord> records(30, record(std::string(PIPE_BUF, 'x')));
+    const std::uint64_t before = writesOfThisThread();
+    LogWriter::linesOn(::fileno(file))(records);
+    EXPECT_EQ(writesOfThisThread() - before, 2u); // 120 KiB, 64 at most at a time
+
+    std::string text(std::size_t{31} * (PIPE_BUF + 16), 0);
+    text.resize(static_cast<std::size_t>(::pread(::fileno(file), text.data(), text.size(), 0)));
+    std::string expected;
+    for (const LogRecord& each : records) {
+        expected += standardErrorLine(each);
+    }
+    EXPECT_EQ(text, expected);
+    std::fclose(file);
 }
 
 TEST(LeadsToJournal, IsFalseForAPipe) {
