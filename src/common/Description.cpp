@@ -6,6 +6,8 @@
 #include <fmt/compile.h>
 #include <fmt/format.h>
 
+#include "common/TextScan.h"
+
 namespace halyard {
 namespace {
 
@@ -43,10 +45,6 @@ bool needsQuotes(std::string_view text) noexcept {
     return text.empty();
 }
 
-constexpr bool isLiteral(char c) noexcept {
-    return static_cast<unsigned char>(c) >= 0x20 && c != 0x7F && c != '"' && c != '\\';
-}
-
 void appendEscaped(std::string& out, char c) {
     switch (c) {
     case '"':
@@ -72,8 +70,7 @@ void appendEscaped(std::string& out, char c) {
 void appendQuoted(std::string& out, std::string_view text) {
     out += '"';
     while (!text.empty()) {
-        const auto plain = static_cast<std::size_t>(
-            std::find_if_not(text.begin(), text.end(), isLiteral) - text.begin());
+        const std::size_t plain = plainLength<'\x7F', '"', '\\'>(text);
         out += text.substr(0, plain);
         if (plain < text.size()) {
             appendEscaped(out, text[plain]);

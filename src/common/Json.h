@@ -31,6 +31,13 @@ public:
     // As it would be had `top` been set in it; a value of none leaves the key out.
     std::string_view write(const Dictionary& value, const Dictionary::Entry& top);
 
+    // The same for messages of which several texts are asked for, each with other entries
+    // behind or on top: what they have in common is written once. Requires that they live
+    // until forget().
+    std::string_view writeShared(const Dictionary& value);
+    std::string_view writeShared(const Dictionary& value, const Dictionary::Entry& top);
+    void forget();
+
     // Lets go of the room that an unusually long text took.
     void shrink();
     std::size_t capacity() const;

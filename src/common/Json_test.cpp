@@ -5,6 +5,8 @@
 #include <rapidjson/stringbuffer.h>
 #include <rapidjson/writer.h>
 
+#include "common/ValueArena.h"
+
 namespace halyard {
 namespace {
 
@@ -108,16 +110,57 @@ TEST(JsonTest, AWriterLetsGoOfTheRoomOfALongText) {
     EXPECT_EQ(writer.write(Value("short")), "\"short\"");
 }
 
+Dictionary withTop(Dictionary message, const Dictionary::Entry& top) {
+    message.set(top.key, top.value);
+    return message;
+}
+
 TEST(JsonTest, AnEntryOnTopIsWrittenAsIfItHadBeenSet) {
     const Dictionary message{{"a", 1}, {"b", List{}}};
     JsonWriter writer;
     for (const Dictionary::Entry& top :
          {Dictionary::Entry{"a", "x"}, {"b", 2}, {"c", 3}, {"a", Value()}, {"c", Value()}}) {
-        Dictionary set = message;
-        set.set(top.key, top.value);
-        EXPECT_EQ(writer.write(message, top), toJson(set));
+        EXPECT_EQ(writer.write(message, top), toJson(withTop(message, top)));
     }
     EXPECT_EQ(writer.write({}, {"a", Value()}), "{}");
+}
+
+// As a message is decoded: with room for one entry behind it.
+Dictionary decoded(const Dictionary& message) {
+    ValueArena arena(message.size() + 1, ValueArena::Size());
+    for (const auto& [key, value] : message) {
+        arena.root().add(key, value);
+    }
+    return arena.finish();
+}
+
+TEST(JsonTest, TextsOfOneMessageAreThoseOfEachByItself) {
+    const Dictionary message = decoded({{"a", 1}, {"b", "text"}, {"c", true}});
+    Dictionary tagged = message;
+    tagged.set("tag", "x");
+    JsonWriter writer;
+    for (int i = 0; i < 2; ++i) {
+        for (const Dictionary::Entry& top :
+             {Dictionary::Entry{"d", "y"}, {"a", 2}, {"tag", 3}, {"a", Value()}, {"d", Value()}}) {
+            EXPECT_EQ(writer.writeShared(message, top), toJson(withTop(message, top)));
+            EXPECT_EQ(writer.writeShared(tagged, top), toJson(withTop(tagged, top)));
+        }
+        EXPECT_EQ(writer.writeShared(tagged), toJson(tagged));
+        EXPECT_EQ(writer.writeShared(message), toJson(message));
+        EXPECT_EQ(writer.writeShared(Dictionary{{"e", 1}}), "{\"e\":1}");
+        writer.forget();
+    }
+}
+
+TEST(JsonTest, TheSharedTextOfAMessageIsWrittenOnce) {
+    const Dictionary message = decoded({{"a", 1}});
+    const Dictionary other = message;
+    JsonWriter writer;
+    EXPECT_EQ(writer.writeShared(message), "{\"a\":1}");
+    const_cast<Dictionary::Entry*>(other.begin())->value = 2; // Nobody else may.
+    EXPECT_EQ(writer.writeShared(other, {"b", 3}), "{\"a\":1,\"b\":3}");
+    writer.forget();
+    EXPECT_EQ(writer.writeShared(other), "{\"a\":2}");
 }
 
 TEST(JsonTest, LongTextsGrowWithoutLosingAnything) {

@@ -342,6 +342,7 @@ void StoreDatabase::close() {
 StoreResult StoreDatabase::begin() {
     nextIDBefore_ = nextID_;
     groupRows_ = {};
+    payload_.forget(); // The rows of the group before may be gone.
     groupUploads_.clear();
     return resultOf(begin_.run());
 }

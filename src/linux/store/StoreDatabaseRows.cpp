@@ -100,7 +100,7 @@ StoreResult StoreDatabase::insert(const StoreMessageRow& row) {
     }
     return insertInto(StoreTable::UploadMessage, row.upload->row, nullptr, nullptr,
                       std::int64_t{row.category}, std::int64_t{row.type},
-                      payload_.write(row.payload), row.time);
+                      payload_.writeShared(row.payload), row.time);
 }
 
 StoreResult StoreDatabase::insert(const StoreSingleRow& row) {
@@ -112,7 +112,7 @@ StoreResult StoreDatabase::insert(const StoreSingleRow& row) {
 StoreResult StoreDatabase::insert(const StoreAnalyticsRow& row) {
     const auto& [message, top] = row.built();
     const std::string_view payload =
-        top.key.isNone() ? payload_.write(message) : payload_.write(message, top);
+        top.key.isNone() ? payload_.write(message) : payload_.writeShared(message, top);
     return insertInto(StoreTable::AnalyticsEvent, row.name.text(), payload, row.time);
 }
 
