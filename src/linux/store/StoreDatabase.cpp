@@ -84,7 +84,8 @@ int rememberLogPages(void* pages, sqlite3*, const char*, int count) {
 
 } // namespace
 
-StoreDatabase::StoreDatabase(Settings settings) : settings_(std::move(settings)) {}
+StoreDatabase::StoreDatabase(Settings settings)
+    : settings_(std::move(settings)), disk_(settings_.vfs) {}
 
 StoreDatabase::~StoreDatabase() {
     abandon();
@@ -112,7 +113,7 @@ StoreResult StoreDatabase::openFile() {
     const int code = sqlite3_open_v2(settings_.path.c_str(), &database_,
                                      SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE |
                                          SQLITE_OPEN_NOMUTEX | SQLITE_OPEN_EXRESCODE,
-                                     settings_.vfs);
+                                     disk_.name());
     if (code != SQLITE_OK) {
         return failureOf(code);
     }

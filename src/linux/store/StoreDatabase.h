@@ -23,6 +23,7 @@
 
 #include "common/Json.h"
 #include "linux/store/Schema.h"
+#include "linux/store/StoreDisk.h"
 #include "linux/store/StoreRow.h"
 #include "linux/store/StoreSqlite.h"
 
@@ -142,6 +143,7 @@ private:
     template <class... Values> StoreResult insertInto(StoreTable table, const Values&... values);
 
     const Settings settings_;
+    StoreDisk disk_;
     sqlite3* database_ = nullptr;
     std::array<StoreStatement, kStoreTables> inserts_;
     StoreStatement closeUpload_;
