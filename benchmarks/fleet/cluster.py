@@ -29,6 +29,7 @@ import stores  # noqa: E402
 
 HERE = os.path.dirname(os.path.abspath(__file__))
 START = 90   # seconds that a node may take
+SETTLE = 60  # seconds in which a node that was killed gives what only it has
 PAST = 3600  # how old the first message is: a node asks its memory for the last hours only
 
 
@@ -85,8 +86,11 @@ def make_device(number, program, root, node, seed):
 def run(arguments, devices, nodes, chance):
     first, second = nodes
     acts = [(chance.uniform(1, arguments.seconds - 1), None) for _ in range(arguments.kills)]
+    def kill_second():
+        first.await_ready()  # Of two that are away nobody is left to answer.
+        second.kill()
     acts += [(arguments.seconds * part, act) for part, act in (
-        (0.2, first.kill), (0.35, first.start), (0.6, second.kill), (0.7, second.start))]
+        (0.2, first.kill), (0.35, first.start), (0.6, kill_second), (0.7, second.start))]
     acts.sort(key=lambda act: act[0])
     began = time.monotonic()
     while (now := time.monotonic() - began) < arguments.seconds:
@@ -114,12 +118,22 @@ def finish(devices, nodes):
         list(pool.map(fleet.Device.drain, devices))
 
 
+def ask(node, device, wanted):
+    """What was sent while the other was away one node has alone, and tells when both have
+    found each other again."""
+    until = time.monotonic() + SETTLE
+    while len(set(names := node.names_of(device))) < wanted and time.monotonic() < until:
+        time.sleep(1)
+    return names
+
+
 def add_up(devices, nodes, chance):
     wanted = arrived = twice = lost = 0
     closes = True
     for device in devices:
-        names = chance.choice(nodes).names_of(device)
-        logs, there, counted = device.store.logs, set(names), device.losses()["logs"]
+        logs, counted = device.store.logs, device.losses()["logs"]
+        names = ask(chance.choice(nodes), device, len(logs) - counted)
+        there = set(names)
         if device.status != 0 or there - logs or len(logs - there) != counted:
             closes = False
             print(f"{device.name}: --once ended with {device.status}, {len(logs)} messages,"
