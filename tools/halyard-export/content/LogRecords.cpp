@@ -27,6 +27,10 @@ struct Severity {
 constexpr Severity kSeverities[] = {
     {log_record::kInfo, "INFO"}, {log_record::kWarn, "WARN"}, {log_record::kError, "ERROR"}};
 
+std::uint64_t kindOf(std::uint32_t category, std::uint16_t type) {
+    return (std::uint64_t{category} << 16U) | type;
+}
+
 int severityOf(std::uint32_t category, std::uint16_t type) {
     if (category == kAudioEventCategoryError) {
         return log_record::kError;
@@ -49,7 +53,7 @@ std::string eventName(std::uint32_t category, std::uint16_t type) {
 }
 
 std::string_view LogRecords::eventOf(std::uint32_t category, std::uint16_t type) {
-    const std::uint64_t key = (std::uint64_t{category} << 16U) | type;
+    const std::uint64_t key = kindOf(category, type);
     auto found = events_.find(key);
     if (found == events_.end()) {
         if (events_.size() >= kMostEvents) {
@@ -134,7 +138,8 @@ void LogRecords::addMessage(reading::StoreReader& reader, const reading::Row& ro
     if (session) {
         record_ += sessionBytes_;
     }
-    payload_.add(attributes_, log_record::kAttributes, row.text(kPayload));
+    payload_.addOfKind(attributes_, log_record::kAttributes, kindOf(category, type),
+                       row.text(kPayload));
 }
 
 void LogRecords::addSession(const BookedSession& session) {

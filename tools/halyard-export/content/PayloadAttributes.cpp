@@ -3,133 +3,40 @@
 #include <algorithm>
 
 #include "common/Utf8.h"
+#include "content/PayloadTranscoder.h"
 #include "reading/JsonFields.h"
-#include "reading/JsonNumbers.h"
 
 namespace halyard::exporting {
 namespace {
 
-// Deeper than any message that the daemon takes.
-constexpr std::size_t kMaxDepth = 128;
 constexpr const char* kSummaryKey = "HY_Session_Summary_Event";
+constexpr unsigned kFlags = rapidjson::kParseInsituFlag | rapidjson::kParseIterativeFlag |
+                            rapidjson::kParseNumbersAsStringsFlag;
+// Of what is remembered: clients make messages up.
+constexpr std::size_t kMostKinds = 128;
+constexpr std::size_t kMostKnownBytes = 4096;
+
+// What stands between the quotes of a key.
+std::string_view nameIn(std::string_view key) {
+    return key.substr(1, key.size() - 3);
+}
+
+rapidjson::SizeType lengthOf(std::string_view text) {
+    return static_cast<rapidjson::SizeType>(text.size());
+}
 
 } // namespace
 
-// Takes the events of the parser. An entry that is left out, or what is inside of it, is
-// `skipped_` containers deep.
-class PayloadAttributes::Transcoder {
-public:
-    using Length = rapidjson::SizeType;
-
-    Transcoder(PayloadAttributes& owner, AttributeBytes& bytes, otlp::Tag tag, const Passes& passes)
-        : owner_(owner), bytes_(bytes), tag_(tag), passes_(passes) {}
-
-    bool Null() { return put({}, bytes_.texts); }
-    bool Bool(bool value) { return put(otlp::AnyValue::ofBoolean(value), bytes_.numbers); }
-    bool Int64(std::int64_t value) { return put(otlp::AnyValue::ofInteger(value), bytes_.numbers); }
-    // What has no 64-bit integer there keeps its digits as a text.
-    bool Uint64(std::uint64_t value) {
-        return put(otlp::AnyValue::ofText(std::to_string(value)), bytes_.texts);
-    }
-    bool Double(double value) { return put(otlp::AnyValue::ofReal(value), bytes_.numbers); }
-    bool Int(int value) { return Int64(value); }
-    bool Uint(unsigned value) { return Int64(value); }
-    bool RawNumber(const char* text, Length length, bool /*copy*/) {
-        return reading::takeNumber({text, length}, *this);
-    }
-    bool String(const char* text, Length length, bool /*copy*/) {
-        const std::string_view view(text, length);
-        if (isSkipping() || !owner_.mayLeaveAsText(view)) {
-            return skip();
-        }
-        return put(otlp::AnyValue::ofText(view), bytes_.texts);
-    }
-    bool Key(const char* text, Length length, bool /*copy*/) {
-        if (skipped_ == 0) {
-            const std::string_view key(text, length);
-            (depth_ == 0 ? key_ : top().key) = key;
-            leavesOut_ = !owner_.mayLeave(key) || (depth_ == 0 && passes_ && passes_(key));
-        }
-        return true;
-    }
-    bool StartObject() { return begin(false); }
-    bool StartArray() { return begin(true); }
-    bool EndObject(Length /*count*/) { return end(); }
-    bool EndArray(Length /*count*/) { return end(); }
-
-private:
-    Container& top() { return owner_.containers_[depth_ - 1]; }
-    bool isSkipping() const { return skipped_ > 0 || leavesOut_; }
-    bool skip() {
-        leavesOut_ = false;
-        return true;
-    }
-    bool put(const otlp::AnyValue& value, std::string& bytes) {
-        if (isSkipping()) {
-            return skip();
-        }
-        if (!isBegun_) {
-            return false; // no object at all
-        }
-        if (depth_ == 0) {
-            otlp::appendAttribute(bytes, tag_, kPrefix, key_, value);
-        } else if (top().isList) {
-            otlp::appendItem(top().bytes, value);
-        } else {
-            otlp::appendEntry(top().bytes, top().key, value);
-        }
-        return true;
-    }
-    bool begin(bool isList) {
-        if (!isBegun_) {
-            isBegun_ = true;
-            return !isList;
-        }
-        if (isSkipping() || depth_ == kMaxDepth) {
-            ++skipped_;
-            return skip();
-        }
-        if (owner_.containers_.size() == depth_) {
-            owner_.containers_.emplace_back();
-        }
-        ++depth_;
-        top().bytes.clear();
-        top().isList = isList;
-        return true;
-    }
-    bool end() {
-        if (skipped_ > 0) {
-            --skipped_;
-            return true;
-        }
-        if (depth_ == 0) {
-            return true; // the object itself
-        }
-        const Container& ended = top();
-        --depth_;
-        return put(ended.isList ? otlp::AnyValue::ofList(ended.bytes)
-                                : otlp::AnyValue::ofDictionary(ended.bytes),
-                   bytes_.texts);
-    }
-
-    PayloadAttributes& owner_;
-    AttributeBytes& bytes_;
-    const otlp::Tag tag_;
-    const Passes& passes_;
-    std::string_view key_; // of the attribute
-    bool isBegun_ = false;
-    bool leavesOut_ = false; // the value that comes next
-    std::size_t skipped_ = 0;
-    std::size_t depth_ = 0;
-};
-
 // Compared with what leaves, so in the same form.
 void PayloadAttributes::setNames(std::vector<std::string> names) {
-    names_ = std::move(names);
-    for (std::string& name : names_) {
+    for (std::string& name : names) {
         if (!isValidUtf8(name)) {
             name = replaceInvalidUtf8(name);
         }
+    }
+    if (names != names_) {
+        names_ = std::move(names);
+        known_.clear(); // other entries may leave now
     }
 }
 
@@ -157,8 +64,6 @@ bool PayloadAttributes::isSummary(std::string_view json) const {
 
 void PayloadAttributes::add(AttributeBytes& bytes, otlp::Tag tag, std::string_view json,
                             const Passes& passes) {
-    constexpr unsigned kFlags = rapidjson::kParseInsituFlag | rapidjson::kParseIterativeFlag |
-                                rapidjson::kParseNumbersAsStringsFlag;
     // The whole text at once instead of each key and value.
     isValidUtf8(json) ? json_.assign(json) : json_.assign(replaceInvalidUtf8(json));
     isSummary_ = isSummary(json_);
@@ -171,6 +76,103 @@ void PayloadAttributes::add(AttributeBytes& bytes, otlp::Tag tag, std::string_vi
         bytes.numbers.resize(numbers);
     }
     isSummary_ = false;
+}
+
+void PayloadAttributes::addOfKind(AttributeBytes& bytes, otlp::Tag tag, std::uint64_t kind,
+                                  std::string_view json, const Passes& passes) {
+    if (json.size() > kMostKnownBytes || json.find(kSummaryKey) != std::string_view::npos) {
+        return add(bytes, tag, json, passes);
+    }
+    if (known_.size() >= kMostKinds && !known_.contains(kind)) {
+        known_.clear();
+    }
+    const std::size_t texts = bytes.texts.size();
+    const std::size_t numbers = bytes.numbers.size();
+    Transcoder transcoder(*this, bytes, tag, passes);
+    JsonCursor cursor(json);
+    if (!addAgain(transcoder, bytes, cursor, known_[kind], passes)) {
+        bytes.texts.resize(texts);
+        bytes.numbers.resize(numbers);
+        add(bytes, tag, json, passes);
+    }
+}
+
+// False where the text is not as plain as that, or no object at all.
+bool PayloadAttributes::addAgain(Transcoder& transcoder, AttributeBytes& bytes, JsonCursor& cursor,
+                                 KnownEntries& known, const Passes& passes) {
+    if (!cursor.take('{') || !transcoder.StartObject()) {
+        return false;
+    }
+    for (std::size_t i = 0;; ++i) {
+        if (known.size() == i) {
+            known.emplace_back();
+        }
+        if (!meet(cursor, known[i], passes) || !addEntry(transcoder, bytes, cursor, known[i])) {
+            return false;
+        }
+        if (cursor.take('}')) {
+            return cursor.isAtEnd();
+        }
+        if (!cursor.take(',')) {
+            return false;
+        }
+    }
+}
+
+// The key that comes next; what is known of another is forgotten.
+bool PayloadAttributes::meet(JsonCursor& cursor, Known& known, const Passes& passes) const {
+    if (!known.key.empty() && cursor.take(known.key)) {
+        return true;
+    }
+    known.key = cursor.takeKey();
+    known.text.clear();
+    if (known.key.empty() || !isValidUtf8(known.key)) {
+        known.key.clear();
+        return false;
+    }
+    const std::string_view name = nameIn(known.key);
+    known.leaves = mayLeave(name) && !(passes && passes(name));
+    return true;
+}
+
+bool PayloadAttributes::addEntry(Transcoder& transcoder, AttributeBytes& bytes, JsonCursor& cursor,
+                                 Known& known) {
+    if (!known.text.empty() && cursor.takeValue(known.text)) {
+        bytes.texts += known.bytes;
+        return true;
+    }
+    transcoder.expect(nameIn(known.key), known.leaves);
+    const std::string_view number = cursor.takeNumber();
+    if (!number.empty()) {
+        return transcoder.RawNumber(number.data(), lengthOf(number), true);
+    }
+    const std::size_t start = cursor.at();
+    const std::size_t texts = bytes.texts.size();
+    const std::size_t numbers = bytes.numbers.size();
+    const std::string_view text = cursor.takeText();
+    if (!text.empty()) {
+        if (!isValidUtf8(text) || !transcoder.String(text.data() + 1, lengthOf(text) - 2, true)) {
+            return false;
+        }
+    } else if (!addValue(transcoder, cursor)) {
+        return false;
+    }
+    // What stands among the numbers is as soon read again.
+    known.text = bytes.numbers.size() == numbers ? cursor.since(start) : std::string_view();
+    known.bytes.assign(bytes.texts, texts);
+    return true;
+}
+
+// Whatever is a value, by the parser.
+bool PayloadAttributes::addValue(Transcoder& transcoder, JsonCursor& cursor) {
+    json_ = cursor.rest();
+    rapidjson::InsituStringStream stream(json_.data());
+    if (reader_.Parse<kFlags | rapidjson::kParseStopWhenDoneFlag>(stream, transcoder).IsError()) {
+        return false;
+    }
+    const std::size_t start = cursor.at();
+    cursor.skip(stream.Tell());
+    return isValidUtf8(cursor.since(start));
 }
 
 void PayloadAttributes::addText(std::string& bytes, otlp::Tag tag, std::string_view key,

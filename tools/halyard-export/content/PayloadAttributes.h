@@ -5,16 +5,23 @@
 // is kept apart from what mostly stays the same, because what stays the same is compressed
 // best in one piece.
 //
+// Messages of a kind mostly say the same in the same order. So the entries of the last of a
+// kind are remembered, and what is said again is not read again; what is not as expected is
+// left to the parser, which comes to the same.
+//
 // Not thread-safe: the scratch buffers are used again.
 #pragma once
 
+#include <cstdint>
 #include <functional>
 #include <string>
 #include <string_view>
+#include <unordered_map>
 #include <vector>
 
 #include <rapidjson/reader.h>
 
+#include "content/JsonCursor.h"
 #include "content/Omission.h"
 #include "otlp/Attributes.h"
 
@@ -49,6 +56,10 @@ public:
     // is no object has none.
     void add(AttributeBytes& bytes, otlp::Tag tag, std::string_view json,
              const Passes& passes = nullptr);
+    // The same, sooner, where messages of this kind have been. Requires the same `tag` and
+    // `passes` for all of a kind.
+    void addOfKind(AttributeBytes& bytes, otlp::Tag tag, std::uint64_t kind, std::string_view json,
+                   const Passes& passes = nullptr);
     // One entry; nothing where it is left out.
     void addText(std::string& bytes, otlp::Tag tag, std::string_view key, std::string_view text);
 
@@ -60,6 +71,20 @@ private:
         bool isList = false;
     };
 
+    // An entry of the message before.
+    struct Known {
+        std::string key; // as JSON, with the colon
+        bool leaves = false;
+        std::string text;  // a value as JSON that became...
+        std::string bytes; // ...these attributes; none where `text` is empty
+    };
+    using KnownEntries = std::vector<Known>;
+
+    bool addAgain(Transcoder& transcoder, AttributeBytes& bytes, JsonCursor& cursor,
+                  KnownEntries& known, const Passes& passes);
+    bool addEntry(Transcoder& transcoder, AttributeBytes& bytes, JsonCursor& cursor, Known& known);
+    bool addValue(Transcoder& transcoder, JsonCursor& cursor);
+    bool meet(JsonCursor& cursor, Known& known, const Passes& passes) const;
     bool mayLeave(std::string_view key) const;
     bool mayLeaveAsText(std::string_view text) const;
     bool namesApplication(std::string_view text) const;
@@ -69,8 +94,9 @@ private:
     std::vector<std::string> names_;
     bool isSummary_ = false;
     rapidjson::Reader reader_;
-    std::string json_;                  // which is parsed in its place
-    std::vector<Container> containers_; // by their depth
+    std::string json_;                                      // which is parsed in its place
+    std::vector<Container> containers_;                     // by their depth
+    std::unordered_map<std::uint64_t, KnownEntries> known_; // by their kind
 };
 
 } // namespace halyard::exporting

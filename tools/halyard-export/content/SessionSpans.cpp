@@ -21,6 +21,9 @@ constexpr const char* kBinary = "application_binary";
 constexpr std::string_view kStamps[] = {"hyreporting_timestamp", "systemuptime_sec",
                                         "processuptime_ms", "audiotag"};
 
+// Kinds of what is told of sessions.
+enum Kind : std::uint8_t { kVolume, kRoute, kGlitch };
+
 bool isStamp(std::string_view key) {
     return std::find(std::begin(kStamps), std::end(kStamps), key) != std::end(kStamps);
 }
@@ -106,9 +109,10 @@ void SessionSpans::addProcess(const BookedSession& session) {
     });
 }
 
-void SessionSpans::addPayload(std::string& bytes, Tag tag, std::string_view payload) {
+void SessionSpans::addPayload(std::string& bytes, Tag tag, std::uint64_t kind,
+                              std::string_view payload) {
     attributes_.clear();
-    payload_.add(attributes_, tag, payload, isStamp);
+    payload_.addOfKind(attributes_, tag, kind, payload, isStamp);
     bytes.append(attributes_.texts).append(attributes_.numbers);
 }
 
@@ -125,8 +129,9 @@ void SessionSpans::addEvents(Writer& span, const SessionContents& contents) {
         span.add_message(span::kEvents, event);
     };
     for (const TimedPayload& change : contents.changes) {
-        begin(change.category == kAudioEventCategoryVolume ? "halyard.volume" : "halyard.route");
-        addPayload(event, span::kEventAttributes, change.payload);
+        const bool isVolume = change.category == kAudioEventCategoryVolume;
+        begin(isVolume ? "halyard.volume" : "halyard.route");
+        addPayload(event, span::kEventAttributes, isVolume ? kVolume : kRoute, change.payload);
         end(change.time);
     }
     for (const auto& [key, glitch] : contents.glitches) {
@@ -155,7 +160,7 @@ std::string SessionSpans::glitchSpan(const BookedSession& session, const GlitchF
     span.add_string(span::kName, "glitch");
     span.add_enum(span::kKind, span::kInternal);
     addTimes(span, glitch.start, glitch.start + glitch.seconds.value_or(0));
-    addPayload(bytes, span::kAttributes, glitch.payload);
+    addPayload(bytes, span::kAttributes, kGlitch, glitch.payload);
     return bytes;
 }
 

@@ -4,6 +4,7 @@
 // Not thread-safe.
 #pragma once
 
+#include <cstdint>
 #include <vector>
 
 #include "content/PayloadAttributes.h"
@@ -27,7 +28,8 @@ private:
     void addGlitch(std::string& event, const GlitchFacts& glitch);
     void addFacts(std::string& bytes, const BookedSession& session);
     void addProcess(const BookedSession& session);
-    void addPayload(std::string& bytes, otlp::Tag tag, std::string_view payload);
+    void addPayload(std::string& bytes, otlp::Tag tag, std::uint64_t kind,
+                    std::string_view payload);
     std::string glitchSpan(const BookedSession& session, const GlitchFacts& glitch);
 
     const Identity& identity_;
