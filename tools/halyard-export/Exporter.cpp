@@ -133,7 +133,7 @@ Outcome<void> Exporter::send(Signal signal, Batch& batch, Step& step) {
     Lane& lane = laneOf(signal);
     const Load load = loadOf(batch);
     const double now = world_.now();
-    if (place_.counts(now).bytesToday + load.body.size() > plan_.options.maxBytesPerDay) {
+    if (place_.bytesToday(now) + load.body.size() > plan_.options.maxBytesPerDay) {
         lane.notBefore = (std::floor(now / kDay) + 1) * kDay;
         step.isLeft = true;
         step.next = std::min(step.next, lane.notBefore);

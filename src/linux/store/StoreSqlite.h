@@ -70,6 +70,7 @@ public:
         return sqlite3_prepare_v3(database, sql.data(), static_cast<int>(sql.size()),
                                   SQLITE_PREPARE_PERSISTENT, &statement_, nullptr);
     }
+    bool isPrepared() const { return statement_ != nullptr; }
     void finalize() {
         sqlite3_finalize(statement_);
         statement_ = nullptr;

@@ -4,9 +4,6 @@
 #include <cmath>
 #include <ctime>
 #include <fmt/format.h>
-#include <sqlite3.h>
-
-#include "linux/store/StoreSqlite.h"
 
 namespace halyard::exporting {
 namespace {
@@ -38,6 +35,27 @@ bool isDamage(int code) {
 }
 
 } // namespace
+
+// A statement of the place's while it is used: one that is not reset would keep the file from
+// being written to.
+class ExportPlace::Use {
+public:
+    // Requires a literal.
+    Use(const ExportPlace& place, std::string_view sql) : statement_(place.statements_[sql]) {
+        isReady_ =
+            statement_.isPrepared() || statement_.prepare(place.database_.get(), sql) == SQLITE_OK;
+    }
+    ~Use() { statement_.reset(); }
+    Use(const Use&) = delete;
+    Use& operator=(const Use&) = delete;
+
+    explicit operator bool() const { return isReady_; }
+    linux_::StoreStatement* operator->() { return &statement_; }
+
+private:
+    linux_::StoreStatement& statement_;
+    bool isReady_ = false;
+};
 
 std::string dayOf(double now) {
     const auto whole = static_cast<std::time_t>(std::floor(now));
@@ -147,14 +165,19 @@ Outcome<void> ExportPlace::execute(const std::string& sql) {
                : trouble();
 }
 
+Outcome<void> ExportPlace::run(std::string_view sql) {
+    Use statement(*this, sql);
+    return statement && statement->run() == SQLITE_OK ? Outcome<void>() : trouble();
+}
+
 std::optional<std::string> ExportPlace::fact(std::string_view name) const {
-    StoreStatement statement;
-    if (statement.prepare(database_.get(), "SELECT value FROM fact WHERE name = ?") != SQLITE_OK) {
+    Use statement(*this, "SELECT value FROM fact WHERE name = ?");
+    if (!statement) {
         return std::nullopt;
     }
-    statement.bind(1, name);
-    return statement.step() == SQLITE_ROW ? std::optional(std::string(statement.text(0)))
-                                          : std::nullopt;
+    statement->bind(1, name);
+    return statement->step() == SQLITE_ROW ? std::optional(std::string(statement->text(0)))
+                                           : std::nullopt;
 }
 
 std::optional<double> ExportPlace::realFact(std::string_view name) const {
@@ -163,13 +186,12 @@ std::optional<double> ExportPlace::realFact(std::string_view name) const {
 }
 
 bool ExportPlace::setFact(std::string_view name, std::string_view value) {
-    StoreStatement statement;
-    if (statement.prepare(database_.get(), "INSERT OR REPLACE INTO fact VALUES(?, ?)") !=
-        SQLITE_OK) {
+    Use statement(*this, "INSERT OR REPLACE INTO fact VALUES(?, ?)");
+    if (!statement) {
         return false;
     }
-    statement.bindFrom(1, name, value);
-    return statement.run() == SQLITE_OK;
+    statement->bindFrom(1, name, value);
+    return statement->run() == SQLITE_OK;
 }
 
 Outcome<void> ExportPlace::follow(const std::string& device) {
@@ -184,25 +206,23 @@ Outcome<void> ExportPlace::follow(const std::string& device) {
 }
 
 Position ExportPlace::positionOf(Signal signal, const std::string& table) const {
-    StoreStatement statement;
-    if (statement.prepare(database_.get(),
-                          "SELECT id, time FROM place WHERE signal = ? AND source = ?") !=
-        SQLITE_OK) {
+    Use statement(*this, "SELECT id, time FROM place WHERE signal = ? AND source = ?");
+    if (!statement) {
         return {};
     }
-    statement.bindFrom(1, nameOf(signal), std::string_view(table));
-    return statement.step() == SQLITE_ROW ? Position{statement.integer(0), statement.real(1)}
-                                          : Position{};
+    statement->bindFrom(1, nameOf(signal), std::string_view(table));
+    return statement->step() == SQLITE_ROW ? Position{statement->integer(0), statement->real(1)}
+                                           : Position{};
 }
 
 std::vector<LateRows> ExportPlace::lateRows(Signal signal, const std::string& table) const {
     std::vector<LateRows> all;
-    StoreStatement statement;
-    if (statement.prepare(database_.get(), "SELECT id, time, before FROM late WHERE signal = ? "
-                                           "AND source = ? ORDER BY before") == SQLITE_OK) {
-        statement.bindFrom(1, nameOf(signal), std::string_view(table));
-        while (statement.step() == SQLITE_ROW) {
-            all.push_back({{statement.integer(0), statement.real(1)}, statement.integer(2)});
+    Use statement(*this, "SELECT id, time, before FROM late WHERE signal = ? AND source = ? "
+                         "ORDER BY before");
+    if (statement) {
+        statement->bindFrom(1, nameOf(signal), std::string_view(table));
+        while (statement->step() == SQLITE_ROW) {
+            all.push_back({{statement->integer(0), statement->real(1)}, statement->integer(2)});
         }
     }
     return all;
@@ -211,12 +231,12 @@ std::vector<LateRows> ExportPlace::lateRows(Signal signal, const std::string& ta
 std::vector<std::int64_t> ExportPlace::openSessions(Signal signal, std::int64_t after,
                                                     std::size_t most) const {
     std::vector<std::int64_t> rows;
-    StoreStatement statement;
-    if (statement.prepare(database_.get(), "SELECT id FROM open_session WHERE signal = ? AND "
-                                           "id > ? ORDER BY id LIMIT ?") == SQLITE_OK) {
-        statement.bindFrom(1, nameOf(signal), after, static_cast<std::int64_t>(most));
-        while (statement.step() == SQLITE_ROW) {
-            rows.push_back(statement.integer(0));
+    Use statement(*this, "SELECT id FROM open_session WHERE signal = ? AND id > ? ORDER BY id "
+                         "LIMIT ?");
+    if (statement) {
+        statement->bindFrom(1, nameOf(signal), after, static_cast<std::int64_t>(most));
+        while (statement->step() == SQLITE_ROW) {
+            rows.push_back(statement->integer(0));
         }
     }
     return rows;
@@ -226,22 +246,22 @@ Outcome<void> ExportPlace::commit(Signal signal, const PlaceChange& change, doub
     if (change.isNothing()) {
         return {};
     }
-    if (auto begun = execute("BEGIN IMMEDIATE"); !begun.ok()) {
+    if (auto begun = run("BEGIN IMMEDIATE"); !begun.ok()) {
         return begun;
     }
     auto written = write(signal, change, now);
-    const auto ended = execute(written.ok() ? "COMMIT" : "ROLLBACK");
+    const auto ended = run(written.ok() ? "COMMIT" : "ROLLBACK");
     return written.ok() ? ended : written;
 }
 
 Outcome<void> ExportPlace::write(Signal signal, const PlaceChange& change, double now) {
     const auto run = [&](const char* sql, const auto&... values) {
-        StoreStatement statement;
-        if (statement.prepare(database_.get(), sql) != SQLITE_OK) {
+        Use statement(*this, sql);
+        if (!statement) {
             return false;
         }
-        statement.bindFrom(1, nameOf(signal), values...);
-        return statement.run() == SQLITE_OK;
+        statement->bindFrom(1, nameOf(signal), values...);
+        return statement->run() == SQLITE_OK;
     };
     bool isGood = true;
     for (const auto& [table, position] : change.positions) {
@@ -271,12 +291,12 @@ Outcome<void> ExportPlace::write(Signal signal, const PlaceChange& change, doubl
                                static_cast<std::int64_t>(loss), static_cast<std::int64_t>(count));
     }
     if (isGood && change.bytesSent > 0) {
-        const ExportCounts before = counts(now);
+        const std::uint64_t before = bytesToday(now);
         isGood = run("INSERT INTO sent VALUES(?1, ?2) ON CONFLICT DO UPDATE SET "
                      "count = count + excluded.count",
                      static_cast<std::int64_t>(change.records)) &&
                  setFact("day", dayOf(now)) &&
-                 setFact("bytes_today", std::to_string(before.bytesToday + change.bytesSent)) &&
+                 setFact("bytes_today", std::to_string(before + change.bytesSent)) &&
                  setFact("last_success", fmt::format("{}", now));
     }
     return isGood ? Outcome<void>() : trouble();
@@ -288,29 +308,29 @@ Outcome<void> ExportPlace::noteFailure(const std::string& error, double now) {
     return isNoted ? Outcome<void>() : trouble();
 }
 
+std::uint64_t ExportPlace::bytesToday(double now) const {
+    return fact("day") == dayOf(now)
+               ? static_cast<std::uint64_t>(realFact("bytes_today").value_or(0))
+               : 0;
+}
+
 ExportCounts ExportPlace::counts(double now) const {
     ExportCounts counts;
-    StoreStatement losses;
-    if (losses.prepare(database_.get(), "SELECT signal, reason, count FROM loss") == SQLITE_OK) {
-        while (losses.step() == SQLITE_ROW) {
-            const auto reason = static_cast<std::size_t>(losses.integer(1));
-            if (reason < kLossNames.size()) {
-                counts.losses[{std::string(losses.text(0)), static_cast<Loss>(reason)}] =
-                    static_cast<std::uint64_t>(losses.integer(2));
-            }
+    Use losses(*this, "SELECT signal, reason, count FROM loss");
+    while (losses && losses->step() == SQLITE_ROW) {
+        const auto reason = static_cast<std::size_t>(losses->integer(1));
+        if (reason < kLossNames.size()) {
+            counts.losses[{std::string(losses->text(0)), static_cast<Loss>(reason)}] =
+                static_cast<std::uint64_t>(losses->integer(2));
         }
     }
-    StoreStatement sent;
-    if (sent.prepare(database_.get(), "SELECT signal, count FROM sent") == SQLITE_OK) {
-        while (sent.step() == SQLITE_ROW) {
-            counts.sent[std::string(sent.text(0))] = static_cast<std::uint64_t>(sent.integer(1));
-        }
+    Use sent(*this, "SELECT signal, count FROM sent");
+    while (sent && sent->step() == SQLITE_ROW) {
+        counts.sent[std::string(sent->text(0))] = static_cast<std::uint64_t>(sent->integer(1));
     }
     counts.since = realFact("since").value_or(now);
     counts.day = dayOf(now);
-    if (fact("day") == counts.day) {
-        counts.bytesToday = static_cast<std::uint64_t>(realFact("bytes_today").value_or(0));
-    }
+    counts.bytesToday = bytesToday(now);
     counts.lastSuccess = realFact("last_success");
     counts.lastFailure = realFact("last_failure");
     counts.lastError = fact("last_error").value_or("");
