@@ -113,7 +113,9 @@ Outcome<void> Exporter::stepOf(Signal signal, Step& step) {
         return {};
     }
     if (batch.body.count() > 0) {
-        return send(signal, batch, step);
+        auto sent = send(signal, batch, step);
+        collector_->takeBack(std::move(batch.body));
+        return sent;
     }
     step.hasMore = step.hasMore || batch.hasMore;
     return place_.commit(signal, batch.change, world_.now());

@@ -34,6 +34,13 @@ Outcome<Batch> Collector::collect(Signal signal, StoreReader& reader, const Expo
     }
 }
 
+Batch Collector::emptyBatch() {
+    Batch batch;
+    batch.body = std::exchange(spare_, {});
+    batch.body.clear();
+    return batch;
+}
+
 void Collector::arrived(Signal signal) {
     if (signal == Signal::Metrics) {
         told_ = telling_;
@@ -46,7 +53,7 @@ void Collector::arrived(Signal signal) {
 }
 
 Outcome<Batch> Collector::collectLogs(StoreReader& reader, const ExportPlace& place) {
-    Batch batch;
+    Batch batch = emptyBatch();
     // A session may have got its row, or been closed, since the last look.
     records_.forget();
     for (std::size_t table = 0; table < kLogTables.size() && !batch.hasMore; ++table) {
@@ -152,7 +159,7 @@ Outcome<Batch> Collector::collectTraces(StoreReader& reader, const ExportPlace& 
     if (!contents.ok()) {
         return contents.failure();
     }
-    Batch batch;
+    Batch batch = emptyBatch();
     batch.change = std::move(walk.value().change);
     batch.hasMore = walk.value().hasMore;
     SessionSpans spans(scope_.identity, scope_.omission);
@@ -260,7 +267,7 @@ Outcome<Batch> Collector::collectMetrics(StoreReader& reader, const ExportPlace&
     if (!contents.ok()) {
         return contents.failure();
     }
-    Batch batch;
+    Batch batch = emptyBatch();
     batch.change = std::move(walk.value().change);
     batch.hasMore = walk.value().hasMore;
     Metrics metrics(scope_.omission, scope_.drivers);

@@ -70,6 +70,8 @@ public:
                                     const ExportPlace& place, double now);
     // The batch of this signal that was taken last has arrived, or was given up.
     void arrived(Signal signal);
+    // The body of a batch that is done with: its memory is used for the next.
+    void takeBack(otlp::RequestBody body) { spare_ = std::move(body); }
 
 private:
     struct Rows {
@@ -86,6 +88,7 @@ private:
     };
     using Totals = std::map<Loss, std::uint64_t>;
 
+    Batch emptyBatch();
     reading::Outcome<Batch> collectLogs(reading::StoreReader& reader, const ExportPlace& place);
     reading::Outcome<Batch> collectTraces(reading::StoreReader& reader, const ExportPlace& place,
                                           double now);
@@ -107,6 +110,7 @@ private:
     SessionBook sessions_;
     SessionWalk walk_;
     LogRecords records_;
+    otlp::RequestBody spare_;
     std::optional<Gathered> gathered_; // for the signal that comes second
     Totals told_;
     Totals telling_;

@@ -55,6 +55,9 @@ bool PayloadAttributes::mayLeaveAsText(std::string_view text) const {
 }
 
 bool PayloadAttributes::isSummary(std::string_view json) const {
+    if (json.starts_with(R"({"HY_Session_Summary_Event")")) {
+        return true; // if it is an object at all; else nothing of it leaves
+    }
     if (json.find(kSummaryKey) == std::string_view::npos) {
         return false;
     }

@@ -52,6 +52,8 @@ const std::vector<std::string> kTexts = {
     R"({"secret":1e999,"passed":"y"})",
     R"({"a":"said by player","player":1})",
     R"({"a":"x","HY_Session_Summary_Event":"1","b":"secret = 1"})",
+    R"({"HY_Session_Summary_Event":"1","b":"secret = 1"})",
+    R"({"HY_Session_Summary_Events":"1","b":"secret = 1"})",
 };
 
 bool passes(std::string_view key) {
@@ -101,6 +103,17 @@ TEST_F(PayloadAttributesTest, AMessageThatIsBrokenAnywhereIsTheSameWhateverWasBe
         EXPECT_EQ(bytesOf(payload, whole.substr(0, at), true), alone(whole.substr(0, at)));
         EXPECT_EQ(bytesOf(payload, whole, true), alone(whole));
     }
+}
+
+TEST_F(PayloadAttributesTest, OnlyInASummaryATextIsLookedThroughForKeys) {
+    const std::string text = R"("b":"secret = 1"})";
+    const auto leaves = [&](const std::string& begin) {
+        return alone(begin + text).find("secret = 1") != std::string::npos;
+    };
+    EXPECT_FALSE(leaves(R"({"HY_Session_Summary_Event":"1",)"));
+    EXPECT_FALSE(leaves(R"({"a":1,"HY_Session_Summary_Event":"1",)"));
+    EXPECT_TRUE(leaves(R"({"HY_Session_Summary_Events":"1",)"));
+    EXPECT_TRUE(leaves(R"({"a":{"HY_Session_Summary_Event":"1"},)"));
 }
 
 TEST_F(PayloadAttributesTest, AnotherApplicationsNameIsAnotherMatter) {

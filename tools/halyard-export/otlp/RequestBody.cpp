@@ -29,13 +29,33 @@ std::string scopeField() {
 } // namespace
 
 RequestBody::Items& RequestBody::itemsOf(std::string_view kind) {
-    const auto found = std::find_if(kinds_.begin(), kinds_.end(),
-                                    [kind](const Items& each) { return each.kind == kind; });
-    if (found != kinds_.end()) {
+    const auto end = kinds_.begin() + static_cast<std::ptrdiff_t>(used_);
+    const auto found =
+        std::find_if(kinds_.begin(), end, [kind](const Items& each) { return each.kind == kind; });
+    if (found != end) {
         return *found;
     }
-    return kinds_.size() < kMostKinds ? kinds_.emplace_back(Items{std::string(kind), {}})
-                                      : kinds_.back();
+    if (used_ == kMostKinds) {
+        return kinds_.back();
+    }
+    if (used_ == kinds_.size()) {
+        kinds_.emplace_back();
+    }
+    Items& items = kinds_[used_++];
+    items.kind = kind;
+    return items;
+}
+
+void RequestBody::clear() {
+    std::size_t kept = 0;
+    for (Items& items : kinds_) {
+        items.bytes.clear();
+        kept += items.bytes.capacity();
+    }
+    if (kept > kMostKept) {
+        kinds_.clear();
+    }
+    used_ = count_ = bytes_ = 0;
 }
 
 void RequestBody::add(std::string_view item, std::string_view kind) {
@@ -60,8 +80,8 @@ void RequestBody::finish(std::string_view attributes, std::string& body) const {
     body = headOf(request::kResourceItems, inner);
     body.reserve(body.size() + inner);
     body.append(resource).append(scope);
-    for (const Items& items : kinds_) {
-        body.append(items.bytes);
+    for (std::size_t i = 0; i < used_; ++i) {
+        body.append(kinds_[i].bytes);
     }
 }
 

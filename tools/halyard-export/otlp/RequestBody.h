@@ -19,6 +19,8 @@ class RequestBody {
 public:
     // `item` is an encoded LogRecord, Span or Metric.
     void add(std::string_view item, std::string_view kind = {});
+    // As new, but for the memory of what was in it.
+    void clear();
     std::size_t count() const { return count_; }
     // Of the items alone.
     std::size_t bytes() const { return bytes_; }
@@ -30,6 +32,8 @@ public:
 private:
     // Clients make kinds up: what comes beyond these goes with the last.
     static constexpr std::size_t kMostKinds = 32;
+    // Of what is kept for the next.
+    static constexpr std::size_t kMostKept = 4 * 1024 * 1024;
     struct Items {
         std::string kind;
         std::string bytes;
@@ -37,6 +41,7 @@ private:
     Items& itemsOf(std::string_view kind);
 
     std::vector<Items> kinds_;
+    std::size_t used_ = 0; // of these kinds
     std::size_t count_ = 0;
     std::size_t bytes_ = 0;
 };
