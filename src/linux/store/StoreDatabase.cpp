@@ -203,7 +203,8 @@ StoreResult StoreDatabase::migrate() {
 }
 
 StoreResult StoreDatabase::prepare() {
-    int code = SQLITE_OK;
+    int code = messages_.attach(database_);
+    code = code == SQLITE_OK ? events_.attach(database_) : code;
     const auto add = [&](StoreStatement& statement, std::string_view sql) {
         if (code == SQLITE_OK) {
             code = statement.prepare(database_, sql);
@@ -212,6 +213,11 @@ StoreResult StoreDatabase::prepare() {
     for (std::size_t i = 0; i < kStoreTables; ++i) {
         add(inserts_[i], storeInsert(kStoreSchema[i], "INSERT"));
     }
+    add(takeMessages_, messages_.insertAll());
+    add(takeEvents_, events_.insertAll());
+    add(savepoint_, "SAVEPOINT together");
+    add(rollBackTo_, "ROLLBACK TO together");
+    add(release_, "RELEASE together");
     add(closeUpload_, "UPDATE upload_session SET closed = ?, ended = ? WHERE id = ?");
     add(findUpload_, "SELECT 1 FROM upload_session WHERE id = ? AND session_id IS ?");
     add(begin_, "BEGIN IMMEDIATE");
@@ -325,7 +331,8 @@ void StoreDatabase::abandon() {
         insert.finalize();
     }
     for (StoreStatement* statement :
-         {&closeUpload_, &findUpload_, &begin_, &commit_, &countPages_}) {
+         {&takeMessages_, &takeEvents_, &savepoint_, &rollBackTo_, &release_, &closeUpload_,
+          &findUpload_, &begin_, &commit_, &countPages_}) {
         statement->finalize();
     }
     sqlite3_close_v2(database_);

@@ -16,6 +16,8 @@
 #include <filesystem>
 #include <limits>
 #include <memory>
+#include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -24,6 +26,7 @@
 #include "common/Json.h"
 #include "linux/store/Schema.h"
 #include "linux/store/StoreDisk.h"
+#include "linux/store/StoreIntake.h"
 #include "linux/store/StoreRow.h"
 #include "linux/store/StoreSqlite.h"
 
@@ -88,6 +91,18 @@ public:
     StoreResult insert(const StoreRepeatRow& row);
     // The row that the last insert wrote, which of a session's is the message.
     const Inserted& lastInserted() const { return inserted_; }
+
+    // Rows that come in numbers, and may be inserted together with others of their table:
+    // once they are ready, which may fail for each as its insert.
+    static bool comesInNumbers(const StoreRow& row);
+    StoreResult makeReady(const StoreRow& row);
+    // By one statement, in this order; none for those that are to be inserted by
+    // themselves, because they will be refused. False, and none of them is there, when all
+    // are to be. A failure concerns the whole group.
+    using Items = std::span<StoreItem* const>;
+    using InsertedEach = std::vector<std::optional<Inserted>>;
+    Result<bool, StoreFailure> insertTogether(StoreTable table, Items items,
+                                              InsertedEach& inserted);
     // Rolls back when it fails.
     StoreResult commit();
     void rollback();
@@ -141,11 +156,28 @@ private:
 
     StoreResult ensureUpload(const StoreUploadPtr& upload);
     template <class... Values> StoreResult insertInto(StoreTable table, const Values&... values);
+    // The columns of rows that come in numbers; the id stays as it is.
+    class Joined;
+    void fill(StoreIntake::Cells& cells, const StoreMessageRow& row);
+    void fill(StoreIntake::Cells& cells, const StoreSingleRow& row);
+    void fill(StoreIntake::Cells& cells, const StoreAnalyticsRow& row);
+    StoreResult insertCells(StoreTable table);
+    StoreResult runInsert(StoreTable table, std::uint64_t bytes);
 
     const Settings settings_;
     StoreDisk disk_;
     sqlite3* database_ = nullptr;
     std::array<StoreStatement, kStoreTables> inserts_;
+    StoreIntake messages_{storeSchema(StoreTable::UploadMessage)};
+    StoreIntake events_{storeSchema(StoreTable::AnalyticsEvent)};
+    StoreStatement takeMessages_;
+    StoreStatement takeEvents_;
+    StoreStatement savepoint_;
+    StoreStatement rollBackTo_;
+    StoreStatement release_;
+    // Of a row that is inserted by itself.
+    StoreIntake::Cells cells_ =
+        StoreIntake::Cells(1 + storeSchema(StoreTable::UploadMessage).columns.size());
     StoreStatement closeUpload_;
     StoreStatement findUpload_;
     StoreStatement begin_;

@@ -334,40 +334,12 @@ StoreResult StoreWriter::writeRows(std::span<StoreItem> group) {
     return result;
 }
 
-StoreResult StoreWriter::insertAll(std::span<StoreItem> group) {
-    rejected_.clear();
-    for (StoreItem& item : group) {
-        buildPayload(item);
-        StoreResult inserted =
-            std::visit([this](const auto& row) { return database_.insert(row); }, item.row);
-        if (inserted.ok()) {
-            shares_.note(item, database_.lastInserted());
-            continue;
-        }
-        if (!concernsOneRow(inserted.failure())) {
-            return inserted;
-        }
-        rejected_.push_back(tableOf(item.row));
-        rejection_ = inserted.failure().text;
-    }
-    return {};
-}
-
 StoreResult StoreWriter::trim(const StoreLimits& bounds, bool ageDue, bool& more) {
     if (StoreResult known = age_.update(database_); !known.ok()) {
         return known;
     }
     const auto oldest = ageDue ? std::optional(age_.oldest(bounds.maxAge)) : std::nullopt;
     return retention_.trim(database_, bounds.maxBytes, oldest, more);
-}
-
-// What was built is kept in the row: its group may be written again.
-void StoreWriter::buildPayload(StoreItem& item) {
-    auto* const event = std::get_if<StoreAnalyticsRow>(&item.row);
-    if (event != nullptr && !event->isBuilt()) {
-        event->build();
-        queue_->payloadsOf(item.client).note(storeBytes(event->built()));
-    }
 }
 
 bool StoreWriter::isAgeDue() const {

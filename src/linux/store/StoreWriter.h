@@ -96,6 +96,11 @@ private:
     StoreResult writeRows(std::span<StoreItem> group);
     StoreResult writeFacts();
     StoreResult insertAll(std::span<StoreItem> group);
+    StoreResult insertSome(std::span<StoreItem> items);
+    StoreResult insertTogether(StoreTable table, std::span<StoreItem* const> items);
+    StoreResult insertOne(StoreItem& item);
+    // Of one row: a failure that concerns it alone is noted, others are handed back.
+    StoreResult refuse(const StoreItem& item, StoreResult result);
     StoreResult trim(const StoreLimits& bounds, bool ageDue, bool& more);
     void buildPayload(StoreItem& item);
     void noteRemoved() HY_EXCLUDES(mutex_);
@@ -119,6 +124,9 @@ private:
     StoreFacts facts_;
     const std::function<void()> onWork_;
     std::vector<StoreItem> taken_;
+    std::vector<StoreItem*> messages_; // that wait to be inserted together
+    std::vector<StoreItem*> events_;
+    StoreDatabase::InsertedEach inserted_;
     std::vector<StoreTable> rejected_; // rows of the running attempt
     std::string rejection_;            // why the last of them was
     bool trimMore_ = false;
