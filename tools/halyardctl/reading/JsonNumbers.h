@@ -17,15 +17,15 @@ template <class Handler> bool takeNumber(std::string_view text, Handler& handler
         const auto read = std::from_chars(text.data(), text.data() + text.size(), number);
         return read.ec == std::errc() && read.ptr == text.data() + text.size();
     };
-    if (text.find_first_of(".eE") == std::string_view::npos) {
-        std::int64_t integer = 0;
-        std::uint64_t large = 0;
-        if (isWhole(integer) && (integer != 0 || text.front() != '-')) {
-            return handler.Int64(integer);
-        }
-        if (isWhole(large)) {
-            return handler.Uint64(large);
-        }
+    // Of what has a fraction or an exponent these read the beginning at most: sooner than to
+    // look for one.
+    std::int64_t integer = 0;
+    if (isWhole(integer) && (integer != 0 || text.front() != '-')) {
+        return handler.Int64(integer);
+    }
+    std::uint64_t large = 0;
+    if (isWhole(large)) {
+        return handler.Uint64(large);
     }
     double real = 0;
     return isWhole(real) && handler.Double(real);
