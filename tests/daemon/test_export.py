@@ -9,6 +9,7 @@ import json
 import os
 import shutil
 import sqlite3
+import ssl
 import subprocess
 import tempfile
 import threading
@@ -225,6 +226,36 @@ class Hostile(Export):
         self.receiver.take = lambda request: (hold.wait(PATIENCE), {}, b"")
         left = self.run_export("--once", OTEL_EXPORTER_OTLP_TIMEOUT="200")
         self.assertEqual(left.returncode, 1)
+
+
+@unittest.skipUnless(shutil.which("openssl"), "no openssl to make a certificate with")
+class Encrypting(Export):
+    def ask_for_certificates(self, version):
+        made = os.path.join(self.place, "certificate.pem")
+        subprocess.run(["openssl", "req", "-x509", "-newkey", "rsa:2048", "-nodes", "-days", "2",
+                        "-subj", "/CN=localhost", "-addext", "subjectAltName=IP:127.0.0.1",
+                        "-keyout", made + ".key", "-out", made], capture_output=True, check=True)
+        context = ssl.SSLContext(ssl.PROTOCOL_TLS_SERVER)
+        context.load_cert_chain(made, made + ".key")
+        context.load_verify_locations(made)
+        context.verify_mode = ssl.CERT_REQUIRED
+        context.minimum_version = context.maximum_version = version
+        self.receiver.socket = context.wrap_socket(self.receiver.socket, server_side=True)
+        return {"OTEL_EXPORTER_OTLP_ENDPOINT": self.receiver.url.replace("http:", "https:"),
+                "OTEL_EXPORTER_OTLP_CERTIFICATE": made}
+
+    def test_a_receiver_that_asks_for_a_certificate_is_named_with_the_key_to_set(self):
+        self.play()
+        for version in (ssl.TLSVersion.TLSv1_2, ssl.TLSVersion.TLSv1_3):
+            with self.subTest(version):
+                sent = self.run_export("--once", **self.ask_for_certificates(version))
+                self.assertEqual(sent.returncode, 1)
+                told = [line for line in sent.stderr.splitlines() if "does not take" in line]
+                self.assertEqual(len(told), 3, sent.stderr)
+                for line in told:
+                    self.assertIn("client_certificate and client_key in [export]", line)
+                shutil.rmtree(self.place)
+                os.mkdir(self.place)
 
 
 class Looking(Export):

@@ -2,6 +2,7 @@
 
 #include "send/Answer.h"
 #include "send/Compression.h"
+#include "send/TlsTrouble.h"
 
 namespace halyard::exporting {
 namespace {
@@ -56,6 +57,26 @@ TEST(AnswerTest, NonsenseRejectsNothing) {
     // -1
     EXPECT_EQ(partialSuccessIn("\x0a\x0b\x08\xff\xff\xff\xff\xff\xff\xff\xff\xff\x01").rejected,
               0U);
+}
+
+TEST(TlsTroubleTest, AMissingCertificateIsNamedByItsKey) {
+    EXPECT_EQ(troubleWithoutCertificate("SSL routines::tlsv13 alert certificate required", true),
+              "the receiver asks for a certificate of the client's: set client_certificate and "
+              "client_key in [export]");
+    for (const bool broke : {false, true}) {
+        const char* const why = broke ? "Broken pipe" : "sslv3 alert handshake failure";
+        EXPECT_EQ(troubleWithoutCertificate(why, broke),
+                  std::string("the receiver broke off (") + why +
+                      "), as one does that asks for a certificate of the client's: "
+                      "client_certificate and client_key in [export]");
+    }
+}
+
+TEST(TlsTroubleTest, OtherTroubleStaysWhatItIs) {
+    for (const char* const why :
+         {"Could not resolve host: nowhere", "SSL certificate problem: self-signed certificate"}) {
+        EXPECT_EQ(troubleWithoutCertificate(why, false), why);
+    }
 }
 
 TEST(CompressionTest, MakesAGzipFile) {

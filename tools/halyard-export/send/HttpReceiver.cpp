@@ -5,6 +5,8 @@
 #include <curl/curl.h>
 #include <mutex>
 
+#include "send/TlsTrouble.h"
+
 namespace halyard::exporting {
 namespace {
 
@@ -129,6 +131,10 @@ Answer HttpReceiver::post(Signal signal, std::string_view body, bool isCompresse
         answer.status = static_cast<int>(status);
     } else {
         answer.error = why.front() != '\0' ? why.data() : curl_easy_strerror(code);
+        if (options_.clientCertificate.empty() && options_.urls[index].starts_with("https:")) {
+            answer.error = troubleWithoutCertificate(answer.error, code == CURLE_SEND_ERROR ||
+                                                                       code == CURLE_RECV_ERROR);
+        }
     }
     return answer;
 }
