@@ -44,11 +44,16 @@ def removed(count):
     return [f"{count} messages were removed without a reason"] if count else []
 
 
+def order(who, numbers):
+    """Those of one session, in the order of the rows' ids. Sessions are delivered side by side."""
+    at = next((i for i, (a, b) in enumerate(zip(numbers, numbers[1:])) if a > b), None)
+    return [] if at is None else [f"{who}: out of order: {numbers[max(0, at - 2):at + 4]}"]
+
+
 class Present:
     """How the rows of one honest client stand beside what it was promised.
 
-    `rows` are its numbers in the order of the rows' ids, `required` those that had to be
-    there, in the order of sending. What retention, a purge or somebody's rm took lies before
+    `rows` are its numbers, `required` those that had to be there, in the order of sending. What retention, a purge or somebody's rm took lies before
     `first`, the lowest in the store of now (None: none is); what is missing behind is a hole.
     """
 
@@ -66,9 +71,6 @@ class Present:
         if len(set(self.rows)) != len(self.rows):
             twice = sorted({n for n in self.rows if self.rows.count(n) > 1})[:5]
             found.append(f"{self.who}: stored twice: {twice}")
-        if any(a > b for a, b in zip(self.rows, self.rows[1:])):
-            at = next(i for i, (a, b) in enumerate(zip(self.rows, self.rows[1:])) if a > b)
-            found.append(f"{self.who}: out of order: {self.rows[max(0, at - 2):at + 4]}")
         if self.rows and max(self.rows) > self.last_sent:
             found.append(f"{self.who}: {max(self.rows)} is stored and was never sent")
         return found

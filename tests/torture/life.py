@@ -39,7 +39,7 @@ class Snapshot:
     def __init__(self, store_path, folder):
         shutil.rmtree(folder, ignore_errors=True)
         os.makedirs(folder)
-        self.messages = []  # (who, n) in the order of ids
+        self.messages = []  # (who, n, upload session) in the order of ids
         self.tables = {}
         self.faults = []
         copy = os.path.join(folder, "copy.db")
@@ -60,9 +60,10 @@ class Snapshot:
                 self.tables[table] = database.execute(f"SELECT count(*) FROM {table}").fetchone()[0]
             if "upload_message" in self.tables:
                 self.messages = [
-                    (match[1], int(match[2])) for match in (WHO.search(row[0]) for row in
-                     database.execute("SELECT payload FROM upload_message WHERE payload LIKE"
-                                      " '{\"who\":%' ORDER BY id")) if match]
+                    (match[1], int(match[2]), session) for match, session in (
+                        (WHO.search(payload), session) for payload, session in database.execute(
+                            "SELECT payload, upload_session FROM upload_message WHERE payload LIKE"
+                            " '{\"who\":%' ORDER BY id")) if match]
         except sqlite3.Error as error:
             self.faults.append(f"the store cannot be read: {error}")
         finally:
@@ -371,11 +372,15 @@ class LifeRun:
 
     def account_of_clients(self):
         rows = {}
-        for snapshot in [*self.moved, self.after]:
+        orders = {}
+        for store, snapshot in enumerate([*self.moved, self.after]):
             first = {}  # Of the last store, which is the one that retention looks after.
-            for who, n in snapshot.messages:
+            for who, n, session in snapshot.messages:
                 rows.setdefault(who, []).append(n)
                 first[who] = min(n, first.get(who, n))
+                orders.setdefault((who, store, session), []).append(n)
+        for (who, _, _), numbers in orders.items():
+            self.fault_all(checks.order(who, numbers))
         self.library_rows = rows.get("library", [])
         presents = []
         sent_at = {}
