@@ -12,8 +12,7 @@ namespace {
 constexpr const char* kSummaryKey = "HY_Session_Summary_Event";
 constexpr unsigned kFlags = rapidjson::kParseInsituFlag | rapidjson::kParseIterativeFlag |
                             rapidjson::kParseNumbersAsStringsFlag;
-// Of what is remembered: clients make messages up.
-constexpr std::size_t kMostKinds = 128;
+// Of a message that is remembered.
 constexpr std::size_t kMostKnownBytes = 4096;
 
 // What stands between the quotes of a key.
@@ -37,6 +36,7 @@ void PayloadAttributes::setNames(std::vector<std::string> names) {
     if (names != names_) {
         names_ = std::move(names);
         known_.clear(); // other entries may leave now
+        remembered_ = 0;
     }
 }
 
@@ -86,14 +86,18 @@ void PayloadAttributes::addOfKind(AttributeBytes& bytes, otlp::Tag tag, std::uin
     if (json.size() > kMostKnownBytes || json.find(kSummaryKey) != std::string_view::npos) {
         return add(bytes, tag, json, passes);
     }
-    if (known_.size() >= kMostKinds && !known_.contains(kind)) {
+    // What one message adds at most is not much.
+    if (remembered_ > kMostRemembered / 2) {
         known_.clear();
+        remembered_ = 0;
     }
     const std::size_t texts = bytes.texts.size();
     const std::size_t numbers = bytes.numbers.size();
     Transcoder transcoder(*this, bytes, tag, passes);
     JsonCursor cursor(json);
-    if (!addAgain(transcoder, bytes, cursor, known_[kind], passes)) {
+    const auto [known, isNew] = known_.try_emplace(kind);
+    remembered_ += isNew ? sizeof(*known) : 0;
+    if (!addAgain(transcoder, bytes, cursor, known->second, passes)) {
         bytes.texts.resize(texts);
         bytes.numbers.resize(numbers);
         add(bytes, tag, json, passes);
@@ -109,6 +113,7 @@ bool PayloadAttributes::addAgain(Transcoder& transcoder, AttributeBytes& bytes, 
     for (std::size_t i = 0;; ++i) {
         if (known.size() == i) {
             known.emplace_back();
+            remembered_ += sizeof(Known);
         }
         if (!meet(cursor, known[i], passes) || !addEntry(transcoder, bytes, cursor, known[i])) {
             return false;
@@ -123,12 +128,13 @@ bool PayloadAttributes::addAgain(Transcoder& transcoder, AttributeBytes& bytes, 
 }
 
 // The key that comes next; what is known of another is forgotten.
-bool PayloadAttributes::meet(JsonCursor& cursor, Known& known, const Passes& passes) const {
+bool PayloadAttributes::meet(JsonCursor& cursor, Known& known, const Passes& passes) {
     if (!known.key.empty() && cursor.take(known.key)) {
         return true;
     }
     known.key = cursor.takeKey();
     known.text.clear();
+    remembered_ += known.key.size();
     if (known.key.empty() || !isValidUtf8(known.key)) {
         known.key.clear();
         return false;
@@ -163,6 +169,7 @@ bool PayloadAttributes::addEntry(Transcoder& transcoder, AttributeBytes& bytes, 
     // What stands among the numbers is as soon read again.
     known.text = bytes.numbers.size() == numbers ? cursor.since(start) : std::string_view();
     known.bytes.assign(bytes.texts, texts);
+    remembered_ += known.text.size() + known.bytes.size();
     return true;
 }
 

@@ -63,6 +63,10 @@ public:
     // One entry; nothing where it is left out.
     void addText(std::string& bytes, otlp::Tag tag, std::string_view key, std::string_view text);
 
+    // More than this is not remembered, whatever clients make up.
+    static constexpr std::size_t kMostRemembered = 2 * 1024 * 1024;
+    std::size_t rememberedBytes() const { return remembered_; }
+
 private:
     class Transcoder;
     struct Container {
@@ -84,7 +88,7 @@ private:
                   KnownEntries& known, const Passes& passes);
     bool addEntry(Transcoder& transcoder, AttributeBytes& bytes, JsonCursor& cursor, Known& known);
     bool addValue(Transcoder& transcoder, JsonCursor& cursor);
-    bool meet(JsonCursor& cursor, Known& known, const Passes& passes) const;
+    bool meet(JsonCursor& cursor, Known& known, const Passes& passes);
     bool mayLeave(std::string_view key) const;
     bool mayLeaveAsText(std::string_view text) const;
     bool namesApplication(std::string_view text) const;
@@ -97,6 +101,8 @@ private:
     std::string json_;                                      // which is parsed in its place
     std::vector<Container> containers_;                     // by their depth
     std::unordered_map<std::uint64_t, KnownEntries> known_; // by their kind
+    // What was written there since it was empty, which the memory it has is bounded by.
+    std::size_t remembered_ = 0;
 };
 
 } // namespace halyard::exporting

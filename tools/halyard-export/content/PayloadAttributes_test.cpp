@@ -126,6 +126,20 @@ TEST_F(PayloadAttributesTest, AnotherApplicationsNameIsAnotherMatter) {
     }
 }
 
+TEST_F(PayloadAttributesTest, WhatIsRememberedIsBounded) {
+    PayloadAttributes payload(omission_);
+    for (std::uint64_t kind = 0; kind < 100; ++kind) {
+        std::string before = "{";
+        for (int at = 0; at < 50; ++at) {
+            AttributeBytes bytes;
+            payload.addOfKind(bytes, kTag, kind,
+                              before + "\"x\":\"" + std::string(3000, 'x') + "\"}");
+            before += "\"k\":1,";
+            ASSERT_LE(payload.rememberedBytes(), PayloadAttributes::kMostRemembered);
+        }
+    }
+}
+
 TEST_F(PayloadAttributesTest, AnyNumberOfKindsIsTheSame) {
     PayloadAttributes payload(omission_);
     for (std::uint64_t kind = 0; kind < 1000; ++kind) {
