@@ -40,7 +40,6 @@ struct Options {
     std::uint64_t maxBytesPerDay = 0;
     std::map<std::string, std::string> resource;
 
-    bool operator==(const Options&) const = default;
     bool isSent(Signal signal) const { return !urls[static_cast<std::size_t>(signal)].empty(); }
     bool isAnythingSent() const;
 };
