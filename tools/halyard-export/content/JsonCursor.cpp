@@ -62,11 +62,7 @@ std::string_view JsonCursor::takeNumber() {
     if (isNumber && take('.')) {
         isNumber = takeDigits();
     }
-    if (isNumber && (take('e') || take('E'))) {
-        (void)(take('+') || take('-'));
-        isNumber = takeDigits();
-    }
-    if (isNumber) {
+    if (isNumber && !take('e') && !take('E')) {
         return since(start);
     }
     at_ = start;

@@ -32,9 +32,10 @@ public:
     }
     // Requires that `value` is a whole one. False where a longer one begins with it.
     bool takeValue(std::string_view value);
-    // A text without escapes, with its quotes, and for a key the colon; empty for all else.
+    // Empty for all else: a text without escapes, with its quotes, and for a key the colon.
     std::string_view takeText();
     std::string_view takeKey();
+    // Without an exponent, which parsers have bounds of their own for.
     std::string_view takeNumber();
 
 private:
