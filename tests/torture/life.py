@@ -325,7 +325,9 @@ class LifeRun:
         # What a kill leaves is gone with the next start, so with the next orderly end. Who
         # reads the store then keeps its log there.
         shared = self.plan.end != "quiet" and self.plan.has("reader", "lock", "halyardctl")
-        if self.plan.end != "sigkill" and not self.faulty_end and not shared:
+        # Nor can a file be removed from a disk that takes nothing.
+        stuck = any(act.kind == "disk" and act.name == "read_only" for act in self.plan.acts)
+        if self.plan.end != "sigkill" and not self.faulty_end and not shared and not stuck:
             self.fault_all(checks.files(names_below(self.daemon.path("state")),
                                         names_below(self.daemon.path("log"))))
         self.account_waits()

@@ -134,7 +134,6 @@ StoreDisk::~StoreDisk() {
 
 int StoreDisk::open(sqlite3_vfs* self, sqlite3_filename name, sqlite3_file* file, int flags,
                     int* flagsOut) {
-    constexpr int kGathering = SQLITE_OPEN_MAIN_DB | SQLITE_OPEN_WAL;
     auto* const below = static_cast<sqlite3_vfs*>(self->pAppData);
     auto* const ours = reinterpret_cast<File*>(file);
     sqlite3_file* const real = realOf(file);
@@ -144,7 +143,7 @@ int StoreDisk::open(sqlite3_vfs* self, sqlite3_filename name, sqlite3_file* file
     if (real->pMethods == nullptr) {
         return code;
     }
-    const bool gathers = (flags & kGathering) != 0;
+    const bool gathers = (flags & SQLITE_OPEN_WAL) != 0;
     if (gathers && code == SQLITE_OK) {
         ours->gathered = new Gathered;
     }

@@ -1,11 +1,14 @@
 // A layer over SQLite's own files for the database that the daemon writes: what goes to
-// neighbouring places of its file or its log is written at once.
+// neighbouring places of its log is written at once.
 //
-// SQLite writes a page at a time, which costs the kernel about as much as sixteen of
-// them. It relies on nothing that it has not synced, and neither do other programs: pages
-// in the log count once its index says so, pages in the file once the log need not have
-// them any more, and both come after a sync. So what is gathered is written before a sync
-// and before anybody here looks, and forgotten with a file that is closed without one.
+// SQLite writes a page at a time, and its place in the log by itself, which costs the
+// kernel about as much as sixteen of them. It relies on nothing in the log that it has not
+// synced, and neither do other programs: pages in it count once its index says so, which
+// comes after a sync. So what is gathered is written before a sync and before anybody here
+// looks, and forgotten with a file that is closed without one.
+//
+// Nothing is gathered for the file itself: where a reader keeps part of the log from being
+// moved into it, others look into the file for what was moved, and there is no sync before.
 //
 // Not thread-safe, like the connection that uses it; must outlive that.
 #pragma once

@@ -89,10 +89,10 @@ TEST_F(StoreSalvageTest, RowsAroundADamagedPageAreCarriedOver) {
 TEST_F(StoreSalvageTest, RowsThatTheDaemonCannotHaveWrittenAreLeftOut) {
     makeStore(3);
     reader().rows("UPDATE upload_message SET payload = '{\"a' WHERE id = 2;"
-                  "INSERT INTO metric VALUES(2, 'no number', 'x', 0);"
-                  "INSERT INTO incident VALUES(1, '{}', 'kept', 0), (2, NULL, 'no signature', 0);"
-                  "INSERT INTO upload_message VALUES(4, NULL, '{}', 'broken', 1, 1, '{}', 0),"
-                  " (5, NULL, '{}', '{}', 1, 1, '{}', 0);"
+                  "INSERT INTO metric VALUES(2, 'no number', 'x', 1.7e9);"
+                  "INSERT INTO incident VALUES(1, '{}', 'kept', 1.7e9), (2, NULL, 'none', 1.7e9);"
+                  "INSERT INTO upload_message VALUES(4, NULL, '{}', 'broken', 1, 1, '{}', 1.7e9),"
+                  " (5, NULL, '{}', '{}', 1, 1, '{}', 1.7e9);"
                   "ALTER TABLE energy_event DROP COLUMN time"); // for which it is set aside
     open();
     EXPECT_EQ(setAside().size(), 1U);
