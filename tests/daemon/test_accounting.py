@@ -241,7 +241,10 @@ class KilledProgramsTest(AccountingTest):
 class KilledPrograms(KilledProgramsTest):
     def test_keep_uploads_from_the_next_which_is_told(self):
         self.assertEqual(self.upload_one(), 1)
-        self.assertEqual(self.daemon.log().count("those started beyond 5 are not uploaded"), 1)
+        told = "those started beyond 5 are not uploaded"
+        self.daemon.wait_for(lambda: told in self.daemon.log())
+        self.daemon.terminate()
+        self.assertEqual(self.daemon.log().count(told), 1)
 
 
 class Recounting(KilledProgramsTest):

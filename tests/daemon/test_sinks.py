@@ -60,9 +60,11 @@ class EverySink(DaemonTest):
         self.send({"x": 1}, 11, ISSUE)
         [(message,)] = self.rows("SELECT message FROM metric")
         self.assertEqual(message.hex(), "10001a0022002a00")
-        missing = re.findall(r"Failed to get (\w+) for AudioIssueDetected", self.daemon.log())
-        self.assertEqual(missing, ["issue_type", "rtaid_client", "node",
-                                   "any_channel_silence_seconds"])
+        def missing():
+            return re.findall(r"Failed to get (\w+) for AudioIssueDetected", self.daemon.log())
+        self.daemon.wait_for(lambda: len(missing()) >= 4)
+        self.assertEqual(missing(), ["issue_type", "rtaid_client", "node",
+                                     "any_channel_silence_seconds"])
 
     def test_the_second_distinct_leak_takes_a_snapshot(self):
         self.leak_twice()

@@ -155,7 +155,7 @@ class OnAFaultyDisk(FaultyDiskTest):
             return self.store()["failing"]
 
         self.daemon.wait_for(failing)
-        self.assertIn("the file system does not answer", self.daemon.log())
+        self.daemon.wait_for(lambda: "the file system does not answer" in self.daemon.log())
         status = self.daemon.terminate()
         self.assertEqual(status, 0)
         lost = re.search(r"closing .*, (\d+) rows lost", self.daemon.log())

@@ -5,6 +5,7 @@ import json
 import os
 import re
 import shutil
+import signal
 import sqlite3
 import subprocess
 import time
@@ -203,6 +204,7 @@ class LifeRun:
 
     def end_kill_service(self):
         self.place.counts["killService"] += 1
+        self.go_on()
         code = ("import sys, socket, msgpack; s = socket.socket(socket.AF_UNIX); s.settimeout(60);"
                 "s.connect(sys.argv[1]); s.sendall(msgpack.packb([0, 1, 'killService', []]));"
                 "s.recv(1)")
@@ -221,9 +223,14 @@ class LifeRun:
     def order(self, status):
         if not self.alive():
             return
-        os.kill(self.daemon.process.pid, 18)  # SIGCONT: one that is stopped cannot end.
+        self.go_on()
         self.daemon.process.terminate()
         self.wait_for_end(status)
+
+    def go_on(self):
+        """One that is stopped cannot end."""
+        if self.alive():
+            os.kill(self.daemon.process.pid, signal.SIGCONT)
 
     def wait_for_end(self, status):
         try:
