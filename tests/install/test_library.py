@@ -58,9 +58,9 @@ class Examples(DaemonTest):
                        timeout=PATIENCE, stdout=subprocess.DEVNULL)
 
     def applications(self):
-        return [name for name, in self.rows(
-            "SELECT json_extract(user_info, '$.HostApplicationDisplayID')"
-            " FROM upload_session ORDER BY id")]
+        return [name for name, in self.rows(  # Sessions open side by side.
+            "SELECT json_extract(user_info, '$.HostApplicationDisplayID') AS name"
+            " FROM upload_session ORDER BY name")]
 
     def test_build_with_cmake(self):
         build = os.path.join(self.work, "cmake")

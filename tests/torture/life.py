@@ -400,6 +400,8 @@ class LifeRun:
             sent_at.update({(ledger["who"], n): at for n, at in ledger["answered"]})
             self.place.honest_answered += len(ledger["answered"])
         self.counted = self.not_kept()
+        if any(act.kind == "clock" and act.amount < 0 for act in self.plan.acts):
+            self.counted += self.removed()  # What came after it looks older than what was there.
         taken = self.hands.rows_taken
         def excused(who, n):
             return taken is not None and sent_at.get((who, n), 0) < taken + 1

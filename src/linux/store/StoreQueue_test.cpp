@@ -63,7 +63,8 @@ TEST(StoreQueueTest, RowsThatAreLeftBehindAreNoOlderThanTheyAre) {
     std::vector<StoreItem> taken;
     queue.take(taken);
     queue.settle(taken);
-    EXPECT_LE(queue.levels().oldest, Steady::now() - came);
+    const auto oldest = queue.levels().oldest;
+    EXPECT_LE(oldest, Steady::now() - came);
 }
 
 } // namespace
