@@ -213,22 +213,20 @@ class OnAFaultyDisk(FaultyDiskTest):
 class AnInternalBuild(FaultyDiskTest):
     configuration = "[device_properties]\nInternalBuild = true\n"
 
-    def test_ends_though_a_session_writes_its_file_to_a_disk_that_hangs(self):
+    def hang_while_a_session_writes_its_file(self):
         self.send()
         self.client.result("admin.flush")
         syncs = self.disk.syncs()
         self.disk.tell("hang")
         self.client.start("stopReportingSessionForID", 1)
         self.daemon.wait_for(lambda: self.disk.syncs() > syncs)
+
+    def test_ends_though_a_session_writes_its_file_to_a_disk_that_hangs(self):
+        self.hang_while_a_session_writes_its_file()
         self.assertEqual(self.daemon.terminate(), 0)
 
     def test_tells_the_requests_that_a_disk_that_hangs_kept_it_from(self):
-        self.send()
-        self.client.result("admin.flush")
-        syncs = self.disk.syncs()
-        self.disk.tell("hang")
-        self.client.start("stopReportingSessionForID", 1)
-        self.daemon.wait_for(lambda: self.disk.syncs() > syncs)
+        self.hang_while_a_session_writes_its_file()
         for n in range(20):
             self.client.notify("sendMessage", {"n": n}, 4, 1, [1])
         self.assertEqual(self.daemon.terminate(), 0)
